@@ -1,0 +1,7 @@
+// Marks what libzn_gscl.so exports; everything else in it is hidden.
+#ifndef GSCL_EXPORT_H
+#define GSCL_EXPORT_H
+
+#define ZN_GSCL_EXPORT __attribute__((visibility("default")))
+
+#endif

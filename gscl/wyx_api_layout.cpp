@@ -1,0 +1,1 @@
+#include "gscl/wyx_api.h"

@@ -1,0 +1,1 @@
+#include "zn_cu.h"
