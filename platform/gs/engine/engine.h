@@ -1,0 +1,49 @@
+// The group protocols as one deterministic state machine.
+//
+// No threads, no sockets, no clock, no randomness: it is given ordered events and returns notifications for named
+// endpoints and timers to arm. Engines that are given the same events in the same order stay the same and say the
+// same. Not safe for concurrent use; the caller brings the order, and with it the exclusion.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "engine/types.h"
+
+namespace gs {
+
+class Engine {
+ public:
+  Engine();
+  ~Engine();
+  Engine(const Engine&) = delete;
+  Engine& operator=(const Engine&) = delete;
+
+  /// Applies the next ordered event.
+  Outcome apply(const Event& event);
+
+  /// What `apply` would answer to this request now, changing nothing: lets a daemon refuse at once what it knows
+  /// to be wrong before it gives the request to the ordering.
+  wyx_rc_t precheck(SessionId session, const Request& request) const;
+
+  /// For people and tools: a group as it stands.
+  struct GroupStatus {
+    std::string name;
+    Membership members;
+    std::size_t state_length = 0;  // bytes
+    std::uint64_t seqnum = 0;
+    std::string running_protocol;  // printable name; empty: none
+    std::size_t subscribers = 0;
+  };
+  std::vector<GroupStatus> status() const;
+
+  /// A digest of the whole state; equal for engines that have been given the same events.
+  std::uint64_t digest() const;
+
+ private:
+  struct State;
+  std::unique_ptr<State> state_;
+};
+
+}  // namespace gs

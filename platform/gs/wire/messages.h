@@ -1,0 +1,76 @@
+// What a client and its daemon say to each other, as values. codec.h turns them into packets and back.
+//
+// A client opens two connections to the daemon's socket: the request channel (Hello, then a request and its Answer at
+// a time) and the event channel (Attach, then notifications one way, pings and their answers).
+#pragma once
+
+#include "engine/types.h"
+
+namespace gs::wire {
+
+inline constexpr std::uint16_t kProtocolVersion = 1;
+
+// ---------------------------------------------------------------------------------------- client to daemon
+
+/// First on the request channel.
+struct Hello {
+  std::uint16_t protocol_version = kProtocolVersion;
+  std::uint32_t api_version = 0;  // the base API version the application was built for
+  std::uint32_t socket_control = 0;
+  std::string program;  // for the daemon's log
+};
+/// First on the event channel: whose it is. The cookie comes from Welcome.
+struct Attach {
+  std::uint64_t session_number = 0;
+  std::uint64_t cookie = 0;
+};
+struct Call {
+  Request request;
+};
+/// Replaces the session's responsiveness settings. Only WYX_PING_RESPONSIVENESS and its modifiers.
+struct SetResponsiveness {
+  std::uint32_t type = 0;  // flags of wyx_responsiveness_type_t
+  std::uint32_t interval = 0;    // seconds
+  std::uint16_t time_limit = 0;  // seconds
+};
+/// Asks for NodeInfo; allowed without Hello, so that a node query needs no session.
+struct QueryNode {};
+/// Answers Ping, on the event channel.
+struct PingAnswer {
+  std::uint64_t number = 0;
+  bool ok = false;
+};
+/// The session ends in good order: the daemon fails its providers as for a death but logs no error.
+struct Quit {};
+
+using ClientMessage = std::variant<Hello, Attach, Call, SetResponsiveness, QueryNode, PingAnswer, Quit>;
+
+// ---------------------------------------------------------------------------------------- daemon to client
+
+/// Answers Hello.
+struct Welcome {
+  std::uint32_t node_number = 0;
+  std::uint64_t session_number = 0;
+  std::uint64_t cookie = 0;
+};
+/// Answers Attach, Call, SetResponsiveness and Quit, and a Hello that is refused.
+struct Answer {
+  wyx_rc_t rc = WYX_OK;
+};
+struct NodeInfo {
+  std::uint32_t node_number = 0;
+  std::uint32_t domain_master_node = 0;
+};
+struct Notify {
+  Token token = -1;
+  std::shared_ptr<const Notification> what;
+};
+struct Ping {
+  std::uint64_t number = 0;
+};
+/// The daemon is going away; nothing follows.
+struct Farewell {};
+
+using ServerMessage = std::variant<Welcome, Answer, NodeInfo, Notify, Ping, Farewell>;
+
+}  // namespace gs::wire
