@@ -1,0 +1,29 @@
+# The doors of the README. Each installs what is missing (Debian, Ubuntu), configures, builds and runs.
+
+PREFIX ?= /usr/local
+release := build/release
+
+.PHONY: all demo test bench install package help
+
+all: ## build everything, optimised
+	@scripts/build.sh release
+
+demo: ## processes join a group, vote, talk, are watched and die; one timeline of what each of them saw
+	@scripts/build.sh release demo
+	@$(release)/bin/demo
+
+test: ## the whole suite: release build, address+undefined sanitizers, thread sanitizer
+	@scripts/test.sh release asan tsan
+
+bench: ## figures against their bounds; tables here, JSON in build/release/bench
+	@scripts/build.sh release
+	@scripts/bench.sh $(release)
+
+install: all ## libraries, programs, headers, CMake package and .pc under PREFIX (default /usr/local)
+	@cmake --install $(release) --prefix '$(PREFIX)'
+
+package: all ## a .deb in build/release
+	@cd $(release) && cpack -G DEB
+
+help: ## this list
+	@sed -n 's/^\([a-z]*\):.*## /  make \1\t/p' $(firstword $(MAKEFILE_LIST)) | expand -t 18

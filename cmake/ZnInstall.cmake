@@ -1,0 +1,46 @@
+# What is installed and how it is found again: libraries, programs, public headers, the CMake package zn_gscl, the
+# pkg-config file and the Debian package. Included last, when all targets are there.
+include(CMakePackageConfigHelpers)
+
+# The libraries that users link against, and the one that is loaded at run time.
+install(TARGETS zn_gscl zn_cu EXPORT zn_gscl
+        LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
+        INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+foreach(target IN ITEMS wyx_r gsd)
+  if(TARGET ${target})
+    install(TARGETS ${target}
+            LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
+            RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+  endif()
+endforeach()
+
+install(DIRECTORY gscl/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/gscl FILES_MATCHING PATTERN "*.h"
+        PATTERN "*_internal.h" EXCLUDE)
+install(FILES platform/cu/zn_cu.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+
+# find_package(zn_gscl) gives zn_gscl::zn_gscl and zn_gscl::zn_cu.
+set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/zn_gscl)
+install(EXPORT zn_gscl NAMESPACE zn_gscl:: DESTINATION ${package_dir})
+configure_package_config_file(packaging/zn_gsclConfig.cmake.in ${CMAKE_BINARY_DIR}/packaging/zn_gsclConfig.cmake
+                              INSTALL_DESTINATION ${package_dir})
+write_basic_package_version_file(${CMAKE_BINARY_DIR}/packaging/zn_gsclConfigVersion.cmake
+                                 COMPATIBILITY SameMajorVersion)
+install(FILES ${CMAKE_BINARY_DIR}/packaging/zn_gsclConfig.cmake
+              ${CMAKE_BINARY_DIR}/packaging/zn_gsclConfigVersion.cmake DESTINATION ${package_dir})
+
+# The .pc file finds its prefix from where it lies, so that a moved tree still works.
+file(RELATIVE_PATH pc_to_prefix /${CMAKE_INSTALL_LIBDIR}/pkgconfig /)
+configure_file(packaging/zn_gscl.pc.in ${CMAKE_BINARY_DIR}/packaging/zn_gscl.pc @ONLY)
+install(FILES ${CMAKE_BINARY_DIR}/packaging/zn_gscl.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+
+set(CPACK_PACKAGE_NAME zn-gscl)
+set(CPACK_PACKAGE_VENDOR "zn-gscl")
+set(CPACK_PACKAGE_CONTACT "The zn-gscl developers <zn-gscl@localhost>")
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "Group services: client library, daemon and base API library")
+set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
+set(CPACK_DEBIAN_PACKAGE_SECTION net)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${CMAKE_LIBRARY_OUTPUT_DIRECTORY})
+set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
+set(CPACK_STRIP_FILES ON)
+include(CPack)

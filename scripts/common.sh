@@ -1,0 +1,24 @@
+# Shared by the scripts beside it: stop at the first error, work from the top of the tree, use ccache where it is.
+set -euo pipefail
+cd "$(dirname "${BASH_SOURCE[0]}")/.."
+
+jobs=$(nproc)
+if command -v ccache >/dev/null; then
+  export CMAKE_C_COMPILER_LAUNCHER=${CMAKE_C_COMPILER_LAUNCHER-ccache}
+  export CMAKE_CXX_COMPILER_LAUNCHER=${CMAKE_CXX_COMPILER_LAUNCHER-ccache}
+  export CCACHE_SLOPPINESS=${CCACHE_SLOPPINESS-pch_defines,time_macros}
+fi
+
+# The thread sanitizer of older compilers cannot cope with strongly randomised addresses. Run a command without
+# the randomisation where that is allowed, and as it is where it is not.
+fixed_addresses() {
+  if setarch -R true 2>/dev/null; then setarch -R "$@"; else "$@"; fi
+}
+
+# build PRESET [TARGET...]
+build() {
+  local preset=$1
+  shift
+  if [ ! -f "build/$preset/build.ninja" ]; then cmake --preset "$preset"; fi
+  fixed_addresses cmake --build --preset "$preset" -j "$jobs" ${1:+--target "$@"}
+}
