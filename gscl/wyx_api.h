@@ -12,10 +12,11 @@
 #include <stdint.h>
 
 // ---------------------------------------------------------------------------------------------------------
-// Codes
+// Codes. Every enumeration has int as its underlying type, because codes that are not named here are passed
+// through, -1 for none among them.
 
 /// Synchronous result of every entry point.
-enum wyx_rc_t {
+enum wyx_rc_t : int {
   WYX_OK = 0,
   WYX_OK_SO_FAR = 0,
   WYX_NOT_OK = 1,
@@ -57,7 +58,7 @@ enum wyx_rc_t {
   WYX_UNEXPECTED_QUORUM_RESP = 37
 };
 
-enum wyx_notification_type_t {
+enum wyx_notification_type_t : int {
   WYX_RESPONSIVENESS_NOTIFICATION = 0,
   WYX_QUERY_NOTIFICATION = 1,
   WYX_DELAYED_ERROR_NOTIFICATION = 2,
@@ -76,7 +77,7 @@ enum wyx_notification_type_t {
 };
 
 /// Protocol types.
-enum wyx_request_t {
+enum wyx_request_t : int {
   WYX_RESPONSIVENESS = 0,
   WYX_JOIN = 1,
   WYX_FAILURE_LEAVE = 2,
@@ -94,7 +95,7 @@ enum wyx_request_t {
 };
 
 /// Flags: what a protocol notification carries.
-enum wyx_whats_changed_t {
+enum wyx_whats_changed_t : int {
   WYX_NO_CHANGE = 0,
   WYX_PROPOSED_MEMBERSHIP = 0x1,
   WYX_ONGOING_MEMBERSHIP = 0x2,
@@ -116,7 +117,7 @@ enum wyx_whats_changed_t {
 };
 
 /// Flags: how a protocol or phase ended, and what an announcement says.
-enum wyx_summary_code_t {
+enum wyx_summary_code_t : int {
   WYX_MIN_SUMMARY_CODE = 0x1,
   WYX_EXPLICIT_APPROVE = 0x1,
   WYX_EXPLICIT_REJECT = 0x2,
@@ -141,7 +142,7 @@ enum wyx_summary_code_t {
 };
 
 /// Flags: what a subscription notification carries.
-enum wyx_subscription_type_t {
+enum wyx_subscription_type_t : int {
   WYX_SUBSCRIPTION_STATE = 0x1,
   WYX_SUBSCRIPTION_DELTA_JOIN = 0x2,
   WYX_SUBSCRIPTION_DELTA_LEAVE = 0x4,
@@ -153,7 +154,7 @@ enum wyx_subscription_type_t {
 };
 
 /// Flags: what a subscriber asks for.
-enum wyx_subscription_ctrl_t {
+enum wyx_subscription_ctrl_t : int {
   WYX_SUBSCRIBE_STATE = 0x1,
   WYX_SUBSCRIBE_DELTA_JOINS = 0x2,
   WYX_SUBSCRIBE_DELTA_LEAVES = 0x4,
@@ -167,7 +168,7 @@ enum wyx_subscription_ctrl_t {
 };
 
 /// Flags: batching of joins and leaves, collection of vote results.
-enum wyx_batch_ctrl_t {
+enum wyx_batch_ctrl_t : int {
   WYX_NO_BATCHING = 0,
   WYX_BATCH_JOINS = 1,
   WYX_BATCH_LEAVES = 2,
@@ -179,9 +180,9 @@ enum wyx_batch_ctrl_t {
   WYX_COLLECT_ALL_RESULT = 56
 };
 
-enum wyx_num_phases_t { WYX_1_PHASE = 1, WYX_N_PHASE = 2 };
+enum wyx_num_phases_t : int { WYX_1_PHASE = 1, WYX_N_PHASE = 2 };
 
-enum wyx_merge_ctrl_t {
+enum wyx_merge_ctrl_t : int {
   WYX_DISSOLVE_MERGE = 0,
   WYX_FIRST_MERGE_TYPE = 0,
   WYX_LARGER_MERGE = 1,
@@ -191,7 +192,7 @@ enum wyx_merge_ctrl_t {
   WYX_LAST_MERGE_TYPE = 4
 };
 
-enum wyx_vote_value_t {
+enum wyx_vote_value_t : int {
   WYX_NULL_VOTE = 0,
   WYX_VOTE_APPROVE = 1,
   WYX_VOTE_CONTINUE = 2,
@@ -201,7 +202,7 @@ enum wyx_vote_value_t {
 };
 
 /// Flags: why a provider is gone.
-enum wyx_leave_code_t {
+enum wyx_leave_code_t : int {
   WYX_FAILURE_NONE = 0,
   WYX_VOLUNTARY_LEAVE = 0x1,
   WYX_PROVIDER_FAILURE = 0x2,
@@ -218,10 +219,10 @@ enum wyx_leave_code_t {
   WYX_HOST_LEAVE_DUE_TO_FORCE_DOWN = 0x1000
 };
 
-enum wyx_adapter_reason_t { WYX_ADAPTER_DEAD = 1, WYX_ADAPTER_REMOVED = 2 };
+enum wyx_adapter_reason_t : int { WYX_ADAPTER_DEAD = 1, WYX_ADAPTER_REMOVED = 2 };
 
 /// Flags of the session's socket.
-enum wyx_socket_ctrl_t {
+enum wyx_socket_ctrl_t : int {
   WYX_SOCKET_NO_SIGNAL = 0,
   WYX_SOCKET_SIGNAL = 0x1,
   WYX_ENABLE_ADAPTER_INFO = 0x2,
@@ -234,10 +235,10 @@ enum wyx_socket_ctrl_t {
   WYX_IMMEDIATE_DOMAIN_CONTROL = 0x10000000
 };
 
-enum wyx_dispatch_flag_t { WYX_NON_BLOCKING = 0, WYX_BLOCKING = 1 };
+enum wyx_dispatch_flag_t : int { WYX_NON_BLOCKING = 0, WYX_BLOCKING = 1 };
 
 /// Flags: how the daemon checks that a client is alive.
-enum wyx_responsiveness_type_t {
+enum wyx_responsiveness_type_t : int {
   WYX_NO_RESPONSIVENESS = 0,
   WYX_PING_RESPONSIVENESS = 0x1,
   WYX_COUNTER_RESPONSIVENESS = 0x2,
@@ -250,13 +251,13 @@ enum wyx_responsiveness_type_t {
   WYX_KILL_CLIENT_WHEN_SLOW = 0x10000000
 };
 
-enum wyx_callback_rc_t { WYX_CALLBACK_NOT_OK = 0, WYX_CALLBACK_OK = 1 };
+enum wyx_callback_rc_t : int { WYX_CALLBACK_NOT_OK = 0, WYX_CALLBACK_OK = 1 };
 
-enum wyx_query_type_t { WYX_QUERY_ALL = 0, WYX_QUERY_GROUP = 1 };
+enum wyx_query_type_t : int { WYX_QUERY_ALL = 0, WYX_QUERY_GROUP = 1 };
 
-enum wyx_migration_vote_t { WYX_MIGRATION_VOTE_YES = 1, WYX_MIGRATION_VOTE_NO = 2 };
+enum wyx_migration_vote_t : int { WYX_MIGRATION_VOTE_YES = 1, WYX_MIGRATION_VOTE_NO = 2 };
 
-enum wyx_site_dissolve_action_t {
+enum wyx_site_dissolve_action_t : int {
   WYX_SITE_DISSOLVE_AND_DEFAULT = 0,
   WYX_SITE_DISSOLVE_AND_REBOOT = 1,
   WYX_SITE_DISSOLVE_AND_HALT = 2,
@@ -266,7 +267,7 @@ enum wyx_site_dissolve_action_t {
   WYX_SITE_DISSOLVE_AND_EXIT = 6
 };
 
-enum wyx_subcluster_dissolve_action_t {
+enum wyx_subcluster_dissolve_action_t : int {
   WYX_SUBCLUSTER_DISSOLVE_AND_DEFAULT = 0,
   WYX_SUBCLUSTER_DISSOLVE_AND_REBOOT = 1,
   WYX_SUBCLUSTER_DISSOLVE_AND_HALT = 2,
@@ -276,12 +277,12 @@ enum wyx_subcluster_dissolve_action_t {
   WYX_SUBCLUSTER_DISSOLVE_AND_EXIT = 6
 };
 
-enum wyx_subcluster_type_t { WYX_SUBCLUSTER_TYPE_LOCAL = 0, WYX_SUBCLUSTER_TYPE_REMOTE = 1 };
+enum wyx_subcluster_type_t : int { WYX_SUBCLUSTER_TYPE_LOCAL = 0, WYX_SUBCLUSTER_TYPE_REMOTE = 1 };
 
-enum wyx_priv_channel_msg_type_t { WYX_PRIV_MSG_NONE = 0, WYX_PRIV_MSG_OPQUORUM = 1 };
+enum wyx_priv_channel_msg_type_t : int { WYX_PRIV_MSG_NONE = 0, WYX_PRIV_MSG_OPQUORUM = 1 };
 
 /// Selects the member of wyx_domain_control_notification_t::info.
-enum wyx_domain_event_t {
+enum wyx_domain_event_t : int {
   WYX_DOMAIN_DISCOVER = 1,
   WYX_DOMAIN_MERGE = 2,
   WYX_DOMAIN_VERSION = 3,
@@ -297,14 +298,14 @@ enum wyx_domain_event_t {
   WYX_INTERNAL_MSG_INFO = 0x10000001
 };
 
-enum wyx_migration_event_t {
+enum wyx_migration_event_t : int {
   WYX_DOMAIN_PELL_MIGRATION_COORD = 1,
   WYX_DOMAIN_PELL_MIGRATION_APPRVD = 2,
   WYX_DOMAIN_PELL_MIGRATION_REJCTD = 3,
   WYX_DOMAIN_PELL_MIGRATION_COMPLT = 4
 };
 
-enum wyx_migration_reason_t {
+enum wyx_migration_reason_t : int {
   WYX_MIGRATE_TO_PELL_PREP_DONE = 1,
   WYX_MIGRATE_TO_PELL_COMMIT_DONE = 2,
   WYX_HB_MIGRATE_TO_PELL_PREP_FAILED = 3,
@@ -313,7 +314,7 @@ enum wyx_migration_reason_t {
   WYX_INVALID_MIGRATION_TO_PELL_CALL = 7
 };
 
-enum wyx_quorum_state_t {
+enum wyx_quorum_state_t : int {
   WYX_QUORUM_STATE_HAS = 0,
   WYX_QUORUM_STATE_PENDING = 1,
   WYX_QUORUM_STATE_NONE = 2
