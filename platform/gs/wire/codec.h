@@ -1,10 +1,18 @@
 // Messages to packets and back. docs/wire.md describes the format.
 //
 // A message is one or more packets of a SOCK_SEQPACKET socket, each at most kMaxPacket bytes: a fixed header
-// (magic, version, flags, token, whole length) and a slice of one FlatBuffer whose schema is gs.fbs. Everything that
-// is read is checked before it is used: header, lengths, the FlatBuffer itself, every enumeration and every limit.
+// (magic, version, flags, token, whole length) and a slice of one FlatBuffer whose schema is gs.fbs. Everything
+// that is read is checked before it is used: header, lengths, the FlatBuffer itself, every enumeration and every
+// limit.
+//
+// The limits here only keep a hostile peer within bounds. What has a result code of its own (a group name over
+// kMaxGroupName, a state value over kMaxStateValue) passes, for the engine to answer; whatever does not fit
+// `problem_with` must be answered by the caller of `encode`, since the daemon closes a client that sends it.
+//
+// All of it is safe to use from several threads at once on different objects.
 #pragma once
 
+#include <array>
 #include <cstddef>
 #include <memory>
 #include <optional>
@@ -19,29 +27,41 @@ namespace gs::wire {
 inline constexpr std::size_t kMaxPacket = 64 * 1024;          // bytes, header included
 inline constexpr std::size_t kMaxClientMessage = 256 * 1024;  // bytes, the FlatBuffer
 inline constexpr std::size_t kMaxServerMessage = 64 * 1024 * 1024;
+inline constexpr std::size_t kMaxWireName = 4096;  // characters of a group, local or program name
+inline constexpr std::size_t kHeaderSize = 16;     // bytes
+inline constexpr std::size_t kMaxSlice = kMaxPacket - kHeaderSize;
 
-/// One message's packets, ready to be sent in order. Immutable; the same packets go to any number of receivers, with
-/// the token patched in by the sender's header (see packet_for).
+/// One message's packets, ready to be sent in order. Immutable; the same packets go to any number of receivers,
+/// each with its own token in the header. Copies share the payload.
 class Encoded {
  public:
+  /// False: the message was over the limit of its direction and cannot be sent.
+  explicit operator bool() const { return payload_ != nullptr; }
   /// Bytes of all packets together, headers included.
-  std::size_t size() const { return size_; }
-  std::size_t packets() const;
-  /// Writes packet `index`'s header for `token` into `header` and returns its payload slice.
-  std::span<const std::byte> packet_for(std::size_t index, Token token, std::span<std::byte> header) const;
+  std::size_t size() const { return length_ + packets() * kHeaderSize; }
+  std::size_t packets() const { return (length_ + kMaxSlice - 1) / kMaxSlice; }
+  /// Writes packet `index`'s header for `token` and returns its payload slice, which lives as long as this does.
+  /// `token` is the receiver's for a Notify, -1 for every other message.
+  std::span<const std::byte> packet_for(std::size_t index, Token token,
+                                        std::span<std::byte, kHeaderSize> header) const;
 
  private:
   friend Encoded encode(const ClientMessage&);
   friend Encoded encode(const ServerMessage&);
-  std::shared_ptr<const std::vector<std::byte>> payload_;
-  std::size_t size_ = 0;
+  Encoded(const std::uint8_t* payload, std::size_t length, std::size_t limit);
+
+  std::shared_ptr<const std::byte[]> payload_;
+  std::size_t length_ = 0;  // bytes of the payload
 };
 
-inline constexpr std::size_t kHeaderSize = 16;  // bytes
-
 Encoded encode(const ClientMessage& message);
-/// For Notify the token is not part of the payload: it travels in the packet header.
+/// A Notify is encoded without its token: give that to packet_for.
 Encoded encode(const ServerMessage& message);
+
+/// Why the daemon would take this request for malformed: a name over kMaxWireName or with a NUL in it, an
+/// enumeration value that does not exist, a payload that does not fit a message. Empty: it would not. (An
+/// enumeration of 0, "not set", passes: it is the engine's to answer.)
+std::string problem_with(const Request& request);
 
 /// Puts packets together again, one message at a time. The first thing wrong makes it fail for good.
 class Assembler {
@@ -51,16 +71,21 @@ class Assembler {
   /// Takes one packet. False: the packet is malformed, oversized or out of order; `error` says how.
   bool add(std::span<const std::byte> packet, std::string* error);
   /// True when a whole message stands; take it before the next add.
-  bool complete() const;
+  bool complete() const { return expected_ != 0 && buffer_.size() == expected_; }
 
+  /// The whole message, decoded. Nothing: it is malformed and `error` says how.
   std::optional<ClientMessage> take_client_message(std::string* error);
   std::optional<ServerMessage> take_server_message(std::string* error);
 
  private:
+  bool fail(std::string* error, const char* why);
+  void reset();
+
   std::size_t max_message_;
   std::vector<std::byte> buffer_;
   std::size_t expected_ = 0;  // bytes of the message under way; 0: none
   Token token_ = -1;
+  bool failed_ = false;
 };
 
 }  // namespace gs::wire

@@ -1,7 +1,7 @@
 // What a client and its daemon say to each other, as values. codec.h turns them into packets and back.
 //
-// A client opens two connections to the daemon's socket: the request channel (Hello, then a request and its Answer at
-// a time) and the event channel (Attach, then notifications one way, pings and their answers).
+// A client opens two connections to the daemon's socket: the request channel (Hello, then a request and its Answer
+// at a time) and the event channel (Attach, then notifications one way, pings and their answers).
 #pragma once
 
 #include "engine/types.h"
@@ -29,7 +29,7 @@ struct Call {
 };
 /// Replaces the session's responsiveness settings. Only WYX_PING_RESPONSIVENESS and its modifiers.
 struct SetResponsiveness {
-  std::uint32_t type = 0;  // flags of wyx_responsiveness_type_t
+  std::uint32_t type = 0;        // flags of wyx_responsiveness_type_t
   std::uint32_t interval = 0;    // seconds
   std::uint16_t time_limit = 0;  // seconds
 };

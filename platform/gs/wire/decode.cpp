@@ -1,0 +1,330 @@
+#include <algorithm>
+
+#include "gs_generated.h"
+#include "wire/codec.h"
+#include "wire/enumerations.h"
+#include "wire/fb_codec.h"
+
+namespace gs::wire::detail {
+namespace {
+
+using FbBytes = flatbuffers::Vector<std::uint8_t>;
+using FbProviders = flatbuffers::Vector<const fb::ProviderId*>;
+using FbLeaveCodes = flatbuffers::Vector<const fb::LeaveCode*>;
+using FbVoteResults = flatbuffers::Vector<flatbuffers::Offset<fb::VoteResult>>;
+
+/// Turns a verified FlatBuffer into values. The first thing wrong is kept; what is read after it is not to be
+/// used.
+class Reader {
+ public:
+  const char* problem() const { return problem_; }
+  void fail(const char* why) {
+    if (problem_ == nullptr) problem_ = why;
+  }
+
+  template <typename E>
+  E enumeration(int value) {
+    if (known(static_cast<E*>(nullptr), value)) return static_cast<E>(value);
+    fail("a number that is no value of its enumeration");
+    return E();
+  }
+
+  std::uint32_t flags(std::uint32_t value, std::uint32_t known_bits) {
+    if ((value & ~known_bits) != 0) fail("flags that do not exist");
+    return value;
+  }
+
+  std::string name(const flatbuffers::String* text) {
+    if (text->size() > kMaxWireName) {
+      fail("a name over the limit");
+      return {};
+    }
+    std::string value = text->str();
+    if (value.find('\0') != std::string::npos) fail("a name with a NUL in it");
+    return value;
+  }
+
+  static Bytes bytes(const FbBytes* data) { return {reinterpret_cast<const char*>(data->data()), data->size()}; }
+  static std::optional<Bytes> optional_bytes(const FbBytes* data) {
+    return data == nullptr ? std::nullopt : std::optional<Bytes>(bytes(data));
+  }
+  static SharedBytes shared_bytes(const FbBytes* data) {
+    return data == nullptr ? nullptr : std::make_shared<const Bytes>(bytes(data));
+  }
+
+  static ProviderId value(const fb::ProviderId* id) { return {id->instance(), id->node()}; }
+  ProtocolTerms value(const fb::Terms* terms) {
+    return {enumeration<wyx_num_phases_t>(terms->num_phases()), terms->time_limit()};
+  }
+
+  static Membership members(const FbProviders* ids) {
+    Membership result;
+    result.reserve(ids->size());
+    std::transform(ids->begin(), ids->end(), std::back_inserter(result), [](auto* id) { return value(id); });
+    return result;
+  }
+  static SharedMembership shared_members(const FbProviders* ids) {
+    return ids == nullptr ? nullptr : std::make_shared<const Membership>(members(ids));
+  }
+
+  /// One for each of `changing`, or none.
+  std::vector<LeaveCode> leave_codes(const FbLeaveCodes* codes, const FbProviders* changing) {
+    if (codes == nullptr) return {};
+    if (changing == nullptr || codes->size() != changing->size()) fail("leave codes that match no providers");
+    std::vector<LeaveCode> result;
+    result.reserve(codes->size());
+    for (const fb::LeaveCode* code : *codes) {
+      result.push_back({flags(code->voluntary_or_failure(), kLeaveCodeBits), code->voluntary_code()});
+    }
+    return result;
+  }
+
+  GroupAttributes value(const fb::Attributes* a) {
+    GroupAttributes result;
+    result.client_version = a->client_version();
+    result.batch_control = enumeration<wyx_batch_ctrl_t>(a->batch_control());
+    result.num_phases = enumeration<wyx_num_phases_t>(a->num_phases());
+    result.source_reflection_num_phases = enumeration<wyx_num_phases_t>(a->source_reflection_num_phases());
+    result.default_vote = enumeration<wyx_vote_value_t>(a->default_vote());
+    result.merge_control = enumeration<wyx_merge_ctrl_t>(a->merge_control());
+    result.time_limit = a->time_limit();
+    result.source_reflection_time_limit = a->source_reflection_time_limit();
+    result.group_name = name(a->group_name());
+    result.source_group_name = name(a->source_group_name());
+    return result;
+  }
+  std::shared_ptr<const GroupAttributes> shared_value(const fb::Attributes* a) {
+    return a == nullptr ? nullptr : std::make_shared<const GroupAttributes>(value(a));
+  }
+
+  // ---------------------------------------------------------------------------------------------- requests
+
+  Request value(const fb::Join* r) {
+    return JoinRequest{r->token(), value(r->attributes()), r->instance(), name(r->local_name())};
+  }
+  Request value(const fb::StateChange* r) {
+    return StateChangeRequest{r->token(), value(r->terms()), bytes(r->new_state())};
+  }
+  Request value(const fb::Message* r) {
+    return MessageRequest{r->token(), value(r->terms()), bytes(r->message())};
+  }
+  Request value(const fb::Leave* r) { return LeaveRequest{r->token(), value(r->terms()), r->leave_code()}; }
+  Request value(const fb::Expel* r) {
+    return ExpelRequest{r->token(), value(r->terms()), members(r->expelled()), r->deactivate_phase(),
+                        bytes(r->deactivate_flag())};
+  }
+  Request value(const fb::AttributeChange* r) {
+    return AttributeChangeRequest{r->token(), value(r->terms()), value(r->attributes())};
+  }
+  Request value(const fb::Vote* r) {
+    return VoteRequest{r->token(), enumeration<wyx_vote_value_t>(r->vote()), optional_bytes(r->proposed_state()),
+                       optional_bytes(r->message()), enumeration<wyx_vote_value_t>(r->default_vote())};
+  }
+  Request value(const fb::Subscribe* r) {
+    return SubscribeRequest{r->token(), r->control(), name(r->group_name())};
+  }
+
+  /// `table` is the union's member, of the type that `kind` says.
+  Request request(fb::Request kind, const void* table) {
+    switch (kind) {
+      case fb::Request::Join:
+        return value(static_cast<const fb::Join*>(table));
+      case fb::Request::StateChange:
+        return value(static_cast<const fb::StateChange*>(table));
+      case fb::Request::Message:
+        return value(static_cast<const fb::Message*>(table));
+      case fb::Request::Leave:
+        return value(static_cast<const fb::Leave*>(table));
+      case fb::Request::Expel:
+        return value(static_cast<const fb::Expel*>(table));
+      case fb::Request::AttributeChange:
+        return value(static_cast<const fb::AttributeChange*>(table));
+      case fb::Request::Goodbye:
+        return GoodbyeRequest{static_cast<const fb::Goodbye*>(table)->token()};
+      case fb::Request::Vote:
+        return value(static_cast<const fb::Vote*>(table));
+      case fb::Request::Subscribe:
+        return value(static_cast<const fb::Subscribe*>(table));
+      case fb::Request::Unsubscribe:
+        return UnsubscribeRequest{static_cast<const fb::Unsubscribe*>(table)->token()};
+      case fb::Request::NONE:
+        break;
+    }
+    fail("a request of an unknown kind");
+    return {};
+  }
+
+  // ----------------------------------------------------------------------------------------- notifications
+
+  std::vector<VoteResult> votes(const FbVoteResults* results) {
+    std::vector<VoteResult> values;
+    if (results == nullptr) return values;
+    values.reserve(results->size());
+    for (const fb::VoteResult* r : *results) {
+      values.push_back({value(r->voter()), enumeration<wyx_vote_value_t>(r->vote()),
+                        flags(r->summary(), kSummaryBits), flags(r->leave_code(), kLeaveCodeBits),
+                        optional_bytes(r->proposed_state()), optional_bytes(r->message())});
+    }
+    return values;
+  }
+
+  Proposal value(const fb::Proposal* p) {
+    Proposal result;
+    result.num_phases = p->num_phases();
+    result.phase = p->phase();
+    result.proposed_by = value(p->proposed_by());
+    result.whats_changed = flags(p->whats_changed(), kWhatsChangedBits);
+    result.current_providers = shared_members(p->current_providers());
+    result.changing_providers = shared_members(p->changing_providers());
+    result.leave_codes = leave_codes(p->leave_codes(), p->changing_providers());
+    if (const auto* expel = p->expel_info()) {
+      result.expel_info = ExpelInfo{expel->deactivate_phase(), bytes(expel->flag())};
+    }
+    result.current_state = shared_bytes(p->current_state());
+    result.proposed_state = shared_bytes(p->proposed_state());
+    result.message = shared_bytes(p->message());
+    result.new_attributes = shared_value(p->new_attributes());
+    result.current_vote_results = votes(p->current_vote_results());
+    result.changing_vote_results = votes(p->changing_vote_results());
+    return result;
+  }
+
+  Notification value(const fb::Protocol* n) {
+    return ProtocolNotification{enumeration<wyx_notification_type_t>(n->type()),
+                                enumeration<wyx_request_t>(n->protocol()),
+                                flags(n->summary(), kSummaryBits),
+                                n->time_limit(),
+                                value(n->proposal()),
+                                n->seqnum()};
+  }
+  Notification value(const fb::Announcement* n) {
+    return AnnouncementNotification{flags(n->summary(), kSummaryBits), shared_members(n->providers())};
+  }
+  Notification value(const fb::Subscription* n) {
+    return SubscriptionNotification{flags(n->type(), kSubscriptionTypeBits),
+                                    shared_bytes(n->state()),
+                                    shared_members(n->full_membership()),
+                                    shared_members(n->changing_membership()),
+                                    leave_codes(n->leave_codes(), n->changing_membership()),
+                                    n->seqnum()};
+  }
+  Notification value(const fb::DelayedError* n) {
+    return DelayedErrorNotification{enumeration<wyx_request_t>(n->protocol()), enumeration<wyx_rc_t>(n->rc()),
+                                    request(n->failing_request_type(), n->failing_request()),
+                                    shared_value(n->group_attributes())};
+  }
+
+  Notification notification(const fb::Notify& m) {
+    switch (m.what_type()) {
+      case fb::Notification::Protocol:
+        return value(m.what_as_Protocol());
+      case fb::Notification::Announcement:
+        return value(m.what_as_Announcement());
+      case fb::Notification::Subscription:
+        return value(m.what_as_Subscription());
+      case fb::Notification::DelayedError:
+        return value(m.what_as_DelayedError());
+      case fb::Notification::NONE:
+        break;
+    }
+    fail("a notification of an unknown kind");
+    return {};
+  }
+
+  // ---------------------------------------------------------------------------------------------- messages
+
+  ClientMessage client_message(const fb::ClientMessage& m);
+  ServerMessage server_message(const fb::ServerMessage& m, Token token);
+
+ private:
+  const char* problem_ = nullptr;
+};
+
+ClientMessage Reader::client_message(const fb::ClientMessage& m) {
+  switch (m.body_type()) {
+    case fb::ClientBody::Hello: {
+      const auto* hello = m.body_as_Hello();
+      return Hello{hello->protocol_version(), hello->api_version(), hello->socket_control(),
+                   name(hello->program())};
+    }
+    case fb::ClientBody::Attach:
+      return Attach{m.body_as_Attach()->session_number(), m.body_as_Attach()->cookie()};
+    case fb::ClientBody::Call:
+      return Call{request(m.body_as_Call()->request_type(), m.body_as_Call()->request())};
+    case fb::ClientBody::SetResponsiveness: {
+      const auto* set = m.body_as_SetResponsiveness();
+      return SetResponsiveness{set->type(), set->interval(), set->time_limit()};
+    }
+    case fb::ClientBody::QueryNode:
+      return QueryNode{};
+    case fb::ClientBody::PingAnswer:
+      return PingAnswer{m.body_as_PingAnswer()->number(), m.body_as_PingAnswer()->ok()};
+    case fb::ClientBody::Quit:
+      return Quit{};
+    case fb::ClientBody::NONE:
+      break;
+  }
+  fail("a message of an unknown kind");
+  return {};
+}
+
+ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
+  if (token != -1 && m.body_type() != fb::ServerBody::Notify) fail("a token on a message that has none");
+  switch (m.body_type()) {
+    case fb::ServerBody::Welcome: {
+      const auto* welcome = m.body_as_Welcome();
+      return Welcome{welcome->node_number(), welcome->session_number(), welcome->cookie()};
+    }
+    case fb::ServerBody::Answer:
+      return Answer{enumeration<wyx_rc_t>(m.body_as_Answer()->rc())};
+    case fb::ServerBody::NodeInfo:
+      return NodeInfo{m.body_as_NodeInfo()->node_number(), m.body_as_NodeInfo()->domain_master_node()};
+    case fb::ServerBody::Notify:
+      return Notify{token, std::make_shared<const Notification>(notification(*m.body_as_Notify()))};
+    case fb::ServerBody::Ping:
+      return Ping{m.body_as_Ping()->number()};
+    case fb::ServerBody::Farewell:
+      return Farewell{};
+    case fb::ServerBody::NONE:
+      break;
+  }
+  fail("a message of an unknown kind");
+  return {};
+}
+
+constexpr flatbuffers::uoffset_t kMaxDepth = 16;  // of tables in tables; the schema needs six
+
+/// The root table of `payload` once it is verified; null: it is not one.
+template <typename Table>
+const Table* verified_root(std::span<const std::byte> payload, const char* id, std::string* error) {
+  const auto* data = reinterpret_cast<const std::uint8_t*>(payload.data());
+  flatbuffers::Verifier verifier(data, payload.size(), kMaxDepth);
+  if (verifier.VerifyBuffer<Table>(id)) return flatbuffers::GetRoot<Table>(data);
+  *error = "not a well-formed message";
+  return nullptr;
+}
+
+}  // namespace
+
+std::optional<ClientMessage> parse_client_message(std::span<const std::byte> payload, std::string* error) {
+  const auto* root = verified_root<fb::ClientMessage>(payload, kClientMessageId, error);
+  if (root == nullptr) return std::nullopt;
+  Reader reader;
+  ClientMessage message = reader.client_message(*root);
+  if (reader.problem() == nullptr) return message;
+  *error = reader.problem();
+  return std::nullopt;
+}
+
+std::optional<ServerMessage> parse_server_message(std::span<const std::byte> payload, Token token,
+                                                  std::string* error) {
+  const auto* root = verified_root<fb::ServerMessage>(payload, kServerMessageId, error);
+  if (root == nullptr) return std::nullopt;
+  Reader reader;
+  ServerMessage message = reader.server_message(*root, token);
+  if (reader.problem() == nullptr) return message;
+  *error = reader.problem();
+  return std::nullopt;
+}
+
+}  // namespace gs::wire::detail
