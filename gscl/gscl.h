@@ -1,0 +1,16 @@
+// All public headers of the group-services classes.
+#ifndef GSCL_GSCL_H
+#define GSCL_GSCL_H
+
+#include "gscl/GSDebug.h"
+#include "gscl/GSLocalVar.h"
+#include "gscl/GSLockPrim.h"
+#include "gscl/GSObject.h"
+#include "gscl/GSString.h"
+#include "gscl/GSTypes.h"
+#include "gscl/GSUtils.h"
+#include "gscl/GSValues.h"
+#include "gscl/gslib_dli.h"
+#include "gscl/wyx_api.h"
+
+#endif
