@@ -3,7 +3,7 @@
 include(CMakePackageConfigHelpers)
 
 # The libraries that users link against, and the one that is loaded at run time.
-install(TARGETS zn_gscl zn_cu EXPORT zn_gscl
+install(TARGETS zn_gscl zn_cu kpl EXPORT zn_gscl
         LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
         INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 foreach(target IN ITEMS wyx_r gsd)
@@ -16,7 +16,7 @@ endforeach()
 
 install(DIRECTORY gscl/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/gscl FILES_MATCHING PATTERN "*.h"
         PATTERN "*_internal.h" EXCLUDE)
-install(FILES platform/cu/zn_cu.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(FILES platform/cu/zn_cu.h platform/kpl/kpl.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 
 # find_package(zn_gscl) gives zn_gscl::zn_gscl and zn_gscl::zn_cu.
 set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/zn_gscl)

@@ -1,0 +1,93 @@
+// The subsystem's side: answering the request being served.
+#include <errno.h>
+#include <poll.h>
+#include <string.h>
+#include <sys/uio.h>
+
+#include <chrono>
+
+#include "kpl.h"
+#include "local_socket.h"
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using std::chrono::milliseconds;
+
+/// How long one answer may wait for a requester that does not read.
+constexpr milliseconds kPatience{2000};
+
+/// The answer that a thread is giving.
+struct Answer {
+  kplhdr header;
+  kpl::Descriptor socket;
+  milliseconds patience = kPatience;
+  int gone = 0;  ///< the error that told that the requester is gone; 0 while it is there
+
+  void restart() {
+    socket.reset();
+    patience = kPatience;
+    gone = 0;
+  }
+};
+
+thread_local Answer answer;
+
+int connect_to(const sockaddr_un& retaddr) {
+  const socklen_t length = kpl::address_length(retaddr);
+  if (length == 0) return EDESTADDRREQ;
+  answer.socket.reset(kpl::open_datagram_socket());
+  if (!answer.socket.is_open()) return errno;
+  const auto* address = reinterpret_cast<const sockaddr*>(&retaddr);
+  return connect(answer.socket.get(), address, length) == 0 ? 0 : errno;
+}
+
+/// Waits until the requester has room or the patience is used up; returns an error number.
+int wait_for_room() {
+  const auto start = Clock::now();
+  pollfd entry = {answer.socket.get(), POLLOUT, 0};
+  const int ready = poll(&entry, 1, static_cast<int>(answer.patience.count()));
+  // One millisecond more than measured, so that the waiting ends also when each wait is too short to count.
+  answer.patience -= std::chrono::duration_cast<milliseconds>(Clock::now() - start) + milliseconds(1);
+  if (answer.patience.count() <= 0) return ETIMEDOUT;
+  return ready >= 0 || errno == EINTR ? 0 : errno;
+}
+
+int send_packet(kplhdr* header, char* body, size_t body_len) {
+  iovec parts[] = {{header, sizeof *header}, {body, body_len}};
+  msghdr message = {};
+  message.msg_iov = parts;
+  message.msg_iovlen = 2;
+  for (;;) {
+    if (sendmsg(answer.socket.get(), &message, MSG_DONTWAIT | MSG_NOSIGNAL) >= 0) return 0;
+    if (errno == EINTR) continue;
+    if (errno != EAGAIN) return errno;
+    if (const int error = wait_for_room(); error != 0) return error;
+  }
+}
+
+}  // namespace
+
+kplhdr* kplrrqs(char* request_header) {
+  answer.restart();
+  memcpy(&answer.header, request_header, sizeof answer.header);
+  return &answer.header;
+}
+
+int kplsrpy(kplhdr* header, char* reply, int reply_len, int cont) {
+  if (reply_len < static_cast<int>(sizeof(kplhdr))) {
+    errno = EINVAL;
+    return -1;
+  }
+  kplhdr own = {};
+  own.retaddr = header->retaddr;
+  own.dversion = header->dversion;
+  own.cont = static_cast<short>(cont);
+  if (answer.gone == 0 && !answer.socket.is_open()) answer.gone = connect_to(own.retaddr);
+  if (answer.gone == 0) answer.gone = send_packet(&own, reply + sizeof own, reply_len - sizeof own);
+  const int error = answer.gone;
+  if (cont == KPL_CONT_END) answer.restart();
+  if (error == 0) return 0;
+  errno = error;
+  return -1;
+}
