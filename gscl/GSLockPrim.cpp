@@ -9,7 +9,8 @@
 namespace zelt_gscl_V1 {
 
 static_assert(sizeof(GSBaseMutex) == 40 && sizeof(GSBaseCondition) == 48, "thin over the POSIX objects");
-static_assert(sizeof(GSCondition) == 96 && sizeof(GSMutexLock) == 104 && sizeof(GSRWLockImpl) == 160, "fixed layouts");
+static_assert(sizeof(GSCondition) == 96 && sizeof(GSMutexLock) == 104 && sizeof(GSRWLockImpl) == 160,
+              "fixed layouts");
 static_assert(sizeof(GSRWLock) == sizeof(void*), "a handle is one pointer");
 
 namespace {

@@ -3,10 +3,12 @@
 // Common to all classes here:
 // - Any thread may call any operation on a live object. No operation holds two internal mutexes, so the classes
 //   impose no lock order of their own.
-// - Results: 0, otherwise the error number of the threads library (ETIMEDOUT when a deadline passed). Nothing throws.
+// - Results: 0, otherwise the error number of the threads library (ETIMEDOUT when a deadline passed). Nothing
+// throws.
 // - A deadline is an absolute wall-clock time, as GSGetAbsTime makes it; null waits without limit. It matters only
 //   when there is something to wait for: a free lock is taken also past it.
-// - Every wait is a cancellation point. A thread that is cancelled in one leaves the object as if it had never called:
+// - Every wait is a cancellation point. A thread that is cancelled in one leaves the object as if it had never
+// called:
 //   counters restored, internal mutex released, waiters that it held up woken. The cancellation unwinds
 //   through the caller's frames.
 // - A failure of an internal mutex is fatal: "asserted: rc=%d in %s (line=%d)\n" on standard error, then abort.
@@ -51,8 +53,8 @@ class ZN_GSCL_EXPORT GSBaseCondition {
   GSBaseCondition(const GSBaseCondition&) = delete;
   GSBaseCondition& operator=(const GSBaseCondition&) = delete;
 
-  /// Releases `m`, which the caller holds, waits, and takes `m` again, also when the wait ends with an error or the
-  /// thread is cancelled. May return 0 without a signal.
+  /// Releases `m`, which the caller holds, waits, and takes `m` again, also when the wait ends with an error or
+  /// the thread is cancelled. May return 0 without a signal.
   int wait(GSBaseMutex* m, const timespec* abstime);
   /// Wakes one waiter, if there is one.
   int signal();
@@ -123,9 +125,9 @@ class ZN_GSCL_EXPORT GSMutexLock {
 
 /// A reader/writer lock that prefers writers: once a writer waits, new readers wait too. The writer may re-enter.
 ///
-/// It cannot be upgraded: a reader that asks for the write lock waits for itself, and so does a writer that asks for
-/// a read lock. A thread that has a read lock must not ask for another one while a writer may be waiting.
-/// A release does not check that the caller has the lock. A writer that gives up (deadline, cancellation) lets the
+/// It cannot be upgraded: a reader that asks for the write lock waits for itself, and so does a writer that asks
+/// for a read lock. A thread that has a read lock must not ask for another one while a writer may be waiting. A
+/// release does not check that the caller has the lock. A writer that gives up (deadline, cancellation) lets the
 /// readers proceed that wait behind it alone.
 class ZN_GSCL_EXPORT GSRWLockImpl {
  public:
