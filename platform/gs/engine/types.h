@@ -145,7 +145,8 @@ using Request = std::variant<JoinRequest, StateChangeRequest, MessageRequest, Le
 // -------------------------------------------------------------------------------------------- ordered events
 
 /// A client's request. `answered`: its daemon has already said WYX_OK to the client (from precheck), so a refusal
-/// found now goes out as a delayed error.
+/// found now goes out as a delayed error. None may be ordered after its session's SessionGoneEvent; those of a host
+/// that is gone are refused with WYX_NO_INIT.
 struct RequestEvent {
   SessionId session;
   Request request;
@@ -248,7 +249,7 @@ struct SubscriptionNotification {
 };
 struct DelayedErrorNotification {
   wyx_request_t protocol = WYX_JOIN;
-  wyx_rc_t rc = WYX_OK;
+  wyx_rc_t rc = WYX_OK;  // `protocol` is WYX_INTERNAL_REQUEST for a vote or a goodbye
   Request failing_request;
   std::shared_ptr<const GroupAttributes> group_attributes;  // the group's, when they are the reason
 };
@@ -268,7 +269,8 @@ struct TimerRequest {
   std::uint16_t seconds = 0;
 };
 
-/// What came of one ordered event. `rc` answers a RequestEvent that was not answered before.
+/// What came of one ordered event. `rc` answers a RequestEvent; where it was answered before, a refusal is among the
+/// deliveries instead.
 struct Outcome {
   wyx_rc_t rc = WYX_OK;
   std::vector<Delivery> deliveries;  // in the order in which each endpoint must see them

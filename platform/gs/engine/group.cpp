@@ -1,0 +1,307 @@
+#include "engine/group.h"
+
+#include <algorithm>
+
+namespace gs {
+namespace {
+
+wyx_request_t protocol_of(const Request& request) {
+  // A vote, a goodbye and an unsubscription are no protocols.
+  static constexpr wyx_request_t kTypes[] = {
+      WYX_JOIN,         WYX_STATE_VALUE_CHANGE,     WYX_PROVIDER_MESSAGE, WYX_LEAVE,
+      WYX_EXPEL,        WYX_GROUP_ATTRIBUTE_CHANGE, WYX_INTERNAL_REQUEST, WYX_INTERNAL_REQUEST,
+      WYX_SUBSCRIPTION, WYX_INTERNAL_REQUEST};
+  static_assert(std::size(kTypes) == std::variant_size_v<Request>);
+  return kTypes[request.index()];
+}
+
+}  // namespace
+
+Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
+                       std::shared_ptr<const GroupAttributes> group_attributes) {
+  DelayedErrorNotification error;
+  error.protocol = protocol_of(request);
+  error.rc = rc;
+  error.failing_request = request;
+  error.group_attributes = std::move(group_attributes);
+  return {to, std::make_shared<Notification>(std::move(error))};
+}
+
+Group::Group(std::string name)
+    : name_(std::move(name)),
+      member_ids_(std::make_shared<const Membership>()),
+      state_value_(std::make_shared<const Bytes>()) {}
+
+// ------------------------------------------------------------------------------------------------------ checks
+
+wyx_rc_t Group::check_join(const GroupAttributes& attributes, ProviderId id) const {
+  if (attributes_ && attributes != *attributes_) return WYX_BAD_GROUP_ATTRIBUTES;
+  // The id of a provider that is gone is free: its failure leave comes before any join that waits.
+  auto holds_id = [&](const MemberPtr& m) { return m->id == id && !m->gone(); };
+  const bool taken = std::any_of(members_.begin(), members_.end(), holds_id) ||
+                     (run_ && std::any_of(run_->changing.begin(), run_->changing.end(), holds_id)) ||
+                     std::any_of(queue_.begin(), queue_.end(), [&](const Queued& q) { return holds_id(q.who); });
+  return taken ? WYX_DUPLICATE_INSTANCE_NUMBER : WYX_OK;
+}
+
+wyx_rc_t Group::check_leave(const Member& member) const {
+  if (member.stage != Member::Stage::kJoined) return WYX_NOT_A_MEMBER;
+  return member.leaving ? WYX_COLLIDE : WYX_OK;
+}
+
+wyx_rc_t Group::check_proposal(const Member& member) const {
+  if (member.stage != Member::Stage::kJoined) return WYX_NOT_A_MEMBER;
+  return run_ ? WYX_COLLIDE : WYX_OK;
+}
+
+wyx_rc_t Group::check_expel(const Membership& expelled) const {
+  Membership present = *member_ids_;
+  std::sort(present.begin(), present.end());
+  const bool all_present = std::all_of(expelled.begin(), expelled.end(), [&](ProviderId id) {
+    return std::binary_search(present.begin(), present.end(), id);
+  });
+  return all_present ? WYX_OK : WYX_UNKNOWN_PROVIDER;
+}
+
+wyx_rc_t Group::check_new_attributes(const GroupAttributes& attributes) const {
+  return attributes.group_name == name_ ? WYX_OK : WYX_BAD_GROUP_ATTRIBUTES;
+}
+
+wyx_rc_t Group::check_vote(const Member& member) const {
+  return member.ballot.open ? WYX_OK : WYX_VOTE_NOT_EXPECTED;
+}
+
+// ---------------------------------------------------------------------------------------------------- requests
+
+void Group::join(MemberPtr joiner, const JoinRequest& request) { queue_.push_back({std::move(joiner), request}); }
+
+void Group::leave(const MemberPtr& member, const LeaveRequest& request) {
+  member->leaving = true;
+  queue_.push_back({member, request});
+}
+
+void Group::propose(const Member& proposer, const StateChangeRequest& request, Surroundings& env) {
+  Run run = new_run(WYX_STATE_VALUE_CHANGE, request.terms, proposer.id);
+  run.proposed_state = std::make_shared<const Bytes>(request.new_state);
+  start(std::move(run), env);
+}
+
+void Group::propose(const Member& proposer, const MessageRequest& request, Surroundings& env) {
+  Run run = new_run(WYX_PROVIDER_MESSAGE, request.terms, proposer.id);
+  run.message = std::make_shared<const Bytes>(request.message);
+  start(std::move(run), env);
+}
+
+void Group::propose(const Member& proposer, const ExpelRequest& request, Surroundings& env) {
+  Run run = new_run(WYX_EXPEL, request.terms, proposer.id);
+  run.expel_info = ExpelInfo{request.deactivate_phase, request.deactivate_flag};
+  Membership listed = request.expelled;
+  std::sort(listed.begin(), listed.end());
+  for (const MemberPtr& m : members_)
+    if (std::binary_search(listed.begin(), listed.end(), m->id)) add_changing(run, m, {run.traits->leave_code, 0});
+  start(std::move(run), env);
+}
+
+void Group::propose(const Member& proposer, const AttributeChangeRequest& request, Surroundings& env) {
+  Run run = new_run(WYX_GROUP_ATTRIBUTE_CHANGE, request.terms, proposer.id);
+  run.new_attributes = std::make_shared<const GroupAttributes>(request.attributes);
+  start(std::move(run), env);
+}
+
+void Group::lose(const MemberPtr& member, std::uint32_t leave_code) {
+  member->gone_code = leave_code;
+  std::erase_if(queue_, [&](const Queued& q) { return q.who == member; });
+  if (member->ballot.open) cast_default(*member, WYX_PROVIDER_FAILED);
+  if (member->stage == Member::Stage::kQueued)
+    member->stage = Member::Stage::kOut;
+  else
+    failures_.push_back(member);
+}
+
+void Group::announce(std::uint32_t summary, const Membership& about, Surroundings& env) const {
+  AnnouncementNotification announcement{summary, std::make_shared<const Membership>(about)};
+  auto note = std::make_shared<const Notification>(std::move(announcement));
+  for (const MemberPtr& m : members_)
+    if (!m->gone()) env.deliveries.push_back({m->to, note});
+}
+
+// --------------------------------------------------------------------------------------------------- the queue
+
+void Group::settle(Surroundings& env) {
+  for (;;) {
+    if (run_ && run_->missing > 0) return;
+    if (run_)
+      end_phase(env);
+    else if (!start_next(env))
+      return;
+  }
+}
+
+bool Group::start_next(Surroundings& env) {
+  if (start_failure_leave(env)) return true;
+  if (queue_.empty()) return false;
+  if (std::holds_alternative<LeaveRequest>(queue_.front().request))
+    start_leave(env);
+  else
+    start_join(env);
+  return true;
+}
+
+bool Group::start_failure_leave(Surroundings& env) {
+  std::erase_if(failures_, [](const MemberPtr& m) { return m->stage == Member::Stage::kOut; });
+  if (failures_.empty()) return false;
+  const std::size_t count = batches(WYX_BATCH_LEAVES) ? failures_.size() : 1;
+  const ProtocolTerms terms{attributes_->num_phases, attributes_->time_limit};
+  Run run = new_run(WYX_FAILURE_LEAVE, terms, failures_.front()->id);
+  for (std::size_t i = 0; i < count; ++i) {
+    add_changing(run, failures_.front(), {failures_.front()->gone_code, 0});
+    failures_.pop_front();
+  }
+  start(std::move(run), env);
+  return true;
+}
+
+// A batch takes the leaves that ask for the same phases and time limit as the first.
+void Group::start_leave(Surroundings& env) {
+  const ProtocolTerms terms = std::get<LeaveRequest>(queue_.front().request).terms;
+  Run run = new_run(WYX_LEAVE, terms, queue_.front().who->id);
+  for (auto it = queue_.begin(); it != queue_.end();) {
+    const auto* leave = std::get_if<LeaveRequest>(&it->request);
+    if (!leave || leave->terms != terms) {
+      ++it;
+      continue;
+    }
+    add_changing(run, it->who, {run.traits->leave_code, leave->leave_code});
+    it = queue_.erase(it);
+    if (!batches(WYX_BATCH_LEAVES)) break;
+  }
+  start(std::move(run), env);
+}
+
+// A join that no longer fits the group, whose attributes have changed or which has been born anew, ends here with
+// a delayed error.
+void Group::start_join(Surroundings& env) {
+  std::optional<Run> run;
+  for (auto it = queue_.begin(); it != queue_.end();) {
+    if (!std::holds_alternative<JoinRequest>(it->request)) {
+      ++it;
+      continue;
+    }
+    const Queued queued = std::move(*it);
+    it = queue_.erase(it);
+    const JoinRequest& join = std::get<JoinRequest>(queued.request);
+    if (members_.empty() && !run) attributes_ = std::make_shared<const GroupAttributes>(join.attributes);
+    if (wyx_rc_t rc = check_join(join.attributes, queued.who->id); rc != WYX_OK) {
+      queued.who->stage = Member::Stage::kOut;
+      env.clients.erase(queued.who->to);
+      env.deliveries.push_back(delayed_error(queued.who->to, join, rc, attributes_));
+      continue;
+    }
+    if (!run) run = new_run(WYX_JOIN, {attributes_->num_phases, attributes_->time_limit}, queued.who->id);
+    queued.who->stage = Member::Stage::kJoining;
+    add_changing(*run, queued.who, {});
+    if (!batches(WYX_BATCH_JOINS)) break;
+  }
+  if (run) start(std::move(*run), env);
+}
+
+Group::Run Group::new_run(wyx_request_t type, const ProtocolTerms& terms, ProviderId proposed_by) const {
+  Run run;
+  run.traits = &traits_of(type);
+  run.terms = terms;
+  run.proposed_by = proposed_by;
+  return run;
+}
+
+void Group::add_changing(Run& run, MemberPtr member, LeaveCode code) const {
+  run.changing.push_back(std::move(member));
+  if (run.traits->type != WYX_JOIN) run.leave_codes.push_back(code);
+}
+
+// ------------------------------------------------------------------------------------------------------- state
+
+GroupView Group::view() const {
+  GroupView view;
+  view.seqnum = seqnum_;
+  view.state = state_value_;
+  view.members = member_ids_;
+  return view;
+}
+
+void Group::forget_values() {
+  attributes_ = nullptr;
+  state_value_ = std::make_shared<const Bytes>();
+  seqnum_ = 0;
+}
+
+namespace {
+
+void add_member(Digest& digest, const Member& m) {
+  digest.add(m.to);
+  digest.add(m.id);
+  digest.add(m.local_name);
+  digest.add(m.stage);
+  digest.add(m.leaving);
+  digest.add(m.gone_code);
+  digest.add(m.ballot.open);
+  digest.add(m.ballot.vote);
+  digest.add(m.ballot.default_vote);
+  digest.add(m.ballot.summary);
+  digest.add(m.ballot.proposed_state.value_or(""));
+  digest.add(m.ballot.message.value_or(""));
+}
+
+template <typename List>
+void add_members(Digest& digest, const List& members) {
+  digest.add(members.size());
+  for (const MemberPtr& m : members) add_member(digest, *m);
+}
+
+}  // namespace
+
+void Group::add_to(Digest& digest) const {
+  digest.add(name_);
+  digest.add(attributes_ != nullptr);
+  if (attributes_) digest.add(*attributes_);
+  add_members(digest, members_);
+  digest.add(state_value_);
+  digest.add(seqnum_);
+  add_members(digest, failures_);
+  digest.add(queue_.size());
+  for (const Queued& q : queue_) {
+    add_member(digest, *q.who);
+    digest.add(q.request.index());
+    if (const auto* join = std::get_if<JoinRequest>(&q.request)) {
+      digest.add(join->attributes);
+    } else {
+      digest.add(std::get<LeaveRequest>(q.request).terms);
+      digest.add(std::get<LeaveRequest>(q.request).leave_code);
+    }
+  }
+  digest.add(run_.has_value());
+  if (!run_) return;
+  digest.add(run_->traits->type);
+  digest.add(run_->number);
+  digest.add(run_->terms);
+  digest.add(run_->phase);
+  digest.add(run_->proposed_by);
+  add_members(digest, run_->changing);
+  for (const LeaveCode& code : run_->leave_codes) {
+    digest.add(code.voluntary_or_failure);
+    digest.add(code.voluntary_code);
+  }
+  digest.add(run_->expel_info ? run_->expel_info->deactivate_phase : -1);
+  digest.add(run_->expel_info ? run_->expel_info->flag : Bytes());
+  digest.add(run_->new_attributes != nullptr);
+  if (run_->new_attributes) digest.add(*run_->new_attributes);
+  digest.add(run_->proposed_state);
+  digest.add(run_->message);
+  digest.add(run_->voted_message);
+  digest.add(run_->voters.size());
+  for (const MemberPtr& m : run_->voters) digest.add(m->to);
+  digest.add(run_->missing);
+  digest.add(run_->collect);
+  digest.add(run_->defaults);
+}
+
+}  // namespace gs

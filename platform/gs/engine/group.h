@@ -1,0 +1,137 @@
+// One group: its members, its values, the protocol it runs and the queue behind it.
+#pragma once
+
+#include <deque>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "engine/member.h"
+#include "engine/protocols.h"
+#include "engine/subscribers.h"
+
+namespace gs {
+
+/// What a group reaches outside itself while an event is applied.
+struct Surroundings {
+  std::vector<Delivery>& deliveries;
+  std::vector<TimerRequest>& timers;
+  SubscriberTable& subscribers;
+  ClientTable& clients;
+  std::uint64_t& last_protocol;  // numbers are never used twice, so a timer of a dead group's protocol finds none
+};
+
+/// The error that reaches a client after it has been told WYX_OK.
+Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
+                       std::shared_ptr<const GroupAttributes> group_attributes = nullptr);
+
+/// Lives from the first join's request until it has neither members nor work. Members that have died or said
+/// goodbye stay in the membership until their failure leave is approved, and are sent nothing.
+///
+/// Every call but `settle` only takes note; `settle` then runs what can run. The check_ functions say what the
+/// request of the same name is answered; a request is made only when its check says WYX_OK.
+class Group {
+ public:
+  explicit Group(std::string name);
+
+  wyx_rc_t check_join(const GroupAttributes& attributes, ProviderId id) const;
+  wyx_rc_t check_leave(const Member& member) const;
+  wyx_rc_t check_proposal(const Member& member) const;
+  wyx_rc_t check_expel(const Membership& expelled) const;
+  wyx_rc_t check_new_attributes(const GroupAttributes& attributes) const;
+  wyx_rc_t check_vote(const Member& member) const;
+
+  void join(MemberPtr joiner, const JoinRequest& request);
+  void leave(const MemberPtr& member, const LeaveRequest& request);
+  void propose(const Member& proposer, const StateChangeRequest& request, Surroundings& env);
+  void propose(const Member& proposer, const MessageRequest& request, Surroundings& env);
+  void propose(const Member& proposer, const ExpelRequest& request, Surroundings& env);
+  void propose(const Member& proposer, const AttributeChangeRequest& request, Surroundings& env);
+  void vote(Member& voter, const VoteRequest& request);
+
+  /// The provider is dead or has said goodbye. The caller has taken it out of the client table.
+  void lose(const MemberPtr& member, std::uint32_t leave_code);
+  /// Ignored unless it is the time limit of the phase that runs.
+  void expire(const TimerId& timer);
+  void announce(std::uint32_t summary, const Membership& about, Surroundings& env) const;
+
+  /// Runs the protocol and the queue on until they wait for a vote or there is nothing left to do.
+  void settle(Surroundings& env);
+
+  bool born() const { return !members_.empty(); }
+  bool finished() const { return members_.empty() && !run_ && queue_.empty(); }
+  const std::string& name() const { return name_; }
+  std::shared_ptr<const GroupAttributes> attributes() const { return attributes_; }
+  const Membership& member_ids() const { return *member_ids_; }
+  std::size_t state_length() const { return state_value_->size(); }
+  std::uint64_t seqnum() const { return seqnum_; }
+  const char* running_protocol() const { return run_ ? run_->traits->name : ""; }
+  GroupView view() const;
+  void add_to(Digest& digest) const;
+
+ private:
+  struct Queued {
+    MemberPtr who;
+    std::variant<JoinRequest, LeaveRequest> request;
+  };
+  /// The protocol that runs.
+  struct Run {
+    const ProtocolTraits* traits = nullptr;
+    std::uint64_t number = 0;
+    ProtocolTerms terms;
+    std::uint32_t phase = 1;
+    ProviderId proposed_by;
+    std::vector<MemberPtr> changing;
+    SharedMembership changing_ids;
+    std::vector<LeaveCode> leave_codes;
+    std::optional<ExpelInfo> expel_info;
+    std::shared_ptr<const GroupAttributes> new_attributes;
+    SharedBytes proposed_state;
+    SharedBytes message;
+    SharedBytes voted_message;      // the last one of this phase's votes
+    std::vector<MemberPtr> voters;  // of this phase
+    std::size_t missing = 0;        // votes
+    std::uint32_t collect = 0;      // WYX_COLLECT_ flags of the group as it was at the start
+    std::uint32_t defaults = 0;     // summary flags of the default votes counted so far
+  };
+
+  // The queue (group.cpp).
+  bool start_next(Surroundings& env);
+  bool start_failure_leave(Surroundings& env);
+  void start_leave(Surroundings& env);
+  void start_join(Surroundings& env);
+  bool batches(wyx_batch_ctrl_t what) const { return (attributes_->batch_control & what) != 0; }
+  Run new_run(wyx_request_t type, const ProtocolTerms& terms, ProviderId proposed_by) const;
+  void add_changing(Run& run, MemberPtr member, LeaveCode code) const;
+
+  // The running protocol (group_protocol.cpp).
+  void start(Run run, Surroundings& env);
+  void open_phase(Surroundings& env);
+  void end_phase(Surroundings& env);
+  void cast_default(Member& voter, std::uint32_t cause);
+  void approve(std::uint32_t summary, Surroundings& env);
+  void reject(std::uint32_t summary, Surroundings& env);
+  void change_membership(const Run& run);
+  void dismiss(const Run& run, Surroundings& env);
+  void tell_subscribers(const Run& run, bool was_born, Surroundings& env);
+  void forget_values();
+
+  // What a protocol says (group_protocol.cpp).
+  ProtocolNotification compose(const Run& run, wyx_notification_type_t type, std::uint32_t summary) const;
+  void add_vote_results(const Run& run, Proposal& proposal) const;
+  void send(const Run& run, ProtocolNotification notification, const std::vector<MemberPtr>& to,
+            Surroundings& env) const;
+
+  std::string name_;
+  std::shared_ptr<const GroupAttributes> attributes_;  // null until the first join starts
+  std::vector<MemberPtr> members_;                     // in join order
+  SharedMembership member_ids_;                        // theirs
+  SharedBytes state_value_;
+  std::uint64_t seqnum_ = 0;  // of the last event
+  std::optional<Run> run_;
+  std::deque<MemberPtr> failures_;  // gone; those that are no members when their turn comes are passed over
+  std::deque<Queued> queue_;        // joins and leaves
+};
+
+}  // namespace gs

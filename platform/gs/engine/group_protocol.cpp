@@ -1,0 +1,299 @@
+// How a protocol runs: phases, votes, outcome, and what is said about it.
+#include <algorithm>
+
+#include "engine/group.h"
+
+namespace gs {
+namespace {
+
+std::uint32_t summary_of(wyx_vote_value_t vote, bool by_default) {
+  if (vote == WYX_VOTE_APPROVE) return by_default ? WYX_DEFAULT_APPROVE : WYX_EXPLICIT_APPROVE;
+  if (vote == WYX_VOTE_REJECT) return by_default ? WYX_DEFAULT_REJECT : WYX_EXPLICIT_REJECT;
+  return 0;
+}
+
+bool is_default(const Ballot& ballot) { return ballot.summary & (WYX_DEFAULT_APPROVE | WYX_DEFAULT_REJECT); }
+
+std::vector<MemberPtr> joined(const std::vector<MemberPtr>& a, const std::vector<MemberPtr>& b) {
+  std::vector<MemberPtr> all = a;
+  all.insert(all.end(), b.begin(), b.end());
+  return all;
+}
+
+}  // namespace
+
+// ------------------------------------------------------------------------------------------------------ phases
+
+void Group::start(Run run, Surroundings& env) {
+  if (!run.changing.empty()) {
+    Membership ids;
+    ids.reserve(run.changing.size());
+    for (const MemberPtr& m : run.changing) ids.push_back(m->id);
+    run.changing_ids = std::make_shared<const Membership>(std::move(ids));
+  }
+  run.number = ++env.last_protocol;
+  run.collect = attributes_->batch_control & WYX_COLLECT_ALL_RESULT;
+  run_ = std::move(run);
+  for (const MemberPtr& m : members_) m->ballot = {};
+  if (run_->terms.num_phases == WYX_1_PHASE) return approve(WYX_EXPLICIT_APPROVE, env);
+  open_phase(env);
+}
+
+/// With nobody to ask, nothing is sent and the protocol is approved.
+void Group::open_phase(Surroundings& env) {
+  Run& run = *run_;
+  ProtocolNotification note = compose(run, WYX_N_PHASE_NOTIFICATION, run.defaults);
+  note.time_limit = run.terms.time_limit;
+
+  run.voters.clear();
+  const bool changing_vote = run.traits->changing_role == ChangingRole::kVote;
+  auto changes = [&](const MemberPtr& m) {
+    return std::find(run.changing.begin(), run.changing.end(), m) != run.changing.end();
+  };
+  for (const MemberPtr& m : members_)
+    if (!m->gone() && (run.changing.empty() || changing_vote || !changes(m))) run.voters.push_back(m);
+  for (const MemberPtr& m : run.changing)
+    if (changing_vote && !m->gone()) run.voters.push_back(m);
+  run.missing = run.voters.size();
+  if (run.voters.empty()) {
+    if (run.phase > 1) --run.phase;
+    return;
+  }
+  for (const MemberPtr& m : run.voters) {
+    const wyx_vote_value_t default_vote = m->ballot.default_vote;
+    m->ballot = {};
+    m->ballot.open = true;
+    m->ballot.default_vote = default_vote;
+  }
+  if (run.voted_message && run.traits->message_is_proposal) run.message = run.voted_message;
+  run.voted_message = nullptr;
+  note.seqnum = ++seqnum_;
+  send(run, std::move(note), run.voters, env);
+  if (run.terms.time_limit != 0) env.timers.push_back({{name_, run.number, run.phase}, run.terms.time_limit});
+}
+
+void Group::vote(Member& voter, const VoteRequest& request) {
+  Ballot& ballot = voter.ballot;
+  ballot.open = false;
+  ballot.vote = request.vote;
+  ballot.summary = summary_of(request.vote, false);
+  if (request.default_vote != WYX_NULL_VOTE) ballot.default_vote = request.default_vote;
+  if (request.proposed_state) run_->proposed_state = std::make_shared<const Bytes>(*request.proposed_state);
+  if (request.message) run_->voted_message = std::make_shared<const Bytes>(*request.message);
+  if (run_->collect & WYX_COLLECT_STATEVALUE_RESULT) ballot.proposed_state = request.proposed_state;
+  if (run_->collect & WYX_COLLECT_MSG_RESULT) ballot.message = request.message;
+  --run_->missing;
+}
+
+void Group::cast_default(Member& voter, std::uint32_t cause) {
+  Ballot& ballot = voter.ballot;
+  wyx_vote_value_t vote = ballot.default_vote;
+  if (vote == WYX_NULL_VOTE) vote = attributes_->default_vote;
+  if (vote == WYX_NULL_VOTE) vote = WYX_VOTE_APPROVE;
+  ballot.open = false;
+  ballot.vote = vote;
+  ballot.summary = summary_of(vote, true) | cause;
+  run_->defaults |= ballot.summary;
+  --run_->missing;
+}
+
+void Group::expire(const TimerId& timer) {
+  if (!run_ || run_->number != timer.protocol || run_->phase != timer.phase) return;
+  for (const MemberPtr& m : run_->voters)
+    if (m->ballot.open) cast_default(*m, WYX_TIME_LIMIT_EXCEEDED);
+}
+
+void Group::end_phase(Surroundings& env) {
+  Run& run = *run_;
+  bool any_continue = false;
+  std::uint32_t rejects = 0;
+  for (const MemberPtr& m : run.voters) {
+    any_continue |= m->ballot.vote == WYX_VOTE_CONTINUE;
+    if (m->ballot.vote == WYX_VOTE_REJECT) rejects |= m->ballot.summary;
+  }
+  switch (phase_end(rejects != 0, any_continue, run.traits->preventable)) {
+    case PhaseEnd::kNextPhase:
+      ++run.phase;
+      return open_phase(env);
+    case PhaseEnd::kReject:
+      return reject(rejects, env);
+    case PhaseEnd::kApproveRejected:
+      run.proposed_state = nullptr;
+      return approve(rejects, env);
+    case PhaseEnd::kApprove:
+      return approve(run.defaults != 0 ? run.defaults : std::uint32_t{WYX_EXPLICIT_APPROVE}, env);
+  }
+}
+
+// ----------------------------------------------------------------------------------------------------- outcome
+
+void Group::approve(std::uint32_t summary, Surroundings& env) {
+  Run run = std::move(*run_);
+  run_.reset();
+  const bool was_born = born();
+  const std::vector<MemberPtr> audience =
+      run.traits->changing_role == ChangingRole::kVote ? joined(members_, run.changing) : members_;
+
+  change_membership(run);
+  if (run.proposed_state) state_value_ = run.proposed_state;
+  if (run.new_attributes) attributes_ = run.new_attributes;
+  ProtocolNotification note = compose(run, WYX_APPROVED_NOTIFICATION, summary);
+  note.seqnum = ++seqnum_;
+  send(run, std::move(note), audience, env);
+
+  for (const MemberPtr& m : audience) m->ballot = {};
+  if (run.traits->changing_role == ChangingRole::kHearEnd) dismiss(run, env);
+  tell_subscribers(run, was_born, env);
+  if (!born()) forget_values();
+}
+
+void Group::reject(std::uint32_t summary, Surroundings& env) {
+  Run run = std::move(*run_);
+  run_.reset();
+  const bool joins = run.traits->changing_role == ChangingRole::kVote;
+  const std::vector<MemberPtr> audience = joins ? joined(members_, run.changing) : members_;
+  ProtocolNotification note = compose(run, WYX_REJECTED_NOTIFICATION, summary);
+  note.seqnum = ++seqnum_;
+  send(run, std::move(note), audience, env);
+
+  for (const MemberPtr& m : audience) m->ballot = {};
+  if (joins) {
+    for (const MemberPtr& m : run.changing) {
+      m->stage = Member::Stage::kOut;
+      if (!m->gone()) env.clients.erase(m->to);
+    }
+  }
+  if (!born()) forget_values();
+}
+
+void Group::change_membership(const Run& run) {
+  if (run.changing.empty()) return;
+  const bool joins = run.traits->changing_role == ChangingRole::kVote;
+  for (const MemberPtr& m : run.changing) m->stage = joins ? Member::Stage::kJoined : Member::Stage::kOut;
+  if (joins)
+    members_.insert(members_.end(), run.changing.begin(), run.changing.end());
+  else
+    std::erase_if(members_, [](const MemberPtr& m) { return m->stage == Member::Stage::kOut; });
+  Membership ids;
+  ids.reserve(members_.size());
+  for (const MemberPtr& m : members_) ids.push_back(m->id);
+  member_ids_ = std::make_shared<const Membership>(std::move(ids));
+}
+
+/// The last words to those who have been taken out. A leave that an expelled member had waiting can no longer run.
+void Group::dismiss(const Run& run, Surroundings& env) {
+  std::shared_ptr<const Notification> dissolved;
+  for (const MemberPtr& m : run.changing) {
+    auto waiting = std::find_if(queue_.begin(), queue_.end(), [&](const Queued& q) { return q.who == m; });
+    if (waiting != queue_.end()) {
+      env.deliveries.push_back(
+          delayed_error(m->to, std::get<LeaveRequest>(waiting->request), WYX_NOT_A_MEMBER, nullptr));
+      queue_.erase(waiting);
+    }
+    if (m->gone()) continue;
+    env.clients.erase(m->to);
+    if (run.traits->type != WYX_EXPEL) continue;
+    if (!dissolved)
+      dissolved = std::make_shared<const Notification>(AnnouncementNotification{WYX_GROUP_DISSOLVED, nullptr});
+    env.deliveries.push_back({m->to, dissolved});
+  }
+}
+
+void Group::tell_subscribers(const Run& run, bool was_born, Surroundings& env) {
+  GroupView now = view();
+  now.state_changed = run.proposed_state != nullptr;
+  if (run.traits->changing_role == ChangingRole::kVote) now.joined = run.changing_ids;
+  if (run.traits->changing_role == ChangingRole::kHearEnd) {
+    now.left = run.changing_ids;
+    now.leave_codes = run.leave_codes;
+  }
+  if (!was_born) return env.subscribers.born(name_, now, env.deliveries);
+  if (born()) return env.subscribers.changed(name_, now, env.deliveries);
+  for (const Endpoint& over : env.subscribers.ended(name_, now, env.deliveries)) env.clients.erase(over);
+}
+
+// ------------------------------------------------------------------------------------------------ what is said
+
+ProtocolNotification Group::compose(const Run& run, wyx_notification_type_t type, std::uint32_t summary) const {
+  const bool approved = type == WYX_APPROVED_NOTIFICATION, rejected = type == WYX_REJECTED_NOTIFICATION;
+  auto bit = [&](std::uint32_t proposed, std::uint32_t ongoing, std::uint32_t updated, std::uint32_t refused) {
+    if (approved) return updated;
+    if (rejected) return refused;
+    return run.phase == 1 ? proposed : ongoing;
+  };
+  ProtocolNotification note;
+  note.type = type;
+  note.protocol = run.traits->type;
+  note.summary = summary;
+  Proposal& p = note.proposal;
+  p.num_phases = static_cast<std::uint16_t>(run.terms.num_phases);
+  p.phase = static_cast<std::uint16_t>(std::min<std::uint32_t>(run.phase, UINT16_MAX));
+  p.proposed_by = run.proposed_by;
+  p.whats_changed = WYX_CURRENT_STATE_VALUE;
+  p.current_providers = member_ids_;
+  p.current_state = state_value_;
+  if (run.changing_ids) {
+    p.whats_changed |=
+        bit(WYX_PROPOSED_MEMBERSHIP, WYX_ONGOING_MEMBERSHIP, WYX_UPDATED_MEMBERSHIP, WYX_REJECTED_MEMBERSHIP);
+    p.changing_providers = run.changing_ids;
+    p.leave_codes = run.leave_codes;
+  }
+  if (run.expel_info) {
+    p.whats_changed |= WYX_EXPEL_INFORMATION;
+    p.expel_info = run.expel_info;
+  }
+  // An approved value is the current one; a rejected one is gone.
+  if (run.proposed_state) {
+    p.whats_changed |= bit(WYX_PROPOSED_STATE_VALUE, WYX_ONGOING_STATE_VALUE, WYX_UPDATED_STATE_VALUE, 0);
+    if (!approved && !rejected) p.proposed_state = run.proposed_state;
+  }
+  if (run.new_attributes) {
+    p.whats_changed |= bit(WYX_PROPOSED_GROUP_ATTRIBUTES, WYX_ONGOING_GROUP_ATTRIBUTES,
+                           WYX_UPDATED_GROUP_ATTRIBUTES, WYX_REJECTED_GROUP_ATTRIBUTES);
+    p.new_attributes = run.new_attributes;
+  }
+  p.message = run.voted_message;
+  if (!p.message && !rejected) p.message = run.message;
+  if (p.message) p.whats_changed |= WYX_UPDATED_PROVIDER_MESSAGE;
+  add_vote_results(run, p);
+  return note;
+}
+
+/// Of the phase that has just ended, when the batch control asks for them.
+void Group::add_vote_results(const Run& run, Proposal& proposal) const {
+  if (run.collect == 0) return;
+  for (const MemberPtr& m : run.voters) {
+    VoteResult result;
+    result.voter = m->id;
+    if (run.collect & WYX_COLLECT_VOTE_RESULT) result.vote = m->ballot.vote;
+    result.summary = m->ballot.summary;
+    result.leave_code = is_default(m->ballot) ? m->gone_code : 0;
+    result.proposed_state = m->ballot.proposed_state;
+    result.message = m->ballot.message;
+    const bool changes = std::find(run.changing.begin(), run.changing.end(), m) != run.changing.end();
+    (changes ? proposal.changing_vote_results : proposal.current_vote_results).push_back(std::move(result));
+  }
+}
+
+/// One notification for all, but for those who read their own id as the proposer's.
+void Group::send(const Run& run, ProtocolNotification notification, const std::vector<MemberPtr>& to,
+                 Surroundings& env) const {
+  std::map<Endpoint, std::shared_ptr<const Notification>> own;
+  if (run.traits->each_proposes_itself) {
+    for (const MemberPtr& m : run.changing) {
+      if (m->gone() || m->id == run.proposed_by) continue;
+      ProtocolNotification copy = notification;
+      copy.proposal.proposed_by = m->id;
+      own[m->to] = std::make_shared<const Notification>(std::move(copy));
+    }
+  }
+  const auto shared = std::make_shared<const Notification>(std::move(notification));
+  env.deliveries.reserve(env.deliveries.size() + to.size());
+  for (const MemberPtr& m : to) {
+    if (m->gone()) continue;
+    auto it = own.find(m->to);
+    env.deliveries.push_back({m->to, it == own.end() ? shared : it->second});
+  }
+}
+
+}  // namespace gs
