@@ -8,6 +8,7 @@
 #include <pthread.h>
 #include <time.h>
 
+#include "gscl/GSString.h"
 #include "gscl/GSTypes.h"
 #include "gscl/export.h"
 #include "gscl/wyx_api.h"
@@ -91,6 +92,8 @@ ZN_GSCL_EXPORT timespec* GSGetAbsTime(timespec* abstime, int secs, int usecs);
 
 namespace zelt_gscl_V1 {
 
+class GSClient;
+
 ZN_GSCL_EXPORT const char* gscl_rc_name(wyx_rc_t rc);
 ZN_GSCL_EXPORT const char* gscl_notification_type_name(wyx_notification_type_t type);
 ZN_GSCL_EXPORT const char* gscl_request_type_name(wyx_request_t type);
@@ -110,6 +113,10 @@ ZN_GSCL_EXPORT int gscl_find_membership(const wyx_membership_t* mbrship, const w
 ZN_GSCL_EXPORT wyx_membership_t* gscl_clone_membership(const wyx_membership_t* mbrship);
 ZN_GSCL_EXPORT void gscl_delete_membership(wyx_membership_t* mbrship);
 ZN_GSCL_EXPORT timespec* GSGetAbsTime(timespec* abstime, int secs, int usecs);
+
+/// How trace lines name a client: "Prov[<group>,Id=<instance>/<node>,T=<token>]" or "Subs[G=<group>,T=<token>]", as
+/// it stands now. Allocates; build it only for a line that will be written.
+ZN_GSCL_EXPORT GSString getTraceIdStr(GSClient* client);
 
 }  // namespace zelt_gscl_V1
 

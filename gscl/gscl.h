@@ -2,11 +2,16 @@
 #ifndef GSCL_GSCL_H
 #define GSCL_GSCL_H
 
+#include "gscl/GSClient.h"
+#include "gscl/GSController.h"
 #include "gscl/GSDebug.h"
+#include "gscl/GSDispatcher.h"
 #include "gscl/GSLocalVar.h"
 #include "gscl/GSLockPrim.h"
 #include "gscl/GSObject.h"
+#include "gscl/GSProvider.h"
 #include "gscl/GSString.h"
+#include "gscl/GSSubscriber.h"
 #include "gscl/GSTypes.h"
 #include "gscl/GSUtils.h"
 #include "gscl/GSValues.h"

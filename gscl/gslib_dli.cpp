@@ -6,8 +6,8 @@
 #include <stdio.h>
 #include <unistd.h>
 
-#include "gscl/BaseApiCall.h"
-#include "gscl/Fatal.h"
+#include "gscl/base_api_internal.h"
+#include "gscl/fatal_internal.h"
 
 GSAPIRtnCollection_t* GSAPIRtns = nullptr;
 pthread_once_t GSAPIOnceInit = PTHREAD_ONCE_INIT;
