@@ -30,7 +30,8 @@ FILE* debugout = nullptr;         // null: standard error
 constinit std::atomic<const char*> dbg_trace_name{nullptr};
 constinit std::atomic<int> dbg_trace_indent{0};
 
-/// Where and when a line is written, as every line says it.
+/// Where and when a line is written, as every line says it. Taken under file_mutex: times do not run backwards in
+/// the file, and setting the time zone does not race with itself.
 struct LinePrefix {
   char time[16];
   char thread[16];
@@ -50,17 +51,17 @@ LinePrefix line_prefix() {
 FILE* stream() { return debugout != nullptr ? debugout : stderr; }
 
 void standard_trace(int, char* text) {
-  const LinePrefix prefix = line_prefix();
   const std::lock_guard<std::mutex> lock(file_mutex);
+  const LinePrefix prefix = line_prefix();
   fprintf(stream(), "%s TID=%s TRC_GSCL %s", prefix.time, prefix.thread, text);
   fflush(stream());
 }
 
 void standard_debug(int, char* text) {
-  const LinePrefix prefix = line_prefix();
   const char* name = dbg_trace_name.load(std::memory_order_relaxed);
   const int depth = std::clamp(dbg_trace_indent.load(std::memory_order_relaxed), 0, kMaxIndentation);
   const std::lock_guard<std::mutex> lock(file_mutex);
+  const LinePrefix prefix = line_prefix();
   if (name != nullptr)
     fprintf(stream(), "%s TID=%s %*s %s:%s", prefix.time, prefix.thread, depth, "", name, text);
   else
