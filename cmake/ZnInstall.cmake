@@ -16,6 +16,7 @@ endforeach()
 
 install(DIRECTORY gscl/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/gscl FILES_MATCHING PATTERN "*.h"
         PATTERN "*_internal.h" EXCLUDE)
+install(FILES dae/dae.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/dae)
 install(FILES platform/cu/zn_cu.h platform/kpl/kpl.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 
 # find_package(zn_gscl) gives zn_gscl::zn_gscl and zn_gscl::zn_cu.

@@ -3,5 +3,7 @@
 #define GSCL_EXPORT_H
 
 #define ZN_GSCL_EXPORT __attribute__((visibility("default")))
+// For a private member of an exported class.
+#define ZN_GSCL_HIDDEN __attribute__((visibility("hidden")))
 
 #endif

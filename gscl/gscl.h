@@ -15,6 +15,7 @@
 #include "gscl/GSTypes.h"
 #include "gscl/GSUtils.h"
 #include "gscl/GSValues.h"
+#include "gscl/KPLDriver.h"
 #include "gscl/gslib_dli.h"
 #include "gscl/wyx_api.h"
 

@@ -1,11 +1,11 @@
-// The KPL service controller's interface for the subsystems that it starts: records on the wire, and the calls with
-// which a subsystem answers requests and asks the master for its short status.
+// The KPL service controller's interface for the subsystems that it starts: records on the wire, and the calls
+// with which a subsystem answers requests and asks the master for its short status.
 //
 // How a request travels. The master (kplmstr) hands each subsystem one request channel: a datagram socket on
-// descriptor 0, or a System V message queue. A request is a `kplreq`: on the socket the bytes from `kplreq.kplhdr` on
-// (156 of them, then extra data), on the queue the type word first. Whoever asks, the master itself or a command for
-// which it forwards, waits on a local datagram socket and names it in the header as the return address. The subsystem
-// answers straight to that address, with any number of interim packets and one last one.
+// descriptor 0, or a System V message queue. A request is a `kplreq`: on the socket the bytes from `kplreq.kplhdr`
+// on (156 of them, then extra data), on the queue the type word first. Whoever asks, the master itself or a
+// command for which it forwards, waits on a local datagram socket and names it in the header as the return
+// address. The subsystem answers straight to that address, with any number of interim packets and one last one.
 //
 // The return address (`kplhdr.retaddr`) is a local-socket address that needs no length beside it:
 //   - `sun_family` is AF_UNIX; any other value means that no answer is wanted;
@@ -15,8 +15,8 @@
 //   - a NUL in the first two bytes: no address, no answer wanted.
 // `retaddr` is trusted as the request channel is: who may write into that channel is the master's business.
 //
-// Reply packets, each one datagram that begins with a `kplhdr`. Its `retaddr` and `dversion` are the request's, and
-// `cont` tells what follows:
+// Reply packets, each one datagram that begins with a `kplhdr`. Its `retaddr` and `dversion` are the request's,
+// and `cont` tells what follows:
 //   KPL_CONT_END     a `kplrep`, the last packet: `rtncode` is the result, `rtnmsg` its text. The datagram ends
 //                    behind the text's NUL, so it may be shorter than the record.
 //   KPL_CONT_MESSAGE a `kplrep` whose `rtnmsg` is text for the requester; more follows
@@ -37,8 +37,8 @@ extern "C" {
 /// The version word of records made by this release.
 #define KPL_VERSION 1
 
-/// Where the master listens: the path in this environment variable (a leading '@' stands for the NUL of an abstract
-/// name), which the master sets for every subsystem; without it, the default path.
+/// Where the master listens: the path in this environment variable (a leading '@' stands for the NUL of an
+/// abstract name), which the master sets for every subsystem; without it, the default path.
 #define KPL_MASTER_ENV "KPL_MASTER_SOCKET"
 #define KPL_MASTER_DEFAULT "/run/kplmstr/control"
 
@@ -48,11 +48,11 @@ enum {
 
 /// `subreq.action`
 enum {
-  KPL_ACTION_STOP = 1,       ///< `parm1`: 0 normal, 1 forced
-  KPL_ACTION_STATUS = 2,     ///< `parm1`: 0 short (answered by the master), 1 long
-  KPL_ACTION_TRACE = 4,      ///< `parm2`: 1 on, 0 off; `parm1`: 1 long trace
-  KPL_ACTION_REFRESH = 5,    ///< reads the configuration again
-  KPL_ACTION_SUBSYSTEM = 256 ///< this and above: the subsystem's own requests, with extra data
+  KPL_ACTION_STOP = 1,        ///< `parm1`: 0 normal, 1 forced
+  KPL_ACTION_STATUS = 2,      ///< `parm1`: 0 short (answered by the master), 1 long
+  KPL_ACTION_TRACE = 4,       ///< `parm2`: 1 on, 0 off; `parm1`: 1 long trace
+  KPL_ACTION_REFRESH = 5,     ///< reads the configuration again
+  KPL_ACTION_SUBSYSTEM = 256  ///< this and above: the subsystem's own requests, with extra data
 };
 
 /// `svrreply.rtncode`
@@ -142,14 +142,14 @@ KPL_CHECK(offsetof(struct statrep, statcode) == 118);
 
 #define KPL_EXPORT __attribute__((visibility("default")))
 
-/// Starts the answer to a request. `request_header` points at the 118 header bytes of the request just received, at
-/// any alignment. Returns the header to quote in every reply: the library's copy, good until this thread's next call
-/// of kplrrqs. A reply that the thread never ended is given up.
+/// Starts the answer to a request. `request_header` points at the 118 header bytes of the request just received,
+/// at any alignment. Returns the header to quote in every reply: the library's copy, good until this thread's next
+/// call of kplrrqs. A reply that the thread never ended is given up.
 KPL_EXPORT struct kplhdr* kplrrqs(char* request_header);
 
-/// Sends one packet of the answer that `header` (a result of kplrrqs) names: `reply_len` bytes at `reply`, beginning
-/// with a `kplhdr` that the caller need not fill and that stays as it is; the library sends its own in its place.
-/// `cont` says what the packet is and goes into the header; KPL_CONT_END ends the answer.
+/// Sends one packet of the answer that `header` (a result of kplrrqs) names: `reply_len` bytes at `reply`,
+/// beginning with a `kplhdr` that the caller need not fill and that stays as it is; the library sends its own in
+/// its place. `cont` says what the packet is and goes into the header; KPL_CONT_END ends the answer.
 ///
 /// The socket used is opened with the first packet and closed with the last: between requests the library holds no
 /// descriptor. Packets arrive in order and none is dropped while the requester reads: the call waits while its
@@ -161,20 +161,22 @@ KPL_EXPORT struct kplhdr* kplrrqs(char* request_header);
 KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int cont);
 
 /// Asks the master for short status: a heading line, then a line for each subsystem that matches, whose margin
-/// column begins with the subsystem's name. `host` names the master's host; null and "" mean this one, the only one
-/// served. `subsystem` names a subsystem; when null or "", the one whose process is `pid`.
+/// column begins with the subsystem's name. `host` names the master's host; null and "" mean this one, the only
+/// one served. `subsystem` names a subsystem; when null or "", the one whose process is `pid`.
 ///
-/// A query is a run of calls: `*cont` is KPL_CONT_FIRST at its first, and each call fills `reply` (a `statrep` of at
-/// most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and sets
+/// A query is a run of calls: `*cont` is KPL_CONT_FIRST at its first, and each call fills `reply` (a `statrep` of
+/// at most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and
+/// sets
 /// `*cont` to KPL_CONT_END with the last records, to KPL_CONT_STATUS before. The first call asks and waits for the
 /// whole answer, at most 5 seconds; the others only hand out what came, and free it with the last.
 ///
-/// On the wire it is a request to the master's socket with KPL_ACTION_STATUS, `parm1` 0, `objname` the subsystem (at
-/// most 29 characters) and, as extra data, `pid` as a 32-bit integer; the answer is status packets and a last one.
+/// On the wire it is a request to the master's socket with KPL_ACTION_STATUS, `parm1` 0, `objname` the subsystem
+/// (at most 29 characters) and, as extra data, `pid` as a 32-bit integer; the answer is status packets and a last
+/// one.
 ///
-/// Returns 0; -1 with `errno` when the master could not be asked (EINVAL for the arguments, ETIMEDOUT, EBADMSG for an
-/// answer that makes no sense, or the socket's error); otherwise the result code of the master's answer. After a
-/// failure the query is over.
+/// Returns 0; -1 with `errno` when the master could not be asked (EINVAL for the arguments, ETIMEDOUT, EBADMSG for
+/// an answer that makes no sense, or the socket's error); otherwise the result code of the master's answer. After
+/// a failure the query is over.
 KPL_EXPORT int kplstat(char* host, char* subsystem, pid_t pid, short* reply_len, char* reply, int* cont);
 
 #undef KPL_EXPORT
