@@ -1,0 +1,292 @@
+#include "gs/engine_text.h"
+
+namespace gs::test {
+namespace {
+
+struct Name {
+  std::uint32_t bit;
+  const char* name;
+};
+
+std::string flags(std::uint32_t value, std::initializer_list<Name> names) {
+  std::string all;
+  for (const Name& n : names)
+    if (value & n.bit) all += (all.empty() ? "" : "|") + std::string(n.name);
+  return all.empty() ? "none" : all;
+}
+
+std::string protocol_name(wyx_request_t type) {
+  switch (type) {
+    case WYX_JOIN:
+      return "join";
+    case WYX_FAILURE_LEAVE:
+      return "failure";
+    case WYX_LEAVE:
+      return "leave";
+    case WYX_EXPEL:
+      return "expel";
+    case WYX_STATE_VALUE_CHANGE:
+      return "state";
+    case WYX_PROVIDER_MESSAGE:
+      return "message";
+    case WYX_GROUP_ATTRIBUTE_CHANGE:
+      return "attributes";
+    case WYX_SUBSCRIPTION:
+      return "subscription";
+    default:
+      return "request " + std::to_string(type);
+  }
+}
+
+std::string summary_text(std::uint32_t summary) {
+  return flags(summary, {{WYX_EXPLICIT_APPROVE, "approve"},
+                         {WYX_EXPLICIT_REJECT, "reject"},
+                         {WYX_DEFAULT_APPROVE, "default-approve"},
+                         {WYX_DEFAULT_REJECT, "default-reject"},
+                         {WYX_TIME_LIMIT_EXCEEDED, "time"},
+                         {WYX_PROVIDER_FAILED, "failed"},
+                         {WYX_RESPONSIVENESS_NO_RESPONSE, "no-response"},
+                         {WYX_RESPONSIVENESS_RESPONSE, "response"},
+                         {WYX_GROUP_DISSOLVED, "dissolved"}});
+}
+
+std::string changes_text(std::uint32_t bits) {
+  return flags(bits, {{WYX_PROPOSED_MEMBERSHIP, "proposed-members"},
+                      {WYX_ONGOING_MEMBERSHIP, "ongoing-members"},
+                      {WYX_UPDATED_MEMBERSHIP, "updated-members"},
+                      {WYX_REJECTED_MEMBERSHIP, "rejected-members"},
+                      {WYX_PROPOSED_STATE_VALUE, "proposed-state"},
+                      {WYX_ONGOING_STATE_VALUE, "ongoing-state"},
+                      {WYX_UPDATED_STATE_VALUE, "updated-state"},
+                      {WYX_PROPOSED_GROUP_ATTRIBUTES, "proposed-attributes"},
+                      {WYX_ONGOING_GROUP_ATTRIBUTES, "ongoing-attributes"},
+                      {WYX_UPDATED_GROUP_ATTRIBUTES, "updated-attributes"},
+                      {WYX_REJECTED_GROUP_ATTRIBUTES, "rejected-attributes"},
+                      {WYX_UPDATED_PROVIDER_MESSAGE, "message"},
+                      {WYX_EXPEL_INFORMATION, "expel"}});
+}
+
+std::string leave_codes_text(const std::vector<LeaveCode>& codes) {
+  std::string all;
+  for (const LeaveCode& code : codes) {
+    all += (all.empty() ? "" : " ") + flags(code.voluntary_or_failure, {{WYX_VOLUNTARY_LEAVE, "voluntary"},
+                                                                        {WYX_PROVIDER_FAILURE, "died"},
+                                                                        {WYX_HOST_FAILURE, "host"},
+                                                                        {WYX_PROVIDER_EXPELLED, "expelled"},
+                                                                        {WYX_PROVIDER_SAID_GOODBYE, "goodbye"}});
+    if (code.voluntary_code != 0) all += "=" + std::to_string(code.voluntary_code);
+  }
+  return "(" + all + ")";
+}
+
+std::string vote_results_text(const char* title, const std::vector<VoteResult>& results) {
+  if (results.empty()) return "";
+  static const char* const kVotes[] = {"?", "yes", "continue", "no"};
+  std::string all = std::string(", ") + title + "[";
+  for (const VoteResult& r : results) {
+    all += (&r == &results.front() ? "" : "; ") + text(r.voter) + " " + kVotes[r.vote] + " " +
+           summary_text(r.summary);
+    if (r.leave_code != 0) all += " " + leave_codes_text({{r.leave_code, 0}});
+    if (r.proposed_state) all += " '" + *r.proposed_state + "'";
+    if (r.message) all += " msg '" + *r.message + "'";
+  }
+  return all + "]";
+}
+
+std::string body(const ProtocolNotification& n) {
+  const Proposal& p = n.proposal;
+  std::string all;
+  if (n.type == WYX_N_PHASE_NOTIFICATION) all = "phase " + std::to_string(p.phase);
+  if (n.type == WYX_APPROVED_NOTIFICATION) all = "approved";
+  if (n.type == WYX_REJECTED_NOTIFICATION) all = "rejected";
+  all += " " + protocol_name(n.protocol) + " by " + text(p.proposed_by);
+  if (n.summary != 0) all += " <" + summary_text(n.summary) + ">";
+  const std::uint32_t changes = p.whats_changed & ~std::uint32_t{WYX_CURRENT_STATE_VALUE};
+  if (changes != 0) all += " {" + changes_text(changes) + "}";
+  all += ", members " + text(p.current_providers);
+  if (p.changing_providers) all += ", changing " + text(p.changing_providers);
+  if (!p.leave_codes.empty()) all += leave_codes_text(p.leave_codes);
+  if (p.expel_info)
+    all += ", deactivate " + std::to_string(p.expel_info->deactivate_phase) + " '" + p.expel_info->flag + "'";
+  if (p.current_state && !p.current_state->empty()) all += ", state '" + *p.current_state + "'";
+  if (p.proposed_state) all += ", proposed '" + *p.proposed_state + "'";
+  if (p.message) all += ", msg '" + *p.message + "'";
+  if (p.new_attributes) all += ", version " + std::to_string(p.new_attributes->client_version);
+  all += vote_results_text("votes", p.current_vote_results);
+  all += vote_results_text("changing votes", p.changing_vote_results);
+  if (n.time_limit != 0) all += ", limit " + std::to_string(n.time_limit);
+  return all + ", #" + std::to_string(n.seqnum);
+}
+
+std::string body(const AnnouncementNotification& n) {
+  return "announcement <" + summary_text(n.summary) + ">" + (n.providers ? " " + text(n.providers) : "");
+}
+
+std::string body(const SubscriptionNotification& n) {
+  std::string all = "subscription {" +
+                    flags(n.type, {{WYX_SUBSCRIPTION_STATE, "state"},
+                                   {WYX_SUBSCRIPTION_DELTA_JOIN, "join"},
+                                   {WYX_SUBSCRIPTION_DELTA_LEAVE, "leave"},
+                                   {WYX_SUBSCRIPTION_MEMBERSHIP, "members"},
+                                   {WYX_SUBSCRIPTION_DISSOLVED, "dissolved"},
+                                   {WYX_SUBSCRIPTION_PERSISTENT, "persistent"}}) +
+                    "}";
+  if (n.full_membership) all += ", members " + text(n.full_membership);
+  if (n.changing_membership) all += ", changing " + text(n.changing_membership);
+  if (!n.leave_codes.empty()) all += leave_codes_text(n.leave_codes);
+  if (n.state) all += ", state '" + *n.state + "'";
+  return all + ", #" + std::to_string(n.seqnum);
+}
+
+std::string body(const DelayedErrorNotification& n) {
+  std::string all = "error " + std::to_string(n.rc) + " for " + protocol_name(n.protocol);
+  return n.group_attributes ? all + ", group has version " + std::to_string(n.group_attributes->client_version)
+                            : all;
+}
+
+template <typename T>
+void add_optional(Digest& d, const std::optional<T>& value) {
+  d.add(value.has_value());
+  if (value) d.add(*value);
+}
+
+void add(Digest& d, const SharedMembership& ids) {
+  d.add(ids != nullptr);
+  if (!ids) return;
+  d.add(ids->size());
+  for (ProviderId id : *ids) d.add(id);
+}
+
+void add(Digest& d, const std::vector<LeaveCode>& codes) {
+  d.add(codes.size());
+  for (const LeaveCode& code : codes) {
+    d.add(code.voluntary_or_failure);
+    d.add(code.voluntary_code);
+  }
+}
+
+void add(Digest& d, const std::vector<VoteResult>& results) {
+  d.add(results.size());
+  for (const VoteResult& r : results) {
+    d.add(r.voter);
+    d.add(r.vote);
+    d.add(r.summary);
+    d.add(r.leave_code);
+    add_optional(d, r.proposed_state);
+    add_optional(d, r.message);
+  }
+}
+
+void add(Digest& d, const ProtocolNotification& n) {
+  const Proposal& p = n.proposal;
+  d.add(n.type);
+  d.add(n.protocol);
+  d.add(n.summary);
+  d.add(n.time_limit);
+  d.add(n.seqnum);
+  d.add(p.num_phases);
+  d.add(p.phase);
+  d.add(p.whats_changed);
+  d.add(p.proposed_by);
+  add(d, p.current_providers);
+  add(d, p.changing_providers);
+  add(d, p.leave_codes);
+  d.add(p.expel_info.has_value());
+  if (p.expel_info) {
+    d.add(p.expel_info->deactivate_phase);
+    d.add(p.expel_info->flag);
+  }
+  d.add(p.current_state);
+  d.add(p.proposed_state);
+  d.add(p.message);
+  d.add(p.new_attributes != nullptr);
+  if (p.new_attributes) d.add(*p.new_attributes);
+  add(d, p.current_vote_results);
+  add(d, p.changing_vote_results);
+}
+
+void add(Digest& d, const AnnouncementNotification& n) {
+  d.add(n.summary);
+  add(d, n.providers);
+}
+
+void add(Digest& d, const SubscriptionNotification& n) {
+  d.add(n.type);
+  d.add(n.seqnum);
+  d.add(n.state);
+  add(d, n.full_membership);
+  add(d, n.changing_membership);
+  add(d, n.leave_codes);
+}
+
+void add(Digest& d, const DelayedErrorNotification& n) {
+  d.add(n.protocol);
+  d.add(n.rc);
+  d.add(n.failing_request.index());
+  d.add(n.group_attributes != nullptr);
+  if (n.group_attributes) d.add(*n.group_attributes);
+}
+
+}  // namespace
+
+std::string text(ProviderId id) {
+  return std::to_string(id.instance) + (id.node == 1 ? "" : "@" + std::to_string(id.node));
+}
+
+std::string text(const SharedMembership& ids) {
+  if (!ids || ids->empty()) return "-";
+  std::string all;
+  for (ProviderId id : *ids) all += (all.empty() ? "" : " ") + text(id);
+  return all;
+}
+
+std::string text(const Notification& notification) {
+  return std::visit([](const auto& n) { return body(n); }, notification);
+}
+
+std::string name_of(const Endpoint& endpoint) {
+  const std::string number = std::to_string(endpoint.session.number);
+  return endpoint.token >= kSubscriberToken ? "s" + number : number;
+}
+
+std::string text(const std::vector<Delivery>& deliveries) {
+  std::string all, names, line;
+  auto flush = [&] {
+    if (!names.empty()) all += names + ": " + line + "\n";
+  };
+  for (const Delivery& d : deliveries) {
+    const std::string next = text(*d.what);
+    if (next == line && !names.empty()) {
+      names += " " + name_of(d.to);
+      continue;
+    }
+    flush();
+    names = name_of(d.to);
+    line = next;
+  }
+  flush();
+  return all;
+}
+
+std::uint64_t digest(const Outcome& outcome) {
+  Digest d;
+  d.add(outcome.rc);
+  const Notification* last = nullptr;
+  for (const Delivery& delivery : outcome.deliveries) {
+    d.add(delivery.to);
+    d.add(delivery.what.get() == last);
+    if (delivery.what.get() == last) continue;
+    last = delivery.what.get();
+    d.add(last->index());
+    std::visit([&](const auto& n) { add(d, n); }, *last);
+  }
+  for (const TimerRequest& timer : outcome.timers) {
+    d.add(timer.id.group);
+    d.add(timer.id.protocol);
+    d.add(timer.id.phase);
+    d.add(timer.seconds);
+  }
+  return d.value();
+}
+
+}  // namespace gs::test

@@ -1,0 +1,246 @@
+// Phases, votes, defaults, time limits, and what protocols change when they are approved.
+#include "gs/engine_script.h"
+
+namespace gs::test {
+namespace {
+
+class EngineVoting : public Script {};
+
+TEST_F(EngineVoting, One_phase_protocols_are_one_event_for_all_members) {
+  group_of({1, 2});
+  change_state(2, "x");
+  send(1, "hello");
+  GroupAttributes changed = attributes;
+  changed.client_version = 3;
+  change_attributes(1, changed);
+  EXPECT_EQ(
+      seen(),
+      "1 2: approved state by 2 <approve> {updated-state}, members 1 2, state 'x', #3\n"
+      "1 2: approved message by 1 <approve> {message}, members 1 2, state 'x', msg 'hello', #4\n"
+      "1 2: approved attributes by 1 <approve> {updated-attributes}, members 1 2, state 'x', version 3, #5\n");
+}
+
+TEST_F(EngineVoting, State_change_goes_through_phases_until_nobody_says_continue) {
+  group_of({1, 2});
+  change_state(1, "x", {WYX_N_PHASE, 7});
+  vote_all({1}, WYX_VOTE_CONTINUE);
+  vote_all({2}, WYX_VOTE_APPROVE);
+  vote_all({2, 1}, WYX_VOTE_APPROVE);
+  EXPECT_EQ(seen(),
+            "1 2: phase 1 state by 1 {proposed-state}, members 1 2, proposed 'x', limit 7, #3\n"
+            "1 2: phase 2 state by 1 {ongoing-state}, members 1 2, proposed 'x', limit 7, #4\n"
+            "1 2: approved state by 1 <approve> {updated-state}, members 1 2, state 'x', #5\n");
+}
+
+TEST_F(EngineVoting, Reject_wins_over_continue_once_all_have_voted_and_nothing_changes) {
+  group_of({1, 2, 3});
+  change_state(1, "x", kPhases);
+  seen();
+  vote_all({1}, WYX_VOTE_REJECT);
+  vote_all({2}, WYX_VOTE_CONTINUE);
+  EXPECT_EQ(seen(), "");
+  vote_all({3}, WYX_VOTE_APPROVE);
+  EXPECT_EQ(seen(), "1 2 3: rejected state by 1 <reject>, members 1 2 3, #5\n");
+  GroupAttributes changed = attributes;
+  changed.client_version = 3;
+  change_attributes(1, changed, kPhases);
+  vote_all({1, 2, 3}, WYX_VOTE_REJECT);
+  EXPECT_EQ(seen(),
+            "1 2 3: phase 1 attributes by 1 {proposed-attributes}, members 1 2 3, version 3, #6\n"
+            "1 2 3: rejected attributes by 1 <reject> {rejected-attributes}, members 1 2 3, version 3, #7\n");
+  EXPECT_EQ(join(4), WYX_OK) << "the old attributes still hold";
+}
+
+TEST_F(EngineVoting, Vote_out_of_turn_is_not_expected) {
+  group_of({1, 2});
+  EXPECT_EQ(vote(1, WYX_VOTE_APPROVE), WYX_VOTE_NOT_EXPECTED);
+  leave(2, 0, kPhases);
+  EXPECT_EQ(vote(2, WYX_VOTE_APPROVE), WYX_VOTE_NOT_EXPECTED) << "a leaver has no vote";
+  EXPECT_EQ(vote(1, WYX_NULL_VOTE), WYX_VOTE_VALUE_NOT_ALLOWED);
+  EXPECT_EQ(vote(1, WYX_VOTE_APPROVE_AND_SWITCH_ALPHA_OMEGA), WYX_VOTE_VALUE_NOT_ALLOWED);
+  EXPECT_EQ(vote(1, WYX_VOTE_APPROVE, WYX_VOTE_CONTINUE), WYX_VOTE_VALUE_NOT_ALLOWED);
+  EXPECT_EQ(vote_with(1, WYX_VOTE_APPROVE, Bytes(kMaxStateValue + 1, 'x'), std::nullopt), WYX_BAD_PARAMETER);
+  EXPECT_EQ(vote_with(1, WYX_VOTE_APPROVE, std::nullopt, Bytes(kMaxProviderMessage + 1, 'x')), WYX_BAD_PARAMETER);
+  EXPECT_EQ(vote(1, WYX_VOTE_APPROVE), WYX_OK);
+  EXPECT_EQ(vote(1, WYX_VOTE_APPROVE), WYX_VOTE_NOT_EXPECTED);
+}
+
+TEST_F(EngineVoting, Vote_with_state_and_message_the_last_ordered_wins_the_message_is_seen_once) {
+  group_of({1, 2});
+  join(3);
+  send(1, "first", kPhases);
+  vote_with(3, WYX_VOTE_CONTINUE, "s3", "m3");
+  vote_with(1, WYX_VOTE_CONTINUE, "s1", std::nullopt);
+  vote_with(2, WYX_VOTE_CONTINUE, std::nullopt, "m2");
+  vote_all({1, 2, 3}, WYX_VOTE_APPROVE);
+  change_state(1, "y", kPhases);
+  vote_with(1, WYX_VOTE_CONTINUE, "z", "why");
+  vote_all({2, 3}, WYX_VOTE_APPROVE);
+  vote_all({1, 2, 3}, WYX_VOTE_APPROVE);
+  EXPECT_EQ(
+      seen(),
+      "1 2 3: approved join by 3 <approve> {updated-members}, members 1 2 3, changing 3, #3\n"
+      "1 2 3: phase 1 message by 1 {message}, members 1 2 3, msg 'first', #4\n"
+      "1 2 3: phase 2 message by 1 {ongoing-state|message}, members 1 2 3, proposed 's1', msg 'm2', #5\n"
+      "1 2 3: approved message by 1 <approve> {updated-state|message}, members 1 2 3, state 's1', msg 'm2', #6\n"
+      "1 2 3: phase 1 state by 1 {proposed-state}, members 1 2 3, state 's1', proposed 'y', #7\n"
+      "1 2 3: phase 2 state by 1 {ongoing-state|message}, members 1 2 3, state 's1', proposed 'z', "
+      "msg 'why', #8\n"
+      "1 2 3: approved state by 1 <approve> {updated-state}, members 1 2 3, state 'z', #9\n");
+}
+
+TEST_F(EngineVoting, Rejection_carries_the_message_of_its_votes_and_never_the_one_rejected) {
+  group_of({1, 2});
+  send(1, "proposed", kPhases);
+  vote_all({1, 2}, WYX_VOTE_REJECT);
+  send(1, "proposed", kPhases);
+  vote_all({1}, WYX_VOTE_APPROVE);
+  seen();
+  vote_with(2, WYX_VOTE_REJECT, std::nullopt, "too early");
+  EXPECT_EQ(seen(), "1 2: rejected message by 1 <reject> {message}, members 1 2, msg 'too early', #6\n");
+}
+
+TEST_F(EngineVoting, Time_limit_counts_the_default_vote_of_the_silent) {
+  group_of({1, 2});
+  change_state(1, "x", {WYX_N_PHASE, 5});
+  vote_all({1}, WYX_VOTE_APPROVE);
+  seen();
+  ASSERT_EQ(timers.size(), 1u);
+  EXPECT_EQ(timers[0].seconds, 5);
+  expire(timers[0]);
+  EXPECT_EQ(outcomes(), "1 2: approved state by 1 <default-approve|time> {updated-state}\n");
+
+  attributes.default_vote = WYX_VOTE_REJECT;
+  change_attributes(1, attributes);
+  change_state(1, "y", {WYX_N_PHASE, 5});
+  vote_all({1}, WYX_VOTE_APPROVE);
+  seen();
+  expire(timers[1]);
+  EXPECT_EQ(outcomes(), "1 2: rejected state by 1 <default-reject|time>\n");
+}
+
+TEST_F(EngineVoting, Default_given_with_an_earlier_vote_holds_for_this_protocol_only) {
+  group_of({1, 2});
+  for (const char* const closing : {"1 2: rejected state by 1 <default-reject|time>\n",
+                                    "1 2: approved state by 1 <default-approve|time> {updated-state}\n"}) {
+    timers.clear();
+    change_state(1, "x", {WYX_N_PHASE, 5});
+    const bool first = closing[5] == 'r';
+    vote(2, WYX_VOTE_CONTINUE, first ? WYX_VOTE_REJECT : WYX_NULL_VOTE);
+    vote_all({1}, WYX_VOTE_CONTINUE);
+    vote_all({1}, WYX_VOTE_APPROVE);
+    seen();
+    expire(timers[1]);
+    EXPECT_EQ(outcomes(), closing);
+  }
+}
+
+TEST_F(EngineVoting, Expiry_of_a_phase_or_group_that_is_over_changes_nothing) {
+  group_of({1, 2});
+  change_state(1, "x", {WYX_N_PHASE, 5});
+  vote_all({1, 2}, WYX_VOTE_CONTINUE);
+  seen();
+  const std::uint64_t before = engine.digest();
+  expire(timers[0]);
+  EXPECT_EQ(engine.digest(), before);
+  vote_all({1, 2}, WYX_VOTE_APPROVE);
+  dies(1);
+  dies(2);
+  expire(timers[1]);
+  EXPECT_EQ(last.deliveries.size(), 0u);
+}
+
+TEST_F(EngineVoting, Voter_that_dies_in_any_phase_is_counted_by_default_and_asked_no_more) {
+  for (int phase = 1; phase <= 3; ++phase) {
+    attributes.group_name = "g" + std::to_string(phase);
+    const int a = 10 * phase;
+    group_of({a, a + 1, a + 2});
+    change_state(a, "x", kPhases);
+    for (int p = 1; p < 3; ++p) {
+      if (p == phase) dies(a + 2);
+      vote_all({a, a + 1}, WYX_VOTE_CONTINUE);
+      if (p < phase) vote_all({a + 2}, WYX_VOTE_CONTINUE);
+    }
+    if (phase == 3) dies(a + 2);
+    vote_all({a}, WYX_VOTE_APPROVE);
+    seen();
+    vote_all({a + 1}, WYX_VOTE_APPROVE);
+    const std::string all = std::to_string(a) + " " + std::to_string(a + 1), dead = std::to_string(a + 2);
+    EXPECT_EQ(outcomes(), all + ": approved state by " + std::to_string(a) +
+                              " <default-approve|failed> {updated-state}\n" + all + ": approved failure by " +
+                              dead + " <approve> {updated-members}\n");
+  }
+}
+
+TEST_F(EngineVoting, Vote_of_one_who_dies_after_voting_stands) {
+  group_of({1, 2});
+  change_state(1, "x", kPhases);
+  vote_all({2}, WYX_VOTE_REJECT);
+  dies(2);
+  seen();
+  vote_all({1}, WYX_VOTE_APPROVE);
+  EXPECT_EQ(outcomes(),
+            "1: rejected state by 1 <reject>\n"
+            "1: approved failure by 2 <approve> {updated-members}\n");
+}
+
+TEST_F(EngineVoting, Proposer_that_dies_does_not_stop_its_protocol) {
+  group_of({1, 2});
+  change_state(1, "x", kPhases);
+  dies(1);
+  seen();
+  vote_all({2}, WYX_VOTE_APPROVE);
+  EXPECT_EQ(seen(),
+            "2: approved state by 1 <default-approve|failed> {updated-state}, members 1 2, state 'x', #4\n"
+            "2: approved failure by 1 <approve> {updated-members}, members 2, changing 1(died), state 'x', #5\n");
+}
+
+TEST_F(EngineVoting, Last_voter_that_dies_after_continue_leaves_nobody_to_ask_and_it_is_approved) {
+  group_of({1, 2});
+  leave(2, 0, kPhases);
+  vote_all({1}, WYX_VOTE_CONTINUE);
+  seen();
+  dies(1);
+  EXPECT_EQ(outcomes(), "2: approved leave by 2 <default-approve|failed> {updated-members}\n");
+  EXPECT_TRUE(engine.status().empty());
+}
+
+TEST_F(EngineVoting, Results_are_collected_as_the_batch_control_says) {
+  attributes.batch_control = WYX_COLLECT_ALL_RESULT;
+  attributes.num_phases = WYX_N_PHASE;
+  attributes.time_limit = 5;
+  group_of({1, 2, 3});
+  join(4);
+  vote_with(4, WYX_VOTE_CONTINUE, "s", "m");
+  dies(3);
+  vote_all({1}, WYX_VOTE_APPROVE);
+  seen();
+  expire(timers[0]);
+  vote_all({1, 2}, WYX_VOTE_APPROVE);
+  vote_all({4}, WYX_VOTE_REJECT);
+  EXPECT_EQ(seen(),
+            "1 2 4: phase 2 join by 4 <default-approve|time|failed> {ongoing-members|ongoing-state|message}, "
+            "members 1 2 3, changing 4, proposed 's', msg 'm', "
+            "votes[1 yes approve; 2 yes default-approve|time; 3 yes default-approve|failed (died)], "
+            "changing votes[4 continue none 's' msg 'm'], limit 5, #6\n"
+            "1 2 4: rejected join by 4 <reject> {rejected-members}, members 1 2 3, changing 4, "
+            "votes[1 yes approve; 2 yes approve], changing votes[4 no reject], #7\n"
+            "1 2: phase 1 failure by 3 {proposed-members}, members 1 2 3, changing 3(died), limit 5, #8\n");
+
+  std::string all;
+  for (auto control : {WYX_COLLECT_VOTE_RESULT, WYX_COLLECT_MSG_RESULT, WYX_COLLECT_STATEVALUE_RESULT}) {
+    attributes.batch_control = control;
+    attributes.group_name = "g" + std::to_string(control);
+    const int a = 10 * control;
+    group_of({a});
+    send(a, "p", kPhases);
+    vote_with(a, WYX_VOTE_APPROVE, "s", "m");
+    all += seen();
+  }
+  EXPECT_NE(all.find("votes[80 yes approve], #"), std::string::npos) << all;
+  EXPECT_NE(all.find("votes[160 ? approve msg 'm'], #"), std::string::npos) << all;
+  EXPECT_NE(all.find("votes[320 ? approve 's'], #"), std::string::npos) << all;
+}
+
+}  // namespace
+}  // namespace gs::test
