@@ -6,16 +6,11 @@ include(CMakePackageConfigHelpers)
 install(TARGETS zn_gscl zn_cu kpl EXPORT zn_gscl
         LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
         INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
-foreach(target IN ITEMS wyx_r gsd)
-  if(TARGET ${target})
-    install(TARGETS ${target}
-            LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
-            RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
-  endif()
-endforeach()
+if(TARGET wyx_r)
+  install(TARGETS wyx_r LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+endif()
 
-install(DIRECTORY gscl/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/gscl FILES_MATCHING PATTERN "*.h"
-        PATTERN "*_internal.h" EXCLUDE)
+install(FILES ${ZN_PUBLIC_GSCL_HEADERS} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/gscl)
 install(FILES dae/dae.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/dae)
 install(FILES platform/cu/zn_cu.h platform/kpl/kpl.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 

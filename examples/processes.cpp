@@ -5,11 +5,8 @@
 #include <poll.h>
 #include <signal.h>
 #include <stdlib.h>
-#include <string.h>
 #include <sys/prctl.h>
 #include <sys/signalfd.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -30,16 +27,6 @@ int milliseconds_to(Clock::time_point deadline) {
 }
 
 void wait_a_little() { ::poll(nullptr, 0, 2); }
-
-bool accepts(const std::string& path) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
-  int s = ::socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
-  bool accepted = ::connect(s, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
-  ::close(s);
-  return accepted;
-}
 
 // The child's side of Process: never returns.
 [[noreturn]] void run(const std::vector<std::string>& command, const Process::Environment& environment, int in,
@@ -189,14 +176,13 @@ std::vector<bool> wait_readable(const std::vector<int>& descriptors, Clock::time
 
 PrivateDaemon::PrivateDaemon(const std::vector<std::string>& options) {
   socket_ = folder_.path() + "/gsd.sock";
-  std::vector<std::string> command{program("gsd"), "--socket", socket_};
+  std::vector<std::string> command{program("gsd"), "--socket-path", socket_, "--ready-fd", "1"};
   command.insert(command.end(), options.begin(), options.end());
   process_ = std::make_unique<Process>(command, Process::Environment{}, folder_.path() + "/gsd.log");
-  const auto deadline = Clock::now() + kStartLimit;
-  while (!accepts(socket_)) {
-    const bool ended = ::kill(process_->pid(), 0) != 0 || ::waitpid(process_->pid(), nullptr, WNOHANG | WNOWAIT) != 0;
-    if (ended || Clock::now() > deadline) throw Failure{"the daemon does not start: " + log()};
-    wait_a_little();
+  try {
+    process_->wait_line(Clock::now() + kStartLimit);
+  } catch (const Failure& failure) {
+    throw Failure{"the daemon does not start (" + failure.text + "): " + log()};
   }
 }
 
