@@ -138,7 +138,10 @@ void GSSetDebugLevel(int level) {
 
 const char* GSTraceDebugName() { return dbg_trace_name.load(std::memory_order_relaxed); }
 
+// A message that is off goes no further than one load: before the arguments are gathered, without a look at the
+// environment.
 void GSdebugf(int level, const char* format, ...) {
+  if (!zelt_gscl_trace::may_be_on(level)) return;
   va_list args;
   va_start(args, format);
   const EndOfArguments end{args};
@@ -146,6 +149,7 @@ void GSdebugf(int level, const char* format, ...) {
 }
 
 void GStracef(int level, const char* format, ...) {
+  if (!zelt_gscl_trace::may_be_on(level)) return;
   va_list args;
   va_start(args, format);
   const EndOfArguments end{args};
