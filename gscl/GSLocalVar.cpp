@@ -25,4 +25,18 @@ void GSLocalVar<char>::erase() {
   if (_data != nullptr) std::memset(_data, 0, _size);
 }
 
+unsigned int GSLocalVar<char>::size() const { return _size; }
+
+char* GSLocalVar<char>::data() { return _data; }
+
+const char* GSLocalVar<char>::data() const { return _data; }
+
+GSLocalVar<char>::operator char*() { return _data; }
+
+bool GSLocalVar<char>::operator!() const { return _data == nullptr; }
+
+char& GSLocalVar<char>::operator[](ptrdiff_t i) { return _data[i]; }
+
+const char& GSLocalVar<char>::operator[](ptrdiff_t i) const { return _data[i]; }
+
 }  // namespace zelt_gscl_V1

@@ -33,16 +33,16 @@ class ZN_GSCL_EXPORT GSLocalVar<char> {
   void erase();
 
   /// Bytes in the buffer, 0 when there is none.
-  unsigned int size() const { return _size; }
+  unsigned int size() const;
   /// The buffer, null when there is none.
-  char* data() { return _data; }
-  const char* data() const { return _data; }
-  operator char*() { return _data; }
+  char* data();
+  const char* data() const;
+  operator char*();
   /// True when there is no buffer.
-  bool operator!() const { return _data == nullptr; }
+  bool operator!() const;
   /// The byte at i, which is below size(); not checked.
-  char& operator[](ptrdiff_t i) { return _data[i]; }
-  const char& operator[](ptrdiff_t i) const { return _data[i]; }
+  char& operator[](ptrdiff_t i);
+  const char& operator[](ptrdiff_t i) const;
 
  private:
   char* _data;

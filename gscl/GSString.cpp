@@ -81,6 +81,12 @@ void GSString::set_string(const char* s, int len) {
   _area[length] = '\0';
 }
 
+GSString::operator char*() { return _area; }
+
+GSString::operator const char*() const { return _area; }
+
+int GSString::size() const { return _size; }
+
 int GSString::length() const { return _area == nullptr ? 0 : static_cast<int>(std::strlen(_area)); }
 
 void GSString::allocate(int n) {

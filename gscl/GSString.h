@@ -2,6 +2,8 @@
 #ifndef GSCL_GSSTRING_H
 #define GSCL_GSSTRING_H
 
+#include <type_traits>
+
 #include "gscl/export.h"
 
 namespace zelt_gscl_V1 {
@@ -40,10 +42,10 @@ class ZN_GSCL_EXPORT GSString {
   void set_string(const char* s, int len);
 
   /// The text, null when there is no storage. Whoever writes through it keeps a NUL within size() bytes.
-  operator char*() { return _area; }
-  operator const char*() const { return _area; }
+  operator char*();
+  operator const char*() const;
   /// Bytes allocated.
-  int size() const { return _size; }
+  int size() const;
   /// Characters up to the first NUL, 0 without storage.
   int length() const;
 
@@ -61,10 +63,19 @@ ZN_GSCL_EXPORT GSString operator+(const GSString& a, const char* s);
 /// Whether the texts are equal. A string without storage equals only a null pointer.
 ZN_GSCL_EXPORT bool operator==(const GSString& a, const char* s);
 
-// Without these, comparing two strings would be ambiguous and != would compare addresses.
+// Without these, comparing with a string or a char* would be ambiguous and != would compare addresses. The
+// template takes nothing but char*, so that a null pointer constant still means const char*.
 inline bool operator==(const GSString& a, const GSString& b) { return a == static_cast<const char*>(b); }
 inline bool operator!=(const GSString& a, const char* s) { return !(a == s); }
 inline bool operator!=(const GSString& a, const GSString& b) { return !(a == b); }
+template <class C>
+typename std::enable_if<std::is_same<C, char>::value, bool>::type operator==(const GSString& a, C* s) {
+  return a == static_cast<const char*>(s);
+}
+template <class C>
+typename std::enable_if<std::is_same<C, char>::value, bool>::type operator!=(const GSString& a, C* s) {
+  return !(a == static_cast<const char*>(s));
+}
 
 }  // namespace zelt_gscl_V1
 

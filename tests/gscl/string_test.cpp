@@ -25,8 +25,21 @@ TEST(String, withoutStorage_equalsOnlyNull) {
   EXPECT_TRUE(GSString("") == "");
   EXPECT_TRUE(empty == GSString(null));
   EXPECT_TRUE(empty != GSString(""));
+  EXPECT_TRUE(empty == nullptr);
   EXPECT_EQ(GSString(0).size(), 0);
   EXPECT_EQ(text(GSString(-3)), nullptr);
+}
+
+TEST(String, compared_byTextNotByAddress) {
+  GSString s("text");
+  char same[] = "text";
+  char* other = same + 1;
+  EXPECT_TRUE(s == same);
+  EXPECT_FALSE(s != same);
+  EXPECT_TRUE(s != other);
+  EXPECT_FALSE(s != "text");
+  EXPECT_TRUE(s == GSString(same));
+  EXPECT_FALSE(s == "tex");
 }
 
 TEST(String, createdWithSize_isZeroFilled) {
