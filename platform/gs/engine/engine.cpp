@@ -294,6 +294,11 @@ wyx_rc_t Engine::precheck(SessionId session, const Request& request) const {
   return state_->check(session, request);
 }
 
+bool Engine::awaits(const TimerId& timer) const {
+  const Group* group = state_->find_group(timer.group);
+  return group && group->awaits(timer);
+}
+
 std::vector<Engine::GroupStatus> Engine::status() const {
   std::vector<GroupStatus> all;
   for (const auto& [name, group] : state_->groups) {

@@ -27,6 +27,10 @@ class Engine {
   /// to be wrong before it gives the request to the ordering.
   wyx_rc_t precheck(SessionId session, const Request& request) const;
 
+  /// Whether the expiry of this timer would still change anything: its phase runs. A timer that is not awaited need
+  /// not be kept.
+  bool awaits(const TimerId& timer) const;
+
   /// For people and tools: a group as it stands.
   struct GroupStatus {
     std::string name;

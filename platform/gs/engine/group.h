@@ -52,7 +52,9 @@ class Group {
 
   /// The provider is dead or has said goodbye. The caller has taken it out of the client table.
   void lose(const MemberPtr& member, std::uint32_t leave_code);
-  /// Ignored unless it is the time limit of the phase that runs.
+  /// Whether this is the time limit of the phase that runs.
+  bool awaits(const TimerId& timer) const;
+  /// Ignored unless it is awaited.
   void expire(const TimerId& timer);
   void announce(std::uint32_t summary, const Membership& about, Surroundings& env) const;
 

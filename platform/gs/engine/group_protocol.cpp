@@ -97,8 +97,12 @@ void Group::cast_default(Member& voter, std::uint32_t cause) {
   --run_->missing;
 }
 
+bool Group::awaits(const TimerId& timer) const {
+  return run_ && run_->number == timer.protocol && run_->phase == timer.phase;
+}
+
 void Group::expire(const TimerId& timer) {
-  if (!run_ || run_->number != timer.protocol || run_->phase != timer.phase) return;
+  if (!awaits(timer)) return;
   for (const MemberPtr& m : run_->voters)
     if (m->ballot.open) cast_default(*m, WYX_TIME_LIMIT_EXCEEDED);
 }

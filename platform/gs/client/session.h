@@ -1,0 +1,103 @@
+// One session with group services, from wyx_setup to wyx_quit: its clients, its requests, the handing out of its
+// notifications.
+#pragma once
+
+#include <atomic>
+#include <deque>
+#include <memory>
+
+#include "client/mutex.h"
+#include "client/records.h"
+#include "client/registry.h"
+#include "client/transport.h"
+
+namespace gs::client {
+
+struct SessionRoutines {
+  wyx_responsiveness_cb_t* responsiveness = nullptr;
+  wyx_delayed_error_cb_t* delayed_error = nullptr;
+};
+
+/// Any thread may call any function, also from inside a callback. No lock is held while a callback runs.
+class Session {
+ public:
+  Session(std::unique_ptr<Transport> transport, const SessionRoutines& routines);
+
+  int descriptor() const { return transport_->descriptor(); }
+  std::uint32_t node_number() const { return transport_->node_number(); }
+  /// Group services have gone or the session was quit.
+  bool gone() { return transport_->gone(); }
+  wyx_rc_t query_node(wire::NodeInfo* info) { return transport_->query_node(info); }
+
+  /// WYX_OK: `token` is a live client of this kind. WYX_BAD_MEMBER_TOKEN: it is not. WYX_NO_INIT: it is not, and
+  /// group services are gone.
+  wyx_rc_t check_token(Token token, Client::Kind kind);
+  /// A join or a subscription: gives the client its token, in `request` and, when it was accepted, in `*token`.
+  template <typename T>
+  wyx_rc_t enter(const Client& client, T request, wyx_token_t* token);
+  /// Any other request of an existing client.
+  wyx_rc_t call(Request request);
+  /// A goodbye or the end of a subscription: the client is forgotten when it is accepted.
+  wyx_rc_t depart(Token token, Request request);
+  wyx_rc_t set_responsiveness(const wyx_responsiveness_t& settings);
+
+  /// Hands out what is there; see wyx_dispatch. `cancel_state` is the caller's, in force while it waits.
+  wyx_rc_t dispatch(bool blocking, int cancel_state);
+  void quit();
+
+ private:
+  enum class Step { kDelivered, kDropped, kNothing };
+  class Turn;
+
+  wyx_responsiveness_t exchange_settings(const wyx_responsiveness_t& settings);
+  bool begin_turn(bool blocking, int cancel_state);
+  void end_turn();
+  bool has_turn() GS_REQUIRES(turn_mutex_);
+
+  int drain();
+  Step deliver_next();
+  Step deliver(Token token, const Notification& notification);
+  Step deliver(Token token, const Client& client, const ProtocolNotification& n);
+  Step deliver(Token token, const Client& client, const AnnouncementNotification& n);
+  Step deliver(Token token, const Client& client, const SubscriptionNotification& n);
+  Step deliver(Token token, const Client& client, const DelayedErrorNotification& n);
+  Step answer_ping(std::uint64_t number);
+  Step tell_of_the_end();
+
+  const std::unique_ptr<Transport> transport_;
+  const SessionRoutines routines_;
+  Registry registry_;
+  std::atomic<bool> quit_ = false;
+  std::atomic<bool> ended_ = false;  // group services are gone and every client has been told
+
+  Mutex settings_mutex_;
+  wyx_responsiveness_t settings_ GS_GUARDED_BY(settings_mutex_) = {};
+
+  // Who hands out: one thread at a time, which may do so again from inside a callback.
+  Mutex turn_mutex_;
+  Condition turn_free_;  // notified when turn_depth_ becomes 0
+  pthread_t turn_owner_ GS_GUARDED_BY(turn_mutex_) = {};
+  unsigned turn_depth_ GS_GUARDED_BY(turn_mutex_) = 0;
+
+  // Of the thread that hands out.
+  std::deque<Records> records_;  // one for each level of nesting, so that an inner callback spoils no outer record
+  std::size_t level_ = 0;
+  bool gone_seen_ = false;
+};
+
+template <typename T>
+wyx_rc_t Session::enter(const Client& client, T request, wyx_token_t* token) {
+  const auto added = registry_.add(client);
+  if (!added) return WYX_NO_INIT;
+  request.token = *added;
+  wyx_rc_t rc = call(std::move(request));
+  if (rc == WYX_OK && !registry_.accept(*added)) rc = WYX_NO_INIT;
+  if (rc == WYX_OK) {
+    *token = *added;
+  } else {
+    registry_.remove(*added);
+  }
+  return rc;
+}
+
+}  // namespace gs::client

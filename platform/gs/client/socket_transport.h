@@ -1,0 +1,48 @@
+// A session with the daemon on this host: two connections to its socket, one for requests and their answers, one
+// whose descriptor is the session's, so that no answer waits behind notifications.
+#pragma once
+
+#include <atomic>
+#include <string>
+
+#include "client/channel.h"
+#include "client/mutex.h"
+#include "client/transport.h"
+
+namespace gs::client {
+
+class SocketTransport : public Transport {
+ public:
+  /// Connects and greets. Null: `rc` says why.
+  static std::unique_ptr<SocketTransport> open(const std::string& path, const wire::Hello& hello, wyx_rc_t* rc);
+  /// Asks the daemon without a session.
+  static wyx_rc_t query_node_of(const std::string& path, wire::NodeInfo* info);
+
+  SocketTransport(std::unique_ptr<Channel> requests, std::unique_ptr<Channel> events, std::uint32_t node_number);
+
+  std::uint32_t node_number() const override { return node_number_; }
+  wyx_rc_t call(Request request) override;
+  wyx_rc_t set_responsiveness(const wire::SetResponsiveness& settings) override;
+  wyx_rc_t query_node(wire::NodeInfo* info) override;
+  Incoming take() override;
+  void answer_ping(std::uint64_t number, bool ok) override;
+  void wait() override;
+  int descriptor() const override { return events_->fd(); }
+  void silence() override;
+  bool gone() override;
+  void quit() override;
+
+ private:
+  template <typename T>
+  wyx_rc_t exchange(const wire::ClientMessage& message, T* answer);
+  void lose(const char* what);
+
+  const std::uint32_t node_number_;
+  const std::unique_ptr<Channel> requests_;
+  const std::unique_ptr<Channel> events_;
+  Mutex exchange_mutex_;  // one exchange at a time on requests_
+  Mutex answer_mutex_;    // one sender at a time on events_
+  std::atomic<bool> gone_ = false;
+};
+
+}  // namespace gs::client
