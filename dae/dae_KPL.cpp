@@ -86,7 +86,7 @@ bool is_privileged() { return geteuid() == 0 || getegid() == 0; }
 int allocate_buffer() {
   const bool with_data = profile.other_req != nullptr;
   KPL_reqbuf_len = with_data ? kLargeBuffer : static_cast<int>(sizeof(kplreq));
-  free(KPL_reqbuf);  // of a set-up that failed before
+  free(KPL_reqbuf);  // of an earlier set-up
   KPL_reqbuf = static_cast<char*>(malloc(with_data ? kLargeBuffer + 1 : sizeof(kplreq)));
   return KPL_reqbuf != nullptr ? DAE_OK : dae::fail_call(DAE_E_KPL, "malloc");
 }
