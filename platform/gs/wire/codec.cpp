@@ -13,12 +13,13 @@ namespace {
 static_assert(std::endian::native == std::endian::little, "packet headers are written as they lie in memory");
 
 constexpr std::uint32_t kMagic = 0x50445347;  // "GSDP"
+constexpr std::uint16_t kPacketVersion = 1;    // of header and slicing; the schema has kProtocolVersion
 constexpr std::uint16_t kFirst = 1;           // flag: first packet of its message
 constexpr std::uint16_t kLast = 2;            // flag: last packet of its message
 
 struct Header {
   std::uint32_t magic = kMagic;
-  std::uint16_t version = kProtocolVersion;
+  std::uint16_t version = kPacketVersion;
   std::uint16_t flags = 0;
   Token token = -1;
   std::uint32_t length = 0;  // bytes of the whole FlatBuffer
@@ -196,7 +197,7 @@ bool Assembler::add(std::span<const std::byte> packet, std::string* error) {
   std::memcpy(&header, packet.data(), sizeof header);
   const auto slice = packet.subspan(kHeaderSize);
   if (header.magic != kMagic) return fail(error, "a packet that does not begin with the magic number");
-  if (header.version != kProtocolVersion) return fail(error, "a packet of another protocol version");
+  if (header.version != kPacketVersion) return fail(error, "a packet of another version");
   if ((header.flags & ~(kFirst | kLast)) != 0) return fail(error, "a packet with unknown flags");
   if (header.length > max_message_) return fail(error, "a message over the limit");
 

@@ -35,7 +35,8 @@ inline constexpr std::size_t kMaxSlice = kMaxPacket - kHeaderSize;
 /// each with its own token in the header. Copies share the payload.
 class Encoded {
  public:
-  /// False: the message was over the limit of its direction and cannot be sent.
+  Encoded() = default;
+  /// False: there is no message, or it was over the limit of its direction and cannot be sent.
   explicit operator bool() const { return payload_ != nullptr; }
   /// Bytes of all packets together, headers included.
   std::size_t size() const { return length_ + packets() * kHeaderSize; }

@@ -1,0 +1,200 @@
+#include "daemon/options.h"
+
+#include <grp.h>
+#include <sys/un.h>
+
+#include <CLI/CLI.hpp>
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <cstring>
+#include <fstream>
+#include <iostream>
+#include <iterator>
+#include <sstream>
+#include <toml.hpp>
+
+namespace gs::daemon {
+namespace {
+
+constexpr std::uint64_t kMaxNode = 32767;
+constexpr std::uint64_t kMinQueueBound = 64 * 1024;
+constexpr std::uint64_t kMaxQueueBound = std::uint64_t{1} << 40;
+
+/// What is wrong with a setting's text; empty: nothing.
+using Problem = std::string;
+
+Problem set_number(const std::string& text, std::uint64_t min, std::uint64_t max, std::uint64_t* value) {
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), *value);
+  if (error == std::errc() && end == text.data() + text.size() && *value >= min && *value <= max) return {};
+  return "must be a whole number from " + std::to_string(min) + " to " + std::to_string(max) + ", not '" + text +
+         "'";
+}
+
+Problem set_socket_path(Options& options, const std::string& text) {
+  constexpr std::size_t kLongest = sizeof(sockaddr_un::sun_path) - 1;
+  if (text.empty() || text.size() > kLongest) {
+    return "must be a path of 1 to " + std::to_string(kLongest) + " characters";
+  }
+  options.socket_path = text;
+  return {};
+}
+Problem set_access_group(Options& options, const std::string& text) {
+  try {
+    group_id(text);
+  } catch (const OptionError& error) {
+    return error.what();
+  }
+  options.access_group = text;
+  return {};
+}
+Problem set_node_number(Options& options, const std::string& text) {
+  std::uint64_t value = 0;
+  Problem problem = set_number(text, 0, kMaxNode, &value);
+  if (problem.empty()) options.node_number = static_cast<std::uint32_t>(value);
+  return problem;
+}
+Problem set_queue_bound(Options& options, const std::string& text) {
+  std::uint64_t value = 0;
+  Problem problem = set_number(text, kMinQueueBound, kMaxQueueBound, &value);
+  if (problem.empty()) options.queue_bound = value;
+  return problem;
+}
+Problem set_log_level(Options& options, const std::string& text) {
+  static constexpr struct {
+    const char* name;
+    spdlog::level::level_enum level;
+  } kLevels[] = {{"error", spdlog::level::err},
+                 {"warning", spdlog::level::warn},
+                 {"info", spdlog::level::info},
+                 {"debug", spdlog::level::debug}};
+  for (const auto& level : kLevels) {
+    if (text != level.name) continue;
+    options.log_level = level.level;
+    return {};
+  }
+  return "must be error, warning, info or debug, not '" + text + "'";
+}
+
+/// One setting, of the same name on the command line (with -- before it) and in the configuration file.
+struct Setting {
+  const char* name;
+  const char* value;  // what it takes, for --help
+  bool number;        // an integer in the configuration file; else a text
+  const char* help;
+  Problem (*set)(Options&, const std::string&);
+};
+constexpr Setting kSettings[] = {
+    {"socket", "PATH", false, "Socket to listen on", set_socket_path},
+    {"access-group", "GROUP", false, "Unix group whose members may be clients (none: the owner alone)",
+     set_access_group},
+    {"node-number", "N", true, "Number of this node, 0 to 32767", set_node_number},
+    {"queue-bound", "BYTES", true, "Bytes that may wait for a client before it is closed", set_queue_bound},
+    {"log-level", "LEVEL", false, "error, warning, info or debug", set_log_level},
+};
+
+std::string first_line(const std::string& text) { return text.substr(0, text.find('\n')); }
+
+std::string at(const toml::source_location& where) {
+  return where.file_name() + ":" + std::to_string(where.line());
+}
+
+/// The parser's own words without its "[error] toml::function: " before and its drawing of the line after.
+std::string syntax_problem(const std::string& message) {
+  std::string what = first_line(message);
+  if (what.starts_with("[error] ")) what.erase(0, what.find(' ') + 1);
+  if (what.starts_with("toml::") && what.find(": ") != std::string::npos) what.erase(0, what.find(": ") + 2);
+  return what;
+}
+
+std::string content_of(const std::string& path) {
+  errno = 0;
+  std::ifstream file(path, std::ios::binary);
+  std::string content{std::istreambuf_iterator<char>(file), {}};
+  if (errno != 0) throw OptionError(path + ": cannot be read: " + strerror(errno));
+  return content;
+}
+
+toml::value parse_file(const std::string& path) {
+  std::istringstream content(content_of(path));
+  try {
+    return toml::parse(content, path);
+  } catch (const toml::syntax_error& error) {
+    throw OptionError(at(error.location()) + ": " + syntax_problem(error.what()));
+  } catch (const std::exception& error) {
+    throw OptionError(path + ": " + first_line(error.what()));
+  }
+}
+
+void apply(const std::string& name, const toml::value& value, Options& options) {
+  const std::string where = at(value.location()) + ": " + name + ": ";
+  const auto* setting =
+      std::find_if(std::begin(kSettings), std::end(kSettings), [&](const Setting& s) { return name == s.name; });
+  if (setting == std::end(kSettings)) throw OptionError(at(value.location()) + ": unknown setting '" + name + "'");
+  if (setting->number ? !value.is_integer() : !value.is_string()) {
+    throw OptionError(where + (setting->number ? "must be a whole number" : "must be a text in quotes"));
+  }
+  const std::string text = setting->number ? std::to_string(value.as_integer()) : value.as_string().str;
+  const Problem problem = setting->set(options, text);
+  if (!problem.empty()) throw OptionError(where + problem);
+}
+
+void parse_ready_fd(const std::string& text, Options& options) {
+  std::uint64_t fd = 0;
+  const Problem problem = set_number(text, 0, 1 << 20, &fd);
+  if (!problem.empty()) throw OptionError("--ready-fd: " + problem);
+  options.ready_fd = static_cast<int>(fd);
+}
+
+}  // namespace
+
+std::optional<std::uint32_t> group_id(const std::string& access_group) {
+  if (access_group.empty()) return std::nullopt;
+  std::uint64_t number = 0;
+  if (set_number(access_group, 0, UINT32_MAX - 1, &number).empty()) return static_cast<std::uint32_t>(number);
+  const group* found = getgrnam(access_group.c_str());
+  if (found == nullptr) throw OptionError("there is no group '" + access_group + "'");
+  return found->gr_gid;
+}
+
+Options read_config(const std::string& path, Options options) {
+  const toml::value file = parse_file(path);
+  for (const auto& [name, value] : file.as_table()) apply(name, value, options);
+  return options;
+}
+
+std::optional<Options> parse_options(int argc, const char* const* argv) {
+  CLI::App app("Group-services daemon: connects the group providers and subscribers of this host.", "gsd");
+  app.set_version_flag("--version", "gsd " GSD_VERSION);
+  std::string config;
+  std::string ready_fd;
+  std::string given[std::size(kSettings)];
+  app.add_option("--config", config, "Configuration file (TOML); options override it")->type_name("FILE");
+  for (std::size_t i = 0; i < std::size(kSettings); ++i) {
+    app.add_option(std::string("--") + kSettings[i].name, given[i], kSettings[i].help)
+        ->type_name(kSettings[i].value);
+  }
+  app.add_option("--ready-fd", ready_fd, "Descriptor that is told \"ready\" once clients can connect")
+      ->type_name("FD");
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::Success& asked) {
+    app.exit(asked, std::cout, std::cerr);
+    return std::nullopt;
+  } catch (const CLI::ParseError& error) {
+    throw OptionError(first_line(error.what()));
+  }
+
+  Options options;
+  if (app.count("--config") != 0) options = read_config(config, options);
+  for (std::size_t i = 0; i < std::size(kSettings); ++i) {
+    const std::string option = std::string("--") + kSettings[i].name;
+    if (app.count(option) == 0) continue;
+    const Problem problem = kSettings[i].set(options, given[i]);
+    if (!problem.empty()) throw OptionError(option + ": " + problem);
+  }
+  if (app.count("--ready-fd") != 0) parse_ready_fd(ready_fd, options);
+  return options;
+}
+
+}  // namespace gs::daemon

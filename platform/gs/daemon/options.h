@@ -1,0 +1,41 @@
+// What the daemon is told by its command line and its configuration file. The defaults are defined here and
+// nowhere else.
+#pragma once
+
+#include <spdlog/common.h>
+
+#include <cstdint>
+#include <optional>
+#include <stdexcept>
+#include <string>
+
+#include "wire/endpoint.h"
+
+namespace gs::daemon {
+
+struct Options {
+  std::string socket_path = wire::kDefaultSocketPath;
+  std::string access_group;                    // name or number of a unix group; empty: the owner alone
+  std::uint32_t node_number = 1;               // 0 to 32767
+  std::size_t queue_bound = 16 * 1024 * 1024;  // bytes that may wait for each channel of a client
+  spdlog::level::level_enum log_level = spdlog::level::info;
+  int ready_fd = -1;  // told "ready" once clients can connect; -1: nobody
+};
+
+/// One line that says where (option, or file and line) and what.
+class OptionError : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
+/// The options of this command line, over those of the configuration file that it names. Nothing: --help or
+/// --version was asked for and is answered on standard output. Throws OptionError.
+std::optional<Options> parse_options(int argc, const char* const* argv);
+
+/// As in `options`, with what the configuration file says put in its place. Throws OptionError.
+Options read_config(const std::string& path, Options options);
+
+/// The id of the access group. Throws OptionError: there is no such group.
+std::optional<std::uint32_t> group_id(const std::string& access_group);
+
+}  // namespace gs::daemon

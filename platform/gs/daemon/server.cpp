@@ -1,0 +1,216 @@
+#include "daemon/server.h"
+
+#include <sys/random.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <system_error>
+
+#include "daemon/peer.h"
+
+namespace gs::daemon {
+namespace {
+
+constexpr int kSendBuffer = 1024 * 1024;          // bytes; the system may give less
+constexpr timeval kAcceptPause = {0, 100'000};    // when descriptors have run out
+constexpr timeval kFarewellLimit = {0, 500'000};  // for clients to take what waits for them
+constexpr int kAcceptsAtOnce = 64;                // before the connected are served again
+
+Time now() { return std::chrono::duration_cast<Time>(std::chrono::steady_clock::now().time_since_epoch()); }
+
+std::uint64_t random_number() {
+  std::uint64_t value = 0;
+  if (getrandom(&value, sizeof value, 0) != sizeof value) throw std::system_error(errno, std::generic_category());
+  return value;
+}
+
+/// As much as the system allows: past its limit for everyone where we may, else up to it.
+void enlarge_send_buffer(int fd) {
+  if (setsockopt(fd, SOL_SOCKET, SO_SNDBUFFORCE, &kSendBuffer, sizeof kSendBuffer) == 0) return;
+  setsockopt(fd, SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
+}
+
+}  // namespace
+
+template <void (Server::*Member)()>
+void Server::call(evutil_socket_t, short, void* server) {
+  auto* self = static_cast<Server*>(server);
+  (self->*Member)();
+  self->arm_deadline();
+}
+
+template <void (Server::*Member)(ConnectionId)>
+void Server::call_connection(evutil_socket_t, short, void* connection) {
+  auto* at = static_cast<Connection*>(connection);
+  Server* self = at->server;
+  (self->*Member)(at->id);  // may destroy the connection
+  self->arm_deadline();
+}
+
+Server::EventPtr Server::make_event(evutil_socket_t fd, short what, event_callback_fn callback, void* argument) {
+  EventPtr made(event_new(base_.get(), fd, what, callback, argument));
+  if (!made) throw std::bad_alloc();
+  return made;
+}
+
+Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
+    : log_(std::move(log)),
+      access_{geteuid(), group_id(options.access_group)},
+      base_(event_base_new()),
+      listener_(options.socket_path, access_.group),
+      sessions_({options.node_number, options.queue_bound}, {*this, ordering_, now, random_number, log_}),
+      packet_(wire::kMaxPacket + 1) {
+  if (!base_) throw std::bad_alloc();
+  const auto on_stop = [](evutil_socket_t signal, short, void* self) {
+    static_cast<Server*>(self)->on_signal(static_cast<int>(signal));
+  };
+  acceptable_ = make_event(listener_.fd(), EV_READ | EV_PERSIST, call<&Server::on_acceptable>, this);
+  accept_again_ = make_event(
+      -1, 0,
+      [](evutil_socket_t, short, void* self) {
+        event_add(static_cast<Server*>(self)->acceptable_.get(), nullptr);
+      },
+      this);
+  deadline_ = make_event(-1, 0, call<&Server::on_deadline>, this);
+  farewell_over_ = make_event(
+      -1, 0,
+      [](evutil_socket_t, short, void* self) { event_base_loopbreak(static_cast<Server*>(self)->base_.get()); },
+      this);
+  terminated_ = make_event(SIGTERM, EV_SIGNAL | EV_PERSIST, on_stop, this);
+  interrupted_ = make_event(SIGINT, EV_SIGNAL | EV_PERSIST, on_stop, this);
+  event_add(terminated_.get(), nullptr);
+  event_add(interrupted_.get(), nullptr);
+  event_add(acceptable_.get(), nullptr);
+}
+
+Server::~Server() = default;
+
+void Server::run() { event_base_dispatch(base_.get()); }
+
+// ---------------------------------------------------------------------------------------------- new connections
+
+void Server::on_acceptable() {
+  for (int i = 0; i < kAcceptsAtOnce && accept_one(); ++i) {
+  }
+}
+
+bool Server::accept_one() {
+  Descriptor socket(accept4(listener_.fd(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+  if (socket) {
+    add_connection(std::move(socket));
+    return true;
+  }
+  if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) pause_accepting(errno);
+  return errno == ECONNABORTED || errno == EINTR;
+}
+
+/// The connection that could not be accepted stays in the queue and would wake the loop again and again.
+void Server::pause_accepting(int error) {
+  log_->warn("cannot accept more connections for now: {}", strerror(error));
+  event_del(acceptable_.get());
+  event_add(accept_again_.get(), &kAcceptPause);
+}
+
+void Server::add_connection(Descriptor socket) {
+  const std::optional<Peer> peer = peer_of(socket.get());
+  if (!peer) return;  // gone already
+  if (!access_.allows(*peer)) {
+    log_->warn("connection (pid {}, uid {}): closed: not permitted", peer->pid, peer->uid);
+    return;
+  }
+  enlarge_send_buffer(socket.get());
+  const ConnectionId id = ++last_connection_;
+  const int fd = socket.get();
+  Connection& connection = connections_[id];
+  connection.server = this;
+  connection.id = id;
+  connection.socket = std::move(socket);
+  connection.readable = make_event(fd, EV_READ | EV_PERSIST, call_connection<&Server::on_readable>, &connection);
+  event_add(connection.readable.get(), nullptr);
+  sessions_.opened(id, *peer);
+}
+
+// ------------------------------------------------------------------------------------------------- connections
+
+void Server::on_readable(ConnectionId id) {
+  const int fd = connections_.at(id).socket.get();
+  const ssize_t length = recv(fd, packet_.data(), packet_.size(), MSG_DONTWAIT);
+  if (length > 0) return sessions_.received(id, {packet_.data(), static_cast<std::size_t>(length)});
+  if (length == 0) return sessions_.lost(id, "the peer is gone");
+  if (errno != EAGAIN && errno != EINTR) sessions_.lost(id, std::string("the peer is gone: ") + strerror(errno));
+}
+
+void Server::on_writable(ConnectionId id) { sessions_.writable(id); }
+
+Transport::Sent Server::send_packet(ConnectionId to, std::span<const std::byte> header,
+                                    std::span<const std::byte> slice) {
+  iovec parts[] = {{const_cast<std::byte*>(header.data()), header.size()},
+                   {const_cast<std::byte*>(slice.data()), slice.size()}};
+  msghdr message{};
+  message.msg_iov = parts;
+  message.msg_iovlen = 2;
+  const int fd = connections_.at(to).socket.get();
+  ssize_t sent = 0;
+  do {
+    sent = sendmsg(fd, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
+  } while (sent < 0 && errno == EINTR);
+  if (sent >= 0) return Sent::kDone;
+  if (errno == EAGAIN) return Sent::kFull;
+  log_->debug("connection {}: cannot send: {}", to, strerror(errno));
+  return Sent::kGone;
+}
+
+void Server::wait_writable(ConnectionId id) {
+  Connection& connection = connections_.at(id);
+  if (!connection.writable) {
+    connection.writable =
+        make_event(connection.socket.get(), EV_WRITE, call_connection<&Server::on_writable>, &connection);
+  }
+  event_add(connection.writable.get(), nullptr);
+}
+
+void Server::close(ConnectionId id) { connections_.erase(id); }
+
+// ---------------------------------------------------------------------------------------------- time and the end
+
+void Server::on_deadline() {
+  armed_.reset();
+  sessions_.run_timers();
+}
+
+void Server::arm_deadline() {
+  if (stopping_) return finish_when_drained();
+  const auto next = sessions_.next_deadline();
+  if (next == armed_) return;
+  armed_ = next;
+  if (!next) {
+    event_del(deadline_.get());
+    return;
+  }
+  const auto wait = std::max(*next - now(), Duration::zero());
+  const timeval time = {static_cast<time_t>(wait.count() / 1000),
+                        static_cast<suseconds_t>(wait.count() % 1000 * 1000)};
+  event_add(deadline_.get(), &time);
+}
+
+void Server::on_signal(int signal) {
+  if (stopping_) return;
+  log_->info("stopping on {} with {} clients", strsignal(signal), sessions_.sessions());
+  stopping_ = true;
+  event_del(acceptable_.get());
+  event_del(accept_again_.get());
+  event_del(deadline_.get());
+  listener_.close();
+  for (auto& [id, connection] : connections_) event_del(connection.readable.get());
+  sessions_.say_farewell();
+  event_add(farewell_over_.get(), &kFarewellLimit);
+  finish_when_drained();
+}
+
+void Server::finish_when_drained() {
+  if (sessions_.drained()) event_base_loopbreak(base_.get());
+}
+
+}  // namespace gs::daemon

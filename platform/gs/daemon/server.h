@@ -1,0 +1,89 @@
+// The daemon's loop: sockets, timers and signals around the session layer.
+#pragma once
+
+#include <event2/event.h>
+#include <spdlog/logger.h>
+
+#include <memory>
+#include <unordered_map>
+#include <vector>
+
+#include "daemon/access.h"
+#include "daemon/descriptor.h"
+#include "daemon/listener.h"
+#include "daemon/local_ordering.h"
+#include "daemon/options.h"
+#include "daemon/session_layer.h"
+
+namespace gs::daemon {
+
+class Server : private Transport {
+ public:
+  Server(const Options& options, std::shared_ptr<spdlog::logger> log);
+  ~Server();
+
+  /// Serves until SIGTERM or SIGINT, then tells the clients and gives them a bounded time to be told.
+  void run();
+
+ private:
+  struct FreeEvent {
+    void operator()(event* e) const { event_free(e); }
+  };
+  struct FreeBase {
+    void operator()(event_base* base) const { event_base_free(base); }
+  };
+  using EventPtr = std::unique_ptr<event, FreeEvent>;
+
+  struct Connection {
+    Server* server;
+    ConnectionId id;
+    Descriptor socket;
+    EventPtr readable;  // the events go before the socket
+    EventPtr writable;
+  };
+
+  // Transport.
+  Sent send_packet(ConnectionId to, std::span<const std::byte> header, std::span<const std::byte> slice) override;
+  void wait_writable(ConnectionId id) override;
+  void close(ConnectionId id) override;
+
+  // Called by the loop.
+  void on_acceptable();
+  void on_readable(ConnectionId id);
+  void on_writable(ConnectionId id);
+  void on_signal(int signal);
+  void on_deadline();
+
+  bool accept_one();
+  void add_connection(Descriptor socket);
+  void pause_accepting(int error);
+  void arm_deadline();
+  void finish_when_drained();
+
+  template <void (Server::*Member)()>
+  static void call(evutil_socket_t, short, void* server);
+  template <void (Server::*Member)(ConnectionId)>
+  static void call_connection(evutil_socket_t, short, void* connection);
+
+  EventPtr make_event(evutil_socket_t fd, short what, event_callback_fn callback, void* argument);
+
+  const std::shared_ptr<spdlog::logger> log_;
+  const AccessRule access_;
+  std::unique_ptr<event_base, FreeBase> base_;
+  Listener listener_;
+  LocalOrdering ordering_;
+  SessionLayer sessions_;
+  EventPtr acceptable_;
+  EventPtr accept_again_;
+  EventPtr deadline_;
+  EventPtr terminated_;
+  EventPtr interrupted_;
+  EventPtr farewell_over_;
+  std::optional<Time> armed_;  // for which time deadline_ stands
+  std::unordered_map<ConnectionId, Connection> connections_;
+  ConnectionId last_connection_ = 0;
+  bool stopping_ = false;
+  std::vector<std::byte> packet_;  // of whatever connection is being read
+};
+
+}  // namespace gs::daemon

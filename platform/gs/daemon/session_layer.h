@@ -1,0 +1,144 @@
+// The daemon without its descriptors: who is connected, what they may say when, what they are sent.
+//
+// It is given packets and the time and gives back packets; sockets, signals and the loop are the server's. It puts
+// requests through the ordering, applies the ordered events to the engine and hands the notifications to the
+// clients.
+//
+// A connection's life, as state x message -> what happens; any other message closes the connection as malformed:
+//
+//   state     Hello              Attach             Call        SetResp.    QueryNode  PingAnswer  Quit
+//   fresh     Welcome->request   Answer->event      close       close       NodeInfo   close       close
+//   request   close              close              Answer (1)  Answer      NodeInfo   close       Answer, end
+//   event     close              close              close       close       close      noted       close
+//
+//   (1) once the session's event channel is attached; before that: close.
+//
+// A session lives while both its connections do. However it ends, its providers fail and its subscriptions end.
+#pragma once
+
+#include <spdlog/logger.h>
+
+#include <array>
+#include <functional>
+#include <memory>
+#include <string>
+#include <unordered_map>
+
+#include "daemon/ordering.h"
+#include "daemon/out_queue.h"
+#include "daemon/pinger.h"
+#include "daemon/timers.h"
+#include "daemon/transport.h"
+#include "engine/engine.h"
+#include "wire/codec.h"
+
+namespace gs::daemon {
+
+/// Not safe for concurrent use; one thread drives it. No member may be called from inside the transport.
+class SessionLayer : private PingSink {
+ public:
+  struct Settings {
+    std::uint32_t node_number = 0;
+    std::size_t queue_bound = 0;       // bytes that may wait for each of a client's channels
+    Duration handshake_limit{10'000};  // to say Hello or Attach, and to attach after Hello
+  };
+  /// What it is given of the outside world.
+  struct Environment {
+    Transport& transport;
+    Ordering& ordering;
+    std::function<Time()> now;
+    std::function<std::uint64_t()> random;  // not to be guessed by a client
+    std::shared_ptr<spdlog::logger> log;
+  };
+
+  SessionLayer(const Settings& settings, Environment environment);
+  SessionLayer(const SessionLayer&) = delete;
+  SessionLayer& operator=(const SessionLayer&) = delete;
+
+  // What happened below. A connection that was closed meanwhile is ignored.
+  void opened(ConnectionId id, const Peer& peer);
+  void received(ConnectionId id, std::span<const std::byte> packet);
+  void writable(ConnectionId id);
+  /// The peer is gone; `why` is for the log.
+  void lost(ConnectionId id, const std::string& why);
+
+  /// When run_timers is to be called next.
+  std::optional<Time> next_deadline() const { return timers_.next(); }
+  void run_timers() { timers_.run(env_.now()); }
+
+  /// Tells every client that the daemon is going away; what waits for them still goes out, nothing new does.
+  void say_farewell();
+  /// True when nothing waits to be sent.
+  bool drained() const;
+
+  std::size_t sessions() const { return sessions_.size(); }
+
+ private:
+  enum class Channel { kFresh, kRequest, kEvent };
+  struct Connection {
+    Peer peer;
+    Channel channel = Channel::kFresh;
+    std::uint64_t session = 0;  // 0: none yet
+    wire::Assembler in{wire::kMaxClientMessage};
+    OutQueue out;
+    Timers::Id handshake;
+  };
+  struct Session {
+    Session(std::uint64_t number, SessionLayer& layer) : pinger(number, layer.timers_, layer.env_.now, layer) {}
+
+    ConnectionId request = 0;
+    ConnectionId event = 0;  // 0: not attached yet
+    std::uint64_t cookie = 0;
+    std::string program;
+    bool answer_due = false;  // of a Call that is being ordered
+    Timers::Id attach_limit;
+    Pinger pinger;
+  };
+  enum class End { kQuit, kGone, kFault };
+
+  // One message of a client; each may close the connection it came on.
+  void on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
+  void on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
+  void on_request_channel(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
+  void on_hello(ConnectionId id, Connection& connection, const wire::Hello& hello);
+  void on_attach(ConnectionId id, Connection& connection, const wire::Attach& attach);
+  void on_call(ConnectionId id, Connection& connection, const wire::Call& call);
+  void on_query_node(ConnectionId id);
+
+  // Of the pingers.
+  void send_ping(std::uint64_t session, std::uint64_t ping) override;
+  void responding_changed(std::uint64_t session, bool responding) override;
+  void too_slow(std::uint64_t session) override;
+
+  // The ordered side.
+  void ordered(const Event& event);
+  void deliver(const Delivery& delivery);
+  void arm(const TimerRequest& timer);
+  SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
+
+  void send(ConnectionId to, const wire::Encoded& message, Token token = -1);
+  void answer(ConnectionId to, wyx_rc_t rc) { send(to, answers_.at(rc)); }
+
+  /// Closes a connection and, where it has one, its session, with a line in the log.
+  void end(ConnectionId id, End how, const std::string& why);
+  void end_session(std::uint64_t number, End how, const std::string& why);
+  void drop(ConnectionId id);
+  std::string describe(const Connection& connection) const;
+
+  Connection* find(ConnectionId id);
+  Session* find_session(std::uint64_t number);
+
+  const Settings settings_;
+  const Environment env_;
+  Engine engine_;
+  Timers timers_;
+  std::unordered_map<ConnectionId, Connection> connections_;
+  std::unordered_map<std::uint64_t, Session> sessions_;
+  std::unordered_map<std::string, Timers::Id> phase_timers_;        // by group, which runs one protocol at a time
+  std::unordered_map<const Notification*, wire::Encoded> encoded_;  // of the outcome being delivered
+  std::array<wire::Encoded, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
+  std::uint64_t last_session_ = 0;
+  bool said_farewell_ = false;  // nothing is sent after it
+};
+
+}  // namespace gs::daemon

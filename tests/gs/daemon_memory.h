@@ -1,0 +1,138 @@
+// The session layer over connections in memory and a clock that the test moves.
+#pragma once
+
+#include <spdlog/sinks/ostream_sink.h>
+
+#include <map>
+#include <sstream>
+
+#include "daemon/local_ordering.h"
+#include "daemon/session_layer.h"
+#include "support/wire_packets.h"
+
+namespace gs::daemon {
+
+/// What the daemon has sent on each connection, until a client takes it.
+class MemoryTransport : public Transport {
+ public:
+  struct Wire {
+    std::vector<wire::Packet> sent;
+    bool closed = false;
+    bool full = false;  // takes nothing
+    bool gone = false;  // fails
+    bool wants_writable = false;
+  };
+
+  Sent send_packet(ConnectionId to, std::span<const std::byte> header, std::span<const std::byte> slice) override {
+    Wire& wire = wires.at(to);
+    if (wire.gone) return Sent::kGone;
+    if (wire.full) return Sent::kFull;
+    wire::Packet packet(header.begin(), header.end());
+    packet.insert(packet.end(), slice.begin(), slice.end());
+    wire.sent.push_back(std::move(packet));
+    return Sent::kDone;
+  }
+  void wait_writable(ConnectionId connection) override { wires.at(connection).wants_writable = true; }
+  void close(ConnectionId connection) override { wires.at(connection).closed = true; }
+
+  /// The daemon's messages so far, taken off the wire.
+  std::vector<wire::ServerMessage> take(ConnectionId connection) {
+    std::vector<wire::ServerMessage> messages;
+    wire::Assembler assembler(wire::kMaxServerMessage);
+    std::string error;
+    for (const wire::Packet& packet : std::exchange(wires.at(connection).sent, {})) {
+      if (!assembler.add(packet, &error)) throw std::runtime_error(error);
+      if (!assembler.complete()) continue;
+      auto message = assembler.take_server_message(&error);
+      if (!message) throw std::runtime_error(error);
+      messages.push_back(std::move(*message));
+    }
+    return messages;
+  }
+
+  std::map<ConnectionId, Wire> wires;
+};
+
+struct MemoryDaemon {
+  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20)
+      : layer({1, queue_bound},
+              {transport, ordering, [this] { return time; }, [this] { return ++last_random; },
+               std::make_shared<spdlog::logger>("test", std::make_shared<spdlog::sinks::ostream_sink_st>(log))}) {}
+
+  ConnectionId open(std::uint32_t uid = 1000) {
+    const ConnectionId id = ++last_connection;
+    transport.wires[id];
+    layer.opened(id, Peer{4711, uid, 100, {}});
+    return id;
+  }
+  void say(ConnectionId id, const wire::ClientMessage& message) {
+    for (const wire::Packet& packet : wire::packets_of(message)) layer.received(id, packet);
+  }
+  void pass(Duration duration) {
+    const Time end = time + duration;
+    while (layer.next_deadline() && *layer.next_deadline() <= end) {
+      time = std::max(time, *layer.next_deadline());
+      layer.run_timers();
+    }
+    time = end;
+  }
+  bool closed(ConnectionId id) const { return transport.wires.at(id).closed; }
+  bool logged(const std::string& text) const { return log.str().find(text) != std::string::npos; }
+
+  MemoryTransport transport;
+  LocalOrdering ordering;
+  std::ostringstream log;
+  Time time{1'000'000};
+  std::uint64_t last_random = 0;
+  ConnectionId last_connection = 0;
+  SessionLayer layer;
+};
+
+/// A session with both channels, and what a well-behaved client does with them.
+class MemoryClient {
+ public:
+  explicit MemoryClient(MemoryDaemon& daemon) : daemon_(daemon), request(daemon.open()) {
+    daemon_.say(request, wire::Hello{wire::kProtocolVersion, 0, 0, "client"});
+    welcome = std::get<wire::Welcome>(daemon_.transport.take(request).at(0));
+    event = daemon_.open();
+    daemon_.say(event, wire::Attach{welcome.session_number, welcome.cookie});
+    if (std::get<wire::Answer>(daemon_.transport.take(event).at(0)).rc != WYX_OK)
+      throw std::runtime_error("attach");
+  }
+
+  wyx_rc_t ask(const wire::ClientMessage& message) {
+    daemon_.say(request, message);
+    return std::get<wire::Answer>(daemon_.transport.take(request).at(0)).rc;
+  }
+  wyx_rc_t call(const Request& r) { return ask(wire::Call{r}); }
+  wyx_rc_t join(Token token, std::int16_t instance, const std::string& group = "group") {
+    JoinRequest r;
+    r.token = token;
+    r.instance = instance;
+    r.attributes.group_name = group;
+    return call(r);
+  }
+  std::vector<wire::ServerMessage> events() { return daemon_.transport.take(event); }
+  MemoryTransport::Wire& event_wire() { return daemon_.transport.wires.at(event); }
+  /// The last notification of type T since the last look; null: none.
+  template <typename T>
+  std::shared_ptr<const Notification> last_of() {
+    std::shared_ptr<const Notification> last;
+    for (const auto& message : events()) {
+      const auto* notify = std::get_if<wire::Notify>(&message);
+      if (notify != nullptr && std::holds_alternative<T>(*notify->what)) last = notify->what;
+    }
+    return last;
+  }
+  bool closed() const { return daemon_.closed(request) && daemon_.closed(event); }
+
+ private:
+  MemoryDaemon& daemon_;
+
+ public:
+  ConnectionId request = 0;
+  ConnectionId event = 0;
+  wire::Welcome welcome;
+};
+
+}  // namespace gs::daemon
