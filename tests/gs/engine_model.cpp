@@ -33,9 +33,10 @@ void Model::error(const Endpoint& to, const std::string& what) { errors_ += name
 void Model::follow(const Event& event, const Outcome& outcome, const Engine& engine) {
   event_.clear();
   refused_.reset();
-  timer_ = std::holds_alternative<TimerExpiredEvent>(event);
+  timer_ = false;
   std::visit([&](const auto& e) { before(e, outcome); }, event);
   for (const Delivery& d : outcome.deliveries) receive(d);
+  follow_timers(outcome);
   if (refused_) error(refused_to_, "never got the delayed error of a request answered WYX_OK");
   check_groups(engine);
 }
@@ -110,6 +111,25 @@ void Model::before(const HostGoneEvent& event, const Outcome&) {
     if (session.node == event.node) lose(session);
 }
 
+void Model::before(const TimerExpiredEvent& event, const Outcome& outcome) {
+  auto timer = timers_.find(event.timer.group);
+  timer_ = timer != timers_.end() && timer->second == event.timer;
+  if (timer_ == outcome.deliveries.empty())
+    errors_ +=
+        event.timer.group + (timer_ ? ": the end of its time is ignored\n" : ": obeys a timer that is over\n");
+}
+
+void Model::follow_timers(const Outcome& outcome) {
+  for (const TimerRequest& timer : outcome.timers) timers_[timer.id.group] = timer.id;
+  for (const auto& [group, note] : event_) {
+    const auto asked = std::find_if(outcome.timers.rbegin(), outcome.timers.rend(),
+                                    [&](const TimerRequest& t) { return t.id.group == group; });
+    const std::uint16_t seconds = asked == outcome.timers.rend() ? 0 : asked->seconds;
+    if (note->type == WYX_N_PHASE_NOTIFICATION && note->time_limit != seconds)
+      errors_ += group + ": the phase has another time limit than its timer\n";
+  }
+}
+
 // ------------------------------------------------------------------------------------------- what clients hear
 
 void Model::receive(const Delivery& delivery) {
@@ -128,6 +148,7 @@ void Model::receive(const Endpoint& to, const ProtocolNotification& n) {
 
   if (view.asked && view.asked_protocol == n.protocol && view.asked_phase >= n.proposal.phase)
     error(to, "is asked twice in one phase");
+  if (takes_out(n.protocol) && contains(n.proposal.changing_providers, view.id)) error(to, "votes on its own end");
   view.asked = true;
   view.asked_protocol = n.protocol;
   view.asked_phase = n.proposal.phase;
@@ -139,7 +160,8 @@ void Model::number(const Endpoint& to, ProviderView& view, const ProtocolNotific
   auto joined = [&](const auto& p) {
     return p.second.group == view.group && p.second.state == ProviderView::State::kJoined;
   };
-  const bool born_again = n.seqnum == 1 && last > 1;
+  const bool born_again = n.seqnum == 1 && (last > 1 || !event_.contains(view.group));
+  if (born_again) phases_.erase(view.group);
   if (born_again && std::any_of(providers_.begin(), providers_.end(), joined))
     error(to, "sees the numbers start again in a group with members");
   if (n.seqnum != last && n.seqnum != last + 1 && !born_again)
@@ -170,6 +192,16 @@ void Model::same_for_all(const std::string& group, const ProtocolNotification& n
   phase_over(group, n);
 }
 
+bool Model::anybody_to_ask(const std::string& group, const ProtocolNotification& n) const {
+  return std::any_of(providers_.begin(), providers_.end(), [&](const auto& p) {
+    const ProviderView& view = p.second;
+    const bool changes = contains(n.proposal.changing_providers, view.id);
+    if (view.group != group) return false;
+    if (n.protocol == WYX_JOIN && changes) return true;
+    return view.state == ProviderView::State::kJoined && !(changes && takes_out(n.protocol));
+  });
+}
+
 /// An outcome must be one that the votes allow, and no phase ends while a vote is missing unless time is over.
 void Model::phase_over(const std::string& group, const ProtocolNotification& n) {
   Phase& phase = phases_[group];
@@ -179,7 +211,7 @@ void Model::phase_over(const std::string& group, const ProtocolNotification& n) 
     const bool by_default = n.summary & WYX_DEFAULT_REJECT;
     if (n.type == WYX_APPROVED_NOTIFICATION) {
       if (preventable && phase.reject) errors_ += event + " approves what was rejected\n";
-      if (phase.go_on && !phase.reject && !by_default)
+      if (phase.go_on && !phase.reject && !by_default && anybody_to_ask(group, n))
         errors_ += event + " approves where a voter said continue\n";
     }
     if (n.type == WYX_REJECTED_NOTIFICATION && !phase.reject && !by_default)
@@ -191,6 +223,7 @@ void Model::phase_over(const std::string& group, const ProtocolNotification& n) 
       if (view.group == group) view.asked = false;
     }
   }
+  timers_.erase(group);
   phase = {};
   phase.open = n.type == WYX_N_PHASE_NOTIFICATION;
 }
@@ -299,6 +332,7 @@ void Model::check_groups(const Engine& engine) {
   for (const auto& [endpoint, view] : providers_)
     if (!groups.contains(view.group)) error(endpoint, "is left in a group that is no more");
   std::erase_if(seqnum_, [&](const auto& s) { return !groups.contains(s.first); });
+  std::erase_if(timers_, [&](const auto& t) { return !groups.contains(t.first); });
   std::erase_if(phases_, [&](const auto& p) { return !groups.contains(p.first); });
   check_subscribers(groups);
 }

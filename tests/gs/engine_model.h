@@ -57,8 +57,8 @@ class Model {
   void before(const RequestEvent& event, const Outcome& outcome);
   void before(const SessionGoneEvent& event, const Outcome& outcome);
   void before(const HostGoneEvent& event, const Outcome& outcome);
-  void before(const HostCameEvent&, const Outcome&) {}
-  void before(const TimerExpiredEvent&, const Outcome&) {}
+  void before(const HostCameEvent& event, const Outcome&) { gone_hosts_.erase(event.node); }
+  void before(const TimerExpiredEvent& event, const Outcome& outcome);
   void before(const ResponsivenessEvent&, const Outcome&) {}
   void accept(const SessionId& session, const Request& request);
   void accept_vote(const Endpoint& voter, const VoteRequest& request);
@@ -71,7 +71,9 @@ class Model {
   void receive(const Endpoint& to, const DelayedErrorNotification& n);
   void number(const Endpoint& to, ProviderView& view, const ProtocolNotification& n);
   void same_for_all(const std::string& group, const ProtocolNotification& n);
+  void follow_timers(const Outcome& outcome);
   void phase_over(const std::string& group, const ProtocolNotification& n);
+  bool anybody_to_ask(const std::string& group, const ProtocolNotification& n) const;
   void close(const Endpoint& to, ProviderView& view, const ProtocolNotification& n);
   void new_members(const Endpoint& to, ProviderView& view, const Proposal& p);
   void parts_match_bits(const Endpoint& to, const ProtocolNotification& n);
@@ -91,7 +93,8 @@ class Model {
   std::map<std::string, const ProtocolNotification*> event_;  // this step's last event of each group
   std::optional<DelayedErrorNotification> refused_;           // must come in this step, to refused_to_
   Endpoint refused_to_;
-  bool timer_ = false;  // this step is an expiry
+  std::map<std::string, TimerId> timers_;  // of each group's open phase, when it has a limit
+  bool timer_ = false;                     // this step is the expiry of one of them
 };
 
 }  // namespace gs::test

@@ -144,9 +144,12 @@ TEST_F(EngineVoting, Expiry_of_a_phase_or_group_that_is_over_changes_nothing) {
   expire(timers[0]);
   EXPECT_EQ(engine.digest(), before);
   vote_all({1, 2}, WYX_VOTE_APPROVE);
+  change_state(1, "y", {WYX_N_PHASE, 5});
+  expire(timers[0]);
+  EXPECT_EQ(last.deliveries.size(), 0u) << "the first phase of another protocol";
   dies(1);
   dies(2);
-  expire(timers[1]);
+  expire(timers[2]);
   EXPECT_EQ(last.deliveries.size(), 0u);
 }
 
