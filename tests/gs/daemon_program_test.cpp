@@ -196,7 +196,7 @@ TEST(DaemonProgram, SigtermWithAClientThatTakesNothing_StillEnds) {
 
 TEST(DaemonProgram, SecondInstance_IsRefusedWithAClearLineAndTheFirstServesOn) {
   GsdProcess gsd;
-  const GsdRun second = run_gsd({"--socket", gsd.socket_path()});
+  const GsdRun second = run_gsd({"--socket-path", gsd.socket_path()});
   EXPECT_EQ(second.status, 1);
   EXPECT_EQ(second.err,
             "gsd: another gsd (pid " + std::to_string(gsd.pid()) + ") already serves " + gsd.socket_path() + "\n");
@@ -218,7 +218,7 @@ TEST(DaemonProgram, SocketOfAKilledDaemon_IsReplaced) {
 TEST(DaemonProgram, PathOfSomethingElse_IsLeftAlone) {
   TempDir dir;
   std::ofstream(dir / "precious") << "data";
-  const GsdRun run = run_gsd({"--socket", dir / "precious"});
+  const GsdRun run = run_gsd({"--socket-path", dir / "precious"});
   EXPECT_EQ(run.status, 1);
   EXPECT_EQ(run.err, "gsd: " + (dir / "precious") + " exists and is not a socket\n");
   EXPECT_TRUE(std::ifstream(dir / "precious").good());
@@ -243,7 +243,7 @@ TEST(DaemonOptions, HelpAndVersion_AreAnsweredOnStandardOutput) {
   const GsdRun help = run_gsd({"--help"});
   EXPECT_EQ(help.status, 0);
   for (const char* option :
-       {"--config", "--socket", "--access-group", "--node-number", "--queue-bound", "--log-level"}) {
+       {"--config", "--socket-path", "--access-group", "--node-number", "--queue-bound", "--log-level"}) {
     EXPECT_THAT(help.out, HasSubstr(option));
   }
 }
@@ -256,7 +256,7 @@ TEST(DaemonOptions, WrongOption_IsOneLineAndStatusTwo) {
       {{"--queue-bound", "1k"}, "--queue-bound: must be"},
       {{"--log-level", "loud"}, "--log-level: must be error, warning, info or debug"},
       {{"--access-group", "no such group"}, "--access-group: there is no group 'no such group'"},
-      {{"--socket", std::string(108, 's')}, "--socket: must be a path of 1 to 107 characters"},
+      {{"--socket-path", std::string(108, 's')}, "--socket-path: must be a path of 1 to 107 characters"},
       {{"--config", "/nonexistent/gsd.toml"}, "/nonexistent/gsd.toml: cannot be read: No such file or directory"},
   };
   for (const auto& [arguments, what] : cases) {
@@ -289,7 +289,7 @@ class DaemonConfig : public testing::Test {
 
 TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const std::string path = write(
-      "socket = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\nlog-level = "
+      "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\nlog-level = "
       "\"debug\"\n");
   const char* argv[] = {"gsd", "--config", path.c_str(), "--node-number", "13"};
   const auto options = parse_options(5, argv);
@@ -302,12 +302,12 @@ TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
 }
 
 TEST_F(DaemonConfig, WrongFile_IsNamedWithItsLine) {
-  EXPECT_EQ(error_of("\nsocket = 3\n"), ":2: socket: must be a text in quotes");
+  EXPECT_EQ(error_of("\nsocket-path = 3\n"), ":2: socket-path: must be a text in quotes");
   EXPECT_EQ(error_of("node-number = \"3\"\n"), ":1: node-number: must be a whole number");
   EXPECT_EQ(error_of("\n\nnode-number = -1\n"),
             ":3: node-number: must be a whole number from 0 to 32767, not '-1'");
   EXPECT_EQ(error_of("colour = 3\n"), ":1: unknown setting 'colour'");
-  EXPECT_THAT(error_of("socket = \"/x\"\nsocket = \"/y\"\n"), HasSubstr(":2: "));
+  EXPECT_THAT(error_of("socket-path = \"/x\"\nsocket-path = \"/y\"\n"), HasSubstr(":2: "));
   EXPECT_THAT(error_of("log-level = \"info\"\nnode-number = = 3\n"), HasSubstr(":2: "));
   EXPECT_EQ(run_gsd({"--config", write("node-number = 99999\n")}).status, 2);
 }

@@ -78,7 +78,7 @@ GsdProcess::~GsdProcess() {
 void GsdProcess::start() {
   int ready[2];
   if (pipe2(ready, O_CLOEXEC) != 0) throw std::runtime_error("pipe2");
-  std::vector<std::string> all = {"--socket", socket_path(), "--ready-fd", "3"};
+  std::vector<std::string> all = {"--socket-path", socket_path(), "--ready-fd", "3"};
   all.insert(all.end(), arguments_.begin(), arguments_.end());
   pid_ = spawn_gsd(all, dir_ / "out", dir_ / "err", ready[1]);
   close(ready[1]);

@@ -85,7 +85,7 @@ struct Setting {
   Problem (*set)(Options&, const std::string&);
 };
 constexpr Setting kSettings[] = {
-    {"socket", "PATH", false, "Socket to listen on", set_socket_path},
+    {"socket-path", "PATH", false, "Socket to listen on", set_socket_path},
     {"access-group", "GROUP", false, "Unix group whose members may be clients (none: the owner alone)",
      set_access_group},
     {"node-number", "N", true, "Number of this node, 0 to 32767", set_node_number},
