@@ -122,11 +122,11 @@ void Model::before(const TimerExpiredEvent& event, const Outcome& outcome) {
 void Model::follow_timers(const Outcome& outcome) {
   for (const TimerRequest& timer : outcome.timers) timers_[timer.id.group] = timer.id;
   for (const auto& [group, note] : event_) {
-    const auto asked = std::find_if(outcome.timers.rbegin(), outcome.timers.rend(),
-                                    [&](const TimerRequest& t) { return t.id.group == group; });
-    const std::uint16_t seconds = asked == outcome.timers.rend() ? 0 : asked->seconds;
-    if (note->type == WYX_N_PHASE_NOTIFICATION && note->time_limit != seconds)
-      errors_ += group + ": the phase has another time limit than its timer\n";
+    if (note->type != WYX_N_PHASE_NOTIFICATION) continue;
+    std::uint16_t seconds = 0;
+    for (const TimerRequest& timer : outcome.timers)
+      if (timer.id.group == group) seconds = timer.seconds;
+    if (note->time_limit != seconds) errors_ += group + ": the phase has another time limit than its timer\n";
   }
 }
 
