@@ -2,7 +2,7 @@
 
 #include "support/client_fixture.h"
 
-namespace zn_test {
+namespace test_support {
 namespace {
 
 constexpr unsigned kProposedState = WYX_PROPOSED_STATE_VALUE | WYX_CURRENT_STATE_VALUE;
@@ -23,7 +23,7 @@ class ClientFlow : public ClientTest {
         fd(), [&] { return recorder().count(first, type) >= times && recorder().count(second, type) >= times; });
   }
 
-  Group group{unique("flow")};
+  Group group{"flow"};
   wyx_token_t first = -1;
   wyx_token_t second = -1;
 };
@@ -59,7 +59,7 @@ TEST_P(ClientFlow, Join_refused_leavesNothingBehind) {
 }
 
 TEST_P(ClientFlow, Join_rejectedByAVote_endsTheJoinersToken) {
-  Group voted(unique("voted"));
+  Group voted("voted");
   voted.attributes.gs_num_phases = WYX_N_PHASE;
   recorder().set_hook([&](const Seen& seen) {
     if (seen.type == WYX_N_PHASE_NOTIFICATION) {
@@ -213,7 +213,7 @@ TEST_P(ClientFlow, Subscriber_seesStateAndMembershipUntilTheGroupEnds) {
   ASSERT_EQ(change_state(first, "seen"), WYX_OK);
   ASSERT_TRUE(both_see(WYX_APPROVED_NOTIFICATION));
   wyx_token_t watcher = -1;
-  EXPECT_EQ(subscribe(unique("nobody"), WYX_SUBSCRIBE_STATE, &watcher), WYX_UNKNOWN_GROUP);
+  EXPECT_EQ(subscribe("nobody", WYX_SUBSCRIBE_STATE, &watcher), WYX_UNKNOWN_GROUP);
   ASSERT_EQ(subscribe(group.name, WYX_SUBSCRIBE_STATE_AND_MEMBERSHIP, &watcher), WYX_OK);
   ASSERT_TRUE(dispatch_until(fd(), [&] { return recorder().of(watcher).size() == 1; }));
   EXPECT_EQ(recorder().of(watcher)[0].state, "seen");
@@ -260,4 +260,4 @@ TEST_P(ClientFlow, VoteResults_collected_travelWithTheApproval) {
 INSTANTIATE_TEST_SUITE_P(Endpoints, ClientFlow, kEndpoints, endpoint_name);
 
 }  // namespace
-}  // namespace zn_test
+}  // namespace test_support

@@ -10,19 +10,23 @@
 #include <string>
 
 #include "support/group_requests.h"
+#include "support/gsd_process.h"
 
-namespace zn_test {
+namespace test_support {
 
-enum class EndpointKind { kEmbedded };
+enum class EndpointKind { kEmbedded, kDaemon };
 
-inline const auto kEndpoints = testing::Values(EndpointKind::kEmbedded);
+inline const auto kEndpoints = testing::Values(EndpointKind::kEmbedded, EndpointKind::kDaemon);
 
-inline std::string endpoint_name(const testing::TestParamInfo<EndpointKind>&) { return "Embedded"; }
+inline std::string endpoint_name(const testing::TestParamInfo<EndpointKind>& info) {
+  return info.param == EndpointKind::kEmbedded ? "Embedded" : "Daemon";
+}
 
 class ClientTest : public testing::TestWithParam<EndpointKind> {
  protected:
   void SetUp() override {
-    setenv("GSD_ENDPOINT", "embedded:", 1);
+    if (GetParam() == EndpointKind::kDaemon) daemon_ = std::make_unique<GsdProcess>();
+    setenv("GSD_ENDPOINT", daemon_ ? daemon_->endpoint().c_str() : "embedded:", 1);
     recorder().reset();
     const SetupResult opened = setup();
     ASSERT_EQ(opened.rc, WYX_OK);
@@ -35,10 +39,10 @@ class ClientTest : public testing::TestWithParam<EndpointKind> {
 
   static Recorder& recorder() { return Recorder::get(); }
   int fd() const { return descriptor_; }
-  static std::string unique(const std::string& name) { return name; }
 
  private:
+  std::unique_ptr<GsdProcess> daemon_;
   int descriptor_ = -1;
 };
 
-}  // namespace zn_test
+}  // namespace test_support

@@ -12,7 +12,7 @@
 
 #include "client/wyx_entry_points.h"
 
-namespace zn_test {
+namespace test_support {
 
 inline constexpr auto kHang = std::chrono::seconds(60);  // longer than anything takes that works
 
@@ -240,4 +240,4 @@ inline bool dispatch_until(int descriptor, const std::function<bool()>& done) {
   return true;
 }
 
-}  // namespace zn_test
+}  // namespace test_support

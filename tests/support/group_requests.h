@@ -5,7 +5,7 @@
 
 #include "support/group_recorder.h"
 
-namespace zn_test {
+namespace test_support {
 
 struct SetupResult {
   wyx_rc_t rc = WYX_NOT_OK;
@@ -83,4 +83,4 @@ inline wyx_rc_t vote(wyx_token_t token, wyx_vote_value_t value) {
   return wyx_vote(token, value, nullptr, nullptr, WYX_NULL_VOTE);
 }
 
-}  // namespace zn_test
+}  // namespace test_support

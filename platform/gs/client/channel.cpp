@@ -88,8 +88,7 @@ Channel::Got Channel::receive(int flags, wire::ServerMessage* message) {
     *message = std::move(*taken);
     return Got::kMessage;
   }
-  record_failure("malformed", EPROTO);
-  return Got::kEnd;
+  return Got::kMalformed;
 }
 
 void Channel::shut_down() { shutdown(fd_, SHUT_RDWR); }

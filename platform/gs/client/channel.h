@@ -13,7 +13,7 @@ namespace gs::client {
 /// thread's. No signal is ever raised. Descriptors are closed on exec.
 class Channel {
  public:
-  enum class Got { kMessage, kNothing, kEnd };
+  enum class Got { kMessage, kNothing, kEnd, kMalformed };
 
   /// Seconds: a daemon that takes no connection and answers no greeting or farewell for so long counts as not
   /// there.
@@ -36,8 +36,8 @@ class Channel {
 
   /// False: the other side is gone.
   bool send(const wire::ClientMessage& message);
-  /// `flags` as for recv: MSG_DONTWAIT answers kNothing instead of waiting. kEnd: the other side is gone, or what
-  /// it said makes no sense (recorded).
+  /// `flags` as for recv: MSG_DONTWAIT answers kNothing instead of waiting. kEnd: the other side is gone.
+  /// kMalformed: what it said makes no sense.
   Got receive(int flags, wire::ServerMessage* message);
   /// The next message, which must be a T. Nothing: it is not, or the other side is gone.
   template <typename T>

@@ -59,7 +59,8 @@ wyx_rc_t open_session(const SetupOptions& options, wyx_descriptor_t* descriptor)
   auto transport = open_transport(options, &rc);
   if (!transport) return rc;
   auto session = std::make_shared<Session>(std::move(transport), options.routines);
-  rc = session->set_responsiveness(options.responsiveness);
+  const bool checked = options.responsiveness.gs_responsiveness_type != WYX_NO_RESPONSIVENESS;
+  if (checked) rc = session->set_responsiveness(options.responsiveness);
   const wyx_descriptor_t opened = session->descriptor();
   if (rc == WYX_OK && !install(session)) rc = WYX_EXISTS;
   if (session) session->quit();  // ours, refused or not wanted, or the one that it has replaced

@@ -116,7 +116,7 @@ Incoming SocketTransport::take() {
     if (const auto* ping = std::get_if<wire::Ping>(&message))
       return {Incoming::Kind::kPing, -1, nullptr, ping->number};
   }
-  lose(got == Channel::Got::kMessage && std::holds_alternative<wire::Farewell>(message) ? "farewell" : "events");
+  lose(got == Channel::Got::kEnd ? "hang-up" : got == Channel::Got::kMessage ? "farewell" : "malformed");
   return {Incoming::Kind::kGone, -1, nullptr, 0};
 }
 

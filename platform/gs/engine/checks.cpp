@@ -38,10 +38,11 @@ wyx_rc_t check_attributes(const GroupAttributes& a) {
   if (!a.source_group_name.empty()) return WYX_NOT_SUPPORTED;
   constexpr std::uint32_t kBatchFlags = WYX_BATCH_BOTH | WYX_DEACTIVATE_ON_FAILURE | WYX_COLLECT_ALL_RESULT;
   const bool in_range = (static_cast<std::uint32_t>(a.batch_control) & ~kBatchFlags) == 0 &&
-                        valid_phases(a.num_phases) && a.source_reflection_num_phases <= WYX_N_PHASE &&
+                        valid_phases(a.num_phases) && a.source_reflection_num_phases >= 0 &&
+                        a.source_reflection_num_phases <= WYX_N_PHASE &&
                         (a.default_vote == WYX_NULL_VOTE || a.default_vote == WYX_VOTE_APPROVE ||
                          a.default_vote == WYX_VOTE_REJECT) &&
-                        a.merge_control <= WYX_LAST_MERGE_TYPE;
+                        a.merge_control >= WYX_FIRST_MERGE_TYPE && a.merge_control <= WYX_LAST_MERGE_TYPE;
   return in_range ? WYX_OK : WYX_BAD_GROUP_ATTRIBUTES;
 }
 
