@@ -4,7 +4,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 
-#include "gscl/GSConditionGuard.h"
+#include "gscl/GSCondition_internal.h"
 
 namespace zelt_gscl_V1 {
 

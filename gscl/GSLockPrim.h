@@ -109,12 +109,12 @@ class ZN_GSCL_EXPORT GSMutexLock {
   int unlock();
 
  private:
-  void writemsg(const char*) {}
-  int waitForRelease(const timespec* abstime);
-  void passOn();
-  void signalRelease();
-  static void cancelledInWait(void* self);
-  static void cancelledInSignal(void* self);
+  ZN_GSCL_HIDDEN void writemsg(const char*) {}
+  ZN_GSCL_HIDDEN int waitForRelease(const timespec* abstime);
+  ZN_GSCL_HIDDEN void passOn();
+  ZN_GSCL_HIDDEN void signalRelease();
+  ZN_GSCL_HIDDEN static void cancelledInWait(void* self);
+  ZN_GSCL_HIDDEN static void cancelledInSignal(void* self);
 
   GSBaseMutex _mutex;  // guards all other fields; held inside the operations only, never by a holder of the lock
   GSBaseCondition _cond;  // where contenders wait; signalled by the last unlock
@@ -149,12 +149,12 @@ class ZN_GSCL_EXPORT GSRWLockImpl {
   int Unlock();
 
  private:
-  void writemsg(const char*) {}
-  int waitToRead(const timespec* abstime);
-  int waitToWrite(const timespec* abstime);
-  void writerGivesUp();
-  static void cancelledReader(void* self);
-  static void cancelledWriter(void* self);
+  ZN_GSCL_HIDDEN void writemsg(const char*) {}
+  ZN_GSCL_HIDDEN int waitToRead(const timespec* abstime);
+  ZN_GSCL_HIDDEN int waitToWrite(const timespec* abstime);
+  ZN_GSCL_HIDDEN void writerGivesUp();
+  ZN_GSCL_HIDDEN static void cancelledReader(void* self);
+  ZN_GSCL_HIDDEN static void cancelledWriter(void* self);
 
   GSBaseMutex _mutex;          // guards all counters and _holder; held inside the operations only
   GSBaseCondition _readcond;   // where readers wait; broadcast when the last waiting writer is out of the way

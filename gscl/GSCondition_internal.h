@@ -1,6 +1,6 @@
 // Inside the library only: a look at some state and the start of the wait for its change, as one step.
-#ifndef GSCL_GSCONDITIONGUARD_H
-#define GSCL_GSCONDITIONGUARD_H
+#ifndef GSCL_GSCONDITION_INTERNAL_H
+#define GSCL_GSCONDITION_INTERNAL_H
 
 #include "gscl/GSLockPrim.h"
 

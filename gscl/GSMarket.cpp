@@ -1,0 +1,52 @@
+#include "gscl/GSMarket.h"
+
+#include "gscl/GSCondition_internal.h"
+#include "gscl/trace.h"
+
+namespace zelt_gscl_V1 {
+
+static_assert(sizeof(GSMarket) == 64, "fixed layout");
+
+GSMarket::GSMarket(int n) : _queue(n), _cond(new GSCondition), _running(1) {}
+
+GSMarket::~GSMarket() { delete _cond; }
+
+void GSMarket::stopMarket() {
+  GS_DEBUG(GSCL_TRC_API, "GSMarket::stopMarket \n");
+  _running = 0;
+  _cond->broadcast();
+}
+
+void GSMarket::resumeMarket() {
+  GS_DEBUG(GSCL_TRC_API, "GSMarket::resumeMarket \n");
+  _running = 1;
+  _cond->broadcast();
+}
+
+int GSMarket::produce(GSObject* obj) {
+  const int count = _queue.enqueue(obj);
+  _cond->broadcast();
+  return count;
+}
+
+GSObject* GSMarket::take() {
+  GSObject* obj = nullptr;
+  _queue.dequeue(&obj);
+  return obj;
+}
+
+GSObject* GSMarket::consume(const timespec* abstime) {
+  // On arrival an object is taken whether the market is running or not, without the condition's mutex.
+  if (GSObject* obj = take()) return obj;
+  GSConditionGuard guard(*_cond);
+  for (bool waited = false;; waited = true) {
+    if (_running == 0) return waited ? nullptr : take();
+    if (GSObject* obj = take()) return obj;
+    if (guard.wait(abstime) != 0) return nullptr;
+  }
+}
+
+int GSMarket::IsRunning() { return _running; }
+int GSMarket::QueueCount() { return _queue.count(); }
+
+}  // namespace zelt_gscl_V1
