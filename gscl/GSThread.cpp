@@ -13,13 +13,13 @@
 #include "gscl/trace.h"
 #include "zn_cu.h"
 
-using gscl_internal::ControlRef;
 using gscl_internal::ThreadControl;
 using zelt_gscl::GS_THREAD_IDLE;
 using zelt_gscl::GS_THREAD_RUNNING;
 
 static_assert(sizeof(zelt_gscl_V1::GSThread) == 16 && sizeof(zelt_gscl_V2::GSThread) == 16, "fixed layout");
-static_assert(sizeof(GSxThreadData) == 32 + sizeof(zelt_gscl_V1::GSIntegerEventQueue) + sizeof(ControlRef),
+static_assert(sizeof(GSxThreadData) ==
+                  32 + sizeof(zelt_gscl_V1::GSIntegerEventQueue) + sizeof(std::shared_ptr<ThreadControl>),
               "the fixed fields, and the control behind them");
 
 namespace {
@@ -30,7 +30,7 @@ using RunFunction = void* (*)(zelt_gscl_V1::GSThread*, void*);
 
 /// What a new thread needs to begin; it owns it.
 struct Launch {
-  ControlRef control;
+  std::shared_ptr<ThreadControl> control;
   zelt_gscl_V1::GSThread* thread;
   RunFunction run;
   void* args;
@@ -159,6 +159,12 @@ GSThread::GSThread(size_t stacksize) : innerData(nullptr) {
 }
 
 GSThread::~GSThread() {
+  if (innerData != nullptr) finish();
+}
+
+// The work of the destructor. The first one of the library's classes does it, so that virtual functions of the
+// second version are still in place while `run` is on its way out.
+void GSThread::finish() {
   const CancellationOff off;
   GSxThreadData& data = dataOf(innerData);
   pthread_t tid = data.tid;
@@ -166,7 +172,7 @@ GSThread::~GSThread() {
     GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread this=%x tid=%x, self=%x", low32(this), low32(tid),
              low32(pthread_self()));
   });
-  const ControlRef control = data.control;
+  const std::shared_ptr<ThreadControl> control = data.control;
   ThreadControl::Phase phase;
   {
     std::lock_guard<std::mutex> lock(control->mutex);
@@ -179,6 +185,7 @@ GSThread::~GSThread() {
     control->data = nullptr;
   }
   delete &data;
+  innerData = nullptr;
 }
 
 // The part of the destructor for an object that has, or had, a thread that is not detached.
@@ -280,10 +287,10 @@ int GSThread::stop() {
 }
 
 int GSThread::join(void** result) {
-  const ControlRef control = dataOf(innerData).control;
+  const std::shared_ptr<ThreadControl> control = dataOf(innerData).control;
   if (const int rc = beginJoin(*control)) return rc;
   int rc = 0;
-  pthread_cleanup_push(joinCancelled, &*control);
+  pthread_cleanup_push(joinCancelled, control.get());
   rc = pthread_join(control->id, result);
   pthread_cleanup_pop(0);
   std::lock_guard<std::mutex> lock(control->mutex);
@@ -320,7 +327,7 @@ GSString getTraceIdStr(GSThread* thread) {
 namespace zelt_gscl_V2 {
 
 GSThread::GSThread(size_t stacksize) : zelt_gscl_V1::GSThread(stacksize) {}
-GSThread::~GSThread() = default;
+GSThread::~GSThread() { finish(); }
 
 int GSThread::waitSyncEvent(int* e, int secs, int usecs) {
   return dataOf(getInnerData()).sync_events.wait_event(e, secs, usecs);

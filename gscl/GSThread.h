@@ -16,6 +16,10 @@ enum GSThreadState : int { GS_THREAD_IDLE = 0, GS_THREAD_RUNNING = 1 };
 
 }  // namespace zelt_gscl
 
+namespace zelt_gscl_V2 {
+class GSThread;
+}
+
 namespace zelt_gscl_V1 {
 
 typedef zelt_gscl::GSThreadState GSThreadState;
@@ -94,9 +98,11 @@ class ZN_GSCL_EXPORT GSThread {
   static void* stub_create_run_me(void* launch);
   ZN_GSCL_HIDDEN int finishEarlier();
   ZN_GSCL_HIDDEN int launch(void* args, pthread_t* id);
+  ZN_GSCL_HIDDEN void finish();
   ZN_GSCL_HIDDEN void letGo(pthread_t tid);
+  friend class zelt_gscl_V2::GSThread;
 
-  void* innerData;  // GSxThreadData, owned
+  void* innerData;  // GSxThreadData, owned; null once a destructor has let the thread go
 };
 
 /// The identification of a thread object in trace lines: "Thread[T=%d]" with its id, cut to an int. Any thread.

@@ -5,6 +5,7 @@
 #include <pthread.h>
 
 #include <atomic>
+#include <memory>
 #include <mutex>
 
 #include "gscl/GSQueue.h"
@@ -29,26 +30,6 @@ struct ThreadControl {
   pthread_t id{};        // valid unless phase is kNone
   bool stopped = false;  // cancelled by stop
   bool ended = false;    // the thread is past its last use of anything here; its id may soon be another thread's
-
- private:
-  friend class ControlRef;
-  std::atomic<int> _references{0};
-};
-
-/// Shared ownership of a control. (A std::shared_ptr would put names of the standard library among our exports.)
-class ControlRef {
- public:
-  explicit ControlRef(ThreadControl* control) : _control(control) { ++_control->_references; }
-  ControlRef(const ControlRef& other) : ControlRef(other._control) {}
-  ControlRef& operator=(const ControlRef&) = delete;
-  ~ControlRef() {
-    if (--_control->_references == 0) delete _control;
-  }
-  ThreadControl& operator*() const { return *_control; }
-  ThreadControl* operator->() const { return _control; }
-
- private:
-  ThreadControl* _control;
 };
 
 }  // namespace gscl_internal
@@ -56,7 +37,8 @@ class ControlRef {
 /// The fields that a thread object shows through its operations. Written by the owner and by the thread, read by
 /// anybody: the shared ones are atomic.
 struct GSxThreadData {
-  explicit GSxThreadData(size_t stack) : stacksize(stack), control(new gscl_internal::ThreadControl) {}
+  explicit GSxThreadData(size_t stack)
+      : stacksize(stack), control(std::make_shared<gscl_internal::ThreadControl>()) {}
 
   std::atomic<pthread_t> tid{~pthread_t{0}};  // all bits set: none
   size_t stacksize;                           // bytes; 0: the default
@@ -65,7 +47,7 @@ struct GSxThreadData {
   std::atomic<int> detachstate{PTHREAD_CREATE_JOINABLE};
   zelt_gscl_V1::GSIntegerEventQueue sync_events;
 
-  gscl_internal::ControlRef control;
+  std::shared_ptr<gscl_internal::ThreadControl> control;
 };
 
 #endif

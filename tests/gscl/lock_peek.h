@@ -89,7 +89,9 @@ class CancellableThread {
   CancellableThread(const CancellableThread&) = delete;
   CancellableThread& operator=(const CancellableThread&) = delete;
 
-  void cancel() { pthread_cancel(_thread); }
+  void cancel() {
+    if (!_joined) pthread_cancel(_thread);
+  }
   /// True when the thread ended by cancellation.
   bool join() {
     if (!_joined) pthread_join(_thread, &_result);

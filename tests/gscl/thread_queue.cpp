@@ -103,7 +103,7 @@ TEST(EventQueue, failedGrowth_postsNothing) {
   expectFailedGrowthChangesNothing([&](int i) { queue.post_event(i); }, [&] { return queue.count(); });
 }
 
-TEST(Market, failedGrowth_producesNothing) {
+TEST(MarketGrowth, failedGrowth_producesNothing) {
   GSMarket market(0);
   GSObject object;
   expectFailedGrowthChangesNothing([&](int) { market.produce(&object); }, [&] { return market.QueueCount(); });

@@ -31,7 +31,7 @@ class Tally {
   int count() const { return _count; }
 
  private:
-  std::vector<std::atomic<int>> _taken{kItems};
+  std::vector<std::atomic<int>> _taken = std::vector<std::atomic<int>>(kItems);
   std::atomic<int> _count{0};
 };
 
