@@ -75,5 +75,5 @@ int main(int argc, char** argv) {
   int status = -1;
   while (waitpid(init, &status, 0) == -1 && errno == EINTR) {
   }
-  return WIFEXITED(status) ? WEXITSTATUS(status) : 1;
+  _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 1);
 }
