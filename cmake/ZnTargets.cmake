@@ -3,7 +3,8 @@
 add_library(zn_options INTERFACE)
 target_compile_options(zn_options INTERFACE -Wall -Wextra -Wpedantic -Wshadow -Werror
                        $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety -Werror=thread-safety>)
-target_include_directories(zn_options INTERFACE ${PROJECT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/platform/cu
+target_include_directories(zn_options INTERFACE ${PROJECT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/platform
+                           ${PROJECT_SOURCE_DIR}/platform/cu
                            ${PROJECT_SOURCE_DIR}/platform/kpl
                            ${PROJECT_SOURCE_DIR}/platform/gs)
 if(ZN_SANITIZE)

@@ -1,7 +1,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "daemon/access.h"
+#include "common/access.h"
 #include "daemon/session_layer.h"
 #include "gs/daemon_memory.h"
 
@@ -356,8 +356,8 @@ TEST_F(DaemonSession, VoteThatDoesNotCome_IsDecidedByTheGroupsDefaultAfterTheTim
 // ------------------------------------------------------------------------------------------------------- access
 
 TEST(DaemonAccess, OwnerRootAndGroupMembers_AreAllowedAndNobodyElse) {
-  const AccessRule owner_only{1000, std::nullopt};
-  const AccessRule with_group{1000, 50};
+  const platform::AccessRule owner_only{1000, std::nullopt};
+  const platform::AccessRule with_group{1000, 50};
   EXPECT_TRUE(owner_only.allows({1, 1000, 1, {}}));
   EXPECT_TRUE(owner_only.allows({1, 0, 0, {}}));
   EXPECT_FALSE(owner_only.allows({1, 1001, 50, {50}}));

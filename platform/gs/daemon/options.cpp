@@ -1,35 +1,25 @@
 #include "daemon/options.h"
 
-#include <grp.h>
 #include <sys/un.h>
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
-#include <cerrno>
-#include <charconv>
-#include <cstring>
-#include <fstream>
 #include <iostream>
 #include <iterator>
-#include <sstream>
-#include <toml.hpp>
+
+#include "common/toml_file.h"
 
 namespace gs::daemon {
 namespace {
 
+using platform::first_line;
+using platform::place_of;
+using platform::Problem;
+using platform::set_number;
+
 constexpr std::uint64_t kMaxNode = 32767;
 constexpr std::uint64_t kMinQueueBound = 64 * 1024;
 constexpr std::uint64_t kMaxQueueBound = std::uint64_t{1} << 40;
-
-/// What is wrong with a setting's text; empty: nothing.
-using Problem = std::string;
-
-Problem set_number(const std::string& text, std::uint64_t min, std::uint64_t max, std::uint64_t* value) {
-  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), *value);
-  if (error == std::errc() && end == text.data() + text.size() && *value >= min && *value <= max) return {};
-  return "must be a whole number from " + std::to_string(min) + " to " + std::to_string(max) + ", not '" + text +
-         "'";
-}
 
 Problem set_socket_path(Options& options, const std::string& text) {
   constexpr std::size_t kLongest = sizeof(sockaddr_un::sun_path) - 1;
@@ -41,7 +31,7 @@ Problem set_socket_path(Options& options, const std::string& text) {
 }
 Problem set_access_group(Options& options, const std::string& text) {
   try {
-    group_id(text);
+    platform::group_id(text);
   } catch (const OptionError& error) {
     return error.what();
   }
@@ -93,44 +83,11 @@ constexpr Setting kSettings[] = {
     {"log-level", "LEVEL", false, "error, warning, info or debug", set_log_level},
 };
 
-std::string first_line(const std::string& text) { return text.substr(0, text.find('\n')); }
-
-std::string at(const toml::source_location& where) {
-  return where.file_name() + ":" + std::to_string(where.line());
-}
-
-/// The parser's own words without its "[error] toml::function: " before and its drawing of the line after.
-std::string syntax_problem(const std::string& message) {
-  std::string what = first_line(message);
-  if (what.starts_with("[error] ")) what.erase(0, what.find(' ') + 1);
-  if (what.starts_with("toml::") && what.find(": ") != std::string::npos) what.erase(0, what.find(": ") + 2);
-  return what;
-}
-
-std::string content_of(const std::string& path) {
-  errno = 0;
-  std::ifstream file(path, std::ios::binary);
-  std::string content{std::istreambuf_iterator<char>(file), {}};
-  if (errno != 0) throw OptionError(path + ": cannot be read: " + strerror(errno));
-  return content;
-}
-
-toml::value parse_file(const std::string& path) {
-  std::istringstream content(content_of(path));
-  try {
-    return toml::parse(content, path);
-  } catch (const toml::syntax_error& error) {
-    throw OptionError(at(error.location()) + ": " + syntax_problem(error.what()));
-  } catch (const std::exception& error) {
-    throw OptionError(path + ": " + first_line(error.what()));
-  }
-}
-
 void apply(const std::string& name, const toml::value& value, Options& options) {
-  const std::string where = at(value.location()) + ": " + name + ": ";
+  const std::string where = place_of(value) + ": " + name + ": ";
   const auto* setting =
       std::find_if(std::begin(kSettings), std::end(kSettings), [&](const Setting& s) { return name == s.name; });
-  if (setting == std::end(kSettings)) throw OptionError(at(value.location()) + ": unknown setting '" + name + "'");
+  if (setting == std::end(kSettings)) throw OptionError(place_of(value) + ": unknown setting '" + name + "'");
   if (setting->number ? !value.is_integer() : !value.is_string()) {
     throw OptionError(where + (setting->number ? "must be a whole number" : "must be a text in quotes"));
   }
@@ -148,17 +105,8 @@ void parse_ready_fd(const std::string& text, Options& options) {
 
 }  // namespace
 
-std::optional<std::uint32_t> group_id(const std::string& access_group) {
-  if (access_group.empty()) return std::nullopt;
-  std::uint64_t number = 0;
-  if (set_number(access_group, 0, UINT32_MAX - 1, &number).empty()) return static_cast<std::uint32_t>(number);
-  const group* found = getgrnam(access_group.c_str());
-  if (found == nullptr) throw OptionError("there is no group '" + access_group + "'");
-  return found->gr_gid;
-}
-
 Options read_config(const std::string& path, Options options) {
-  const toml::value file = parse_file(path);
+  const toml::value file = platform::parse_toml_file(path);
   for (const auto& [name, value] : file.as_table()) apply(name, value, options);
   return options;
 }

@@ -6,9 +6,9 @@
 
 #include <cstdint>
 #include <optional>
-#include <stdexcept>
 #include <string>
 
+#include "common/settings.h"
 #include "wire/endpoint.h"
 
 namespace gs::daemon {
@@ -22,11 +22,7 @@ struct Options {
   int ready_fd = -1;  // told "ready" once clients can connect; -1: nobody
 };
 
-/// One line that says where (option, or file and line) and what.
-class OptionError : public std::runtime_error {
- public:
-  using std::runtime_error::runtime_error;
-};
+using OptionError = platform::SettingError;
 
 /// The options of this command line, over those of the configuration file that it names. Nothing: --help or
 /// --version was asked for and is answered on standard output. Throws OptionError.
@@ -34,8 +30,5 @@ std::optional<Options> parse_options(int argc, const char* const* argv);
 
 /// As in `options`, with what the configuration file says put in its place. Throws OptionError.
 Options read_config(const std::string& path, Options options);
-
-/// The id of the access group. Throws OptionError: there is no such group.
-std::optional<std::uint32_t> group_id(const std::string& access_group);
 
 }  // namespace gs::daemon

@@ -8,7 +8,7 @@
 #include <cstring>
 #include <system_error>
 
-#include "daemon/peer.h"
+#include "wire/endpoint.h"
 
 namespace gs::daemon {
 namespace {
@@ -30,6 +30,12 @@ std::uint64_t random_number() {
 void enlarge_send_buffer(int fd) {
   if (setsockopt(fd, SOL_SOCKET, SO_SNDBUFFORCE, &kSendBuffer, sizeof kSendBuffer) == 0) return;
   setsockopt(fd, SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
+}
+
+/// The default path's directory is the daemon's own.
+const std::string& prepared(const std::string& path) {
+  if (path == wire::kDefaultSocketPath) platform::make_directory_of(path);
+  return path;
 }
 
 }  // namespace
@@ -57,9 +63,9 @@ Server::EventPtr Server::make_event(evutil_socket_t fd, short what, event_callba
 
 Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
     : log_(std::move(log)),
-      access_{geteuid(), group_id(options.access_group)},
+      access_{geteuid(), platform::group_id(options.access_group)},
       base_(event_base_new()),
-      listener_(options.socket_path, access_.group),
+      listener_("gsd", prepared(options.socket_path), access_.group),
       sessions_({options.node_number, options.queue_bound}, {*this, ordering_, now, random_number, log_}),
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
@@ -114,7 +120,7 @@ void Server::pause_accepting(int error) {
 }
 
 void Server::add_connection(Descriptor socket) {
-  const std::optional<Peer> peer = peer_of(socket.get());
+  const std::optional<Peer> peer = platform::peer_of(socket.get());
   if (!peer) return;  // gone already
   if (!access_.allows(*peer)) {
     log_->warn("connection (pid {}, uid {}): closed: not permitted", peer->pid, peer->uid);

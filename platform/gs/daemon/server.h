@@ -8,14 +8,18 @@
 #include <unordered_map>
 #include <vector>
 
-#include "daemon/access.h"
-#include "daemon/descriptor.h"
-#include "daemon/listener.h"
+#include "common/access.h"
+#include "common/descriptor.h"
+#include "common/listener.h"
 #include "daemon/local_ordering.h"
 #include "daemon/options.h"
 #include "daemon/session_layer.h"
 
 namespace gs::daemon {
+
+using platform::AccessRule;
+using platform::Descriptor;
+using platform::Listener;
 
 class Server : private Transport {
  public:

@@ -5,19 +5,14 @@
 #include <cstdint>
 #include <span>
 #include <string>
-#include <vector>
+
+#include "common/peer.h"
 
 namespace gs::daemon {
 
 using ConnectionId = std::uint64_t;  // never used twice
 
-/// Who is at the other end, as the kernel says.
-struct Peer {
-  int pid = 0;
-  std::uint32_t uid = 0;
-  std::uint32_t gid = 0;
-  std::vector<std::uint32_t> groups;  // supplementary
-};
+using platform::Peer;
 
 class Transport {
  public:

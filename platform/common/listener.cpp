@@ -1,4 +1,4 @@
-#include "daemon/listener.h"
+#include "common/listener.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -9,22 +9,13 @@
 #include <cerrno>
 #include <cstring>
 
-#include "wire/endpoint.h"
-
-namespace gs::daemon {
+namespace platform {
 namespace {
 
 constexpr mode_t kOwnerOnly = 0600;
 constexpr mode_t kOwnerAndGroup = 0660;
 
 [[noreturn]] void fail(const std::string& what, int error) { throw ListenError(what + ": " + strerror(error)); }
-
-/// The default path's directory is the daemon's own, and /run is empty after every start of the host.
-void make_default_directory(const std::string& path) {
-  if (path != wire::kDefaultSocketPath) return;
-  const std::string directory = path.substr(0, path.rfind('/'));
-  if (mkdir(directory.c_str(), 0755) != 0 && errno != EEXIST) fail("cannot make " + directory, errno);
-}
 
 std::string holder_of(int lock_fd) {
   char text[32] = {};
@@ -35,8 +26,13 @@ std::string holder_of(int lock_fd) {
 
 }  // namespace
 
-Listener::Listener(const std::string& path, std::optional<unsigned> access_group) : path_(path) {
-  make_default_directory(path_);
+void make_directory_of(const std::string& path) {
+  const std::string directory = path.substr(0, path.rfind('/'));
+  if (mkdir(directory.c_str(), 0755) != 0 && errno != EEXIST) fail("cannot make " + directory, errno);
+}
+
+Listener::Listener(const std::string& program, const std::string& path, std::optional<unsigned> access_group)
+    : program_(program), path_(path) {
   lock();
   bind_and_listen(access_group);
 }
@@ -55,7 +51,7 @@ void Listener::lock() {
   if (!lock_) fail("cannot open the lock file " + lock_path, errno);
   if (flock(lock_.get(), LOCK_EX | LOCK_NB) != 0) {
     if (errno != EWOULDBLOCK) fail("cannot lock " + lock_path, errno);
-    throw ListenError("another gsd" + holder_of(lock_.get()) + " already serves " + path_);
+    throw ListenError("another " + program_ + holder_of(lock_.get()) + " already serves " + path_);
   }
   const std::string pid = std::to_string(getpid()) + "\n";
   if (ftruncate(lock_.get(), 0) != 0 || pwrite(lock_.get(), pid.data(), pid.size(), 0) < 0) {
@@ -91,4 +87,4 @@ void Listener::bind_and_listen(std::optional<unsigned> access_group) {
   if (listen(socket_.get(), SOMAXCONN) != 0) fail("cannot listen on " + path_, errno);
 }
 
-}  // namespace gs::daemon
+}  // namespace platform

@@ -1,12 +1,12 @@
-// Who may be a client.
+// Who may connect to a daemon of this host.
 #pragma once
 
 #include <algorithm>
 #include <optional>
 
-#include "daemon/transport.h"
+#include "common/peer.h"
 
-namespace gs::daemon {
+namespace platform {
 
 /// The daemon's own user, root, and the members of the access group where one is configured.
 struct AccessRule {
@@ -20,4 +20,4 @@ struct AccessRule {
   }
 };
 
-}  // namespace gs::daemon
+}  // namespace platform

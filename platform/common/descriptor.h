@@ -5,7 +5,7 @@
 
 #include <utility>
 
-namespace gs::daemon {
+namespace platform {
 
 class Descriptor {
  public:
@@ -26,4 +26,4 @@ class Descriptor {
   int fd_ = -1;
 };
 
-}  // namespace gs::daemon
+}  // namespace platform

@@ -1,10 +1,10 @@
-#include "daemon/peer.h"
+#include "common/peer.h"
 
 #include <sys/socket.h>
 
 #include <cerrno>
 
-namespace gs::daemon {
+namespace platform {
 namespace {
 
 /// Empty where the kernel does not tell: then only the primary group counts.
@@ -28,4 +28,4 @@ std::optional<Peer> peer_of(int socket) {
   return Peer{credentials.pid, credentials.uid, credentials.gid, supplementary_groups(socket)};
 }
 
-}  // namespace gs::daemon
+}  // namespace platform

@@ -1,13 +1,13 @@
-// The daemon's socket in the file system: one daemon to a path, made for its owner and the access group.
+// A daemon's socket in the file system: one daemon to a path, made for its owner and the access group.
 #pragma once
 
 #include <optional>
 #include <stdexcept>
 #include <string>
 
-#include "daemon/descriptor.h"
+#include "common/descriptor.h"
 
-namespace gs::daemon {
+namespace platform {
 
 /// Says in one line why the daemon cannot listen.
 class ListenError : public std::runtime_error {
@@ -19,8 +19,9 @@ class ListenError : public std::runtime_error {
 /// be taken away. The lock file stays behind: to remove it would let two daemons lock two files of that name.
 class Listener {
  public:
-  /// Listens, not blocking. Throws ListenError: the path is in use, too long, no socket, or not permitted.
-  Listener(const std::string& path, std::optional<unsigned> access_group);
+  /// Listens, not blocking, for whole packets. `program` names the daemon to whom it finds the path in use. Throws
+  /// ListenError: the path is in use, too long, no socket, or not permitted.
+  Listener(const std::string& program, const std::string& path, std::optional<unsigned> access_group);
   /// Removes the socket.
   ~Listener();
   Listener(const Listener&) = delete;
@@ -34,9 +35,14 @@ class Listener {
   void lock();
   void bind_and_listen(std::optional<unsigned> access_group);
 
+  const std::string program_;
   const std::string path_;
   Descriptor lock_;
   Descriptor socket_;
 };
 
-}  // namespace gs::daemon
+/// Makes the directory that `path` lies in, for all to enter; /run is empty after every start of the host. Throws
+/// ListenError.
+void make_directory_of(const std::string& path);
+
+}  // namespace platform
