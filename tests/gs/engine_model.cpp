@@ -333,6 +333,8 @@ void Model::check_groups(const Engine& engine) {
     if (!groups.contains(view.group)) error(endpoint, "is left in a group that is no more");
   std::erase_if(seqnum_, [&](const auto& s) { return !groups.contains(s.first); });
   std::erase_if(timers_, [&](const auto& t) { return !groups.contains(t.first); });
+  for (const auto& [group, timer] : timers_)
+    if (!engine.awaits(timer)) errors_ += group + ": does not await the timer of its phase\n";
   std::erase_if(phases_, [&](const auto& p) { return !groups.contains(p.first); });
   check_subscribers(groups);
 }

@@ -245,5 +245,23 @@ TEST_F(EngineVoting, Results_are_collected_as_the_batch_control_says) {
   EXPECT_NE(all.find("votes[320 ? approve 's'], #"), std::string::npos) << all;
 }
 
+TEST_F(EngineVoting, Results_of_many_large_values_are_bounded_and_hold_every_vote) {
+  attributes.batch_control = WYX_COLLECT_ALL_RESULT;
+  constexpr int kVoters = 40;
+  for (int who = 1; who <= kVoters; ++who) join(who);
+  send(1, "m", kPhases);
+  const Bytes value(kMaxStateValue, 'v');
+  for (int who = 1; who <= kVoters; ++who) vote_with(who, WYX_VOTE_APPROVE, value, value);
+  const auto& approved = std::get<ProtocolNotification>(*last.deliveries.at(0).what);
+  const std::vector<VoteResult>& results = approved.proposal.current_vote_results;
+  EXPECT_EQ(results.size(), static_cast<std::size_t>(kVoters));
+  std::size_t bytes = 0;
+  for (const VoteResult& r : results) {
+    EXPECT_EQ(r.vote, WYX_VOTE_APPROVE);
+    bytes += r.proposed_state.value_or("").size() + r.message.value_or("").size();
+  }
+  EXPECT_EQ(bytes, kMaxCollected);
+}
+
 }  // namespace
 }  // namespace gs::test

@@ -3,6 +3,9 @@
 // No threads, no sockets, no clock, no randomness: it is given ordered events and returns notifications for named
 // endpoints and timers to arm. Engines that are given the same events in the same order stay the same and say the
 // same. Not safe for concurrent use; the caller brings the order, and with it the exclusion.
+//
+// What the protocols promise is said in docs/group-services.md; the state machine and the differences between the
+// protocols stand in protocols.h, what a subscriber hears in subscribers.h, the limits in types.h.
 #pragma once
 
 #include <memory>
@@ -27,8 +30,8 @@ class Engine {
   /// to be wrong before it gives the request to the ordering.
   wyx_rc_t precheck(SessionId session, const Request& request) const;
 
-  /// Whether the expiry of this timer would still change anything: its phase runs. A timer that is not awaited need
-  /// not be kept.
+  /// Whether the expiry of this timer would still change anything: its phase runs. A timer that is not awaited
+  /// need not be kept.
   bool awaits(const TimerId& timer) const;
 
   /// For people and tools: a group as it stands.

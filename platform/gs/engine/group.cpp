@@ -301,6 +301,7 @@ void Group::add_to(Digest& digest) const {
   for (const MemberPtr& m : run_->voters) digest.add(m->to);
   digest.add(run_->missing);
   digest.add(run_->collect);
+  digest.add(run_->collected);
   digest.add(run_->defaults);
 }
 

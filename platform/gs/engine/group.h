@@ -95,6 +95,7 @@ class Group {
     std::vector<MemberPtr> voters;  // of this phase
     std::size_t missing = 0;        // votes
     std::uint32_t collect = 0;      // WYX_COLLECT_ flags of the group as it was at the start
+    std::size_t collected = 0;      // bytes of values kept for this phase's vote results
     std::uint32_t defaults = 0;     // summary flags of the default votes counted so far
   };
 
@@ -111,6 +112,7 @@ class Group {
   void start(Run run, Surroundings& env);
   void open_phase(Surroundings& env);
   void end_phase(Surroundings& env);
+  void collect(const std::optional<Bytes>& value, std::uint32_t flag, std::optional<Bytes>& into);
   void cast_default(Member& voter, std::uint32_t cause);
   void approve(std::uint32_t summary, Surroundings& env);
   void reject(std::uint32_t summary, Surroundings& env);

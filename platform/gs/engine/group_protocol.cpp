@@ -55,6 +55,7 @@ void Group::open_phase(Surroundings& env) {
   for (const MemberPtr& m : run.changing)
     if (changing_vote && !m->gone()) run.voters.push_back(m);
   run.missing = run.voters.size();
+  run.collected = 0;
   if (run.voters.empty()) {
     if (run.phase > 1) --run.phase;
     return;
@@ -80,9 +81,16 @@ void Group::vote(Member& voter, const VoteRequest& request) {
   if (request.default_vote != WYX_NULL_VOTE) ballot.default_vote = request.default_vote;
   if (request.proposed_state) run_->proposed_state = std::make_shared<const Bytes>(*request.proposed_state);
   if (request.message) run_->voted_message = std::make_shared<const Bytes>(*request.message);
-  if (run_->collect & WYX_COLLECT_STATEVALUE_RESULT) ballot.proposed_state = request.proposed_state;
-  if (run_->collect & WYX_COLLECT_MSG_RESULT) ballot.message = request.message;
+  collect(request.proposed_state, WYX_COLLECT_STATEVALUE_RESULT, ballot.proposed_state);
+  collect(request.message, WYX_COLLECT_MSG_RESULT, ballot.message);
   --run_->missing;
+}
+
+/// Values over the limit are left out, so that no notification grows with the number of voters without bound.
+void Group::collect(const std::optional<Bytes>& value, std::uint32_t flag, std::optional<Bytes>& into) {
+  if (!(run_->collect & flag) || !value || run_->collected + value->size() > kMaxCollected) return;
+  run_->collected += value->size();
+  into = value;
 }
 
 void Group::cast_default(Member& voter, std::uint32_t cause) {

@@ -17,12 +17,13 @@
 
 namespace gs {
 
-inline constexpr std::size_t kMaxGroupName = 32;                // characters
-inline constexpr std::size_t kMaxStateValue = 64 * 1024;        // bytes
-inline constexpr std::size_t kMaxProviderMessage = 64 * 1024;   // bytes
-inline constexpr std::size_t kMaxExpelFlag = 256;               // bytes
-inline constexpr std::size_t kMaxLocalName = 256;               // characters
-inline constexpr std::size_t kMaxExpelList = 4096;              // providers
+inline constexpr std::size_t kMaxGroupName = 32;               // characters
+inline constexpr std::size_t kMaxStateValue = 64 * 1024;       // bytes
+inline constexpr std::size_t kMaxProviderMessage = 64 * 1024;  // bytes
+inline constexpr std::size_t kMaxExpelFlag = 256;              // bytes
+inline constexpr std::size_t kMaxLocalName = 256;              // characters
+inline constexpr std::size_t kMaxExpelList = 4096;             // providers
+inline constexpr std::size_t kMaxCollected = 4 * 1024 * 1024;  // bytes, of all values in one event's vote results
 
 /// Chosen by the client, unique among the live tokens of its session, never negative.
 using Token = std::int32_t;
@@ -138,15 +139,15 @@ struct UnsubscribeRequest {
   bool operator==(const UnsubscribeRequest&) const = default;
 };
 
-using Request = std::variant<JoinRequest, StateChangeRequest, MessageRequest, LeaveRequest, ExpelRequest,
-                             AttributeChangeRequest, GoodbyeRequest, VoteRequest, SubscribeRequest,
-                             UnsubscribeRequest>;
+using Request =
+    std::variant<JoinRequest, StateChangeRequest, MessageRequest, LeaveRequest, ExpelRequest,
+                 AttributeChangeRequest, GoodbyeRequest, VoteRequest, SubscribeRequest, UnsubscribeRequest>;
 
 // -------------------------------------------------------------------------------------------- ordered events
 
 /// A client's request. `answered`: its daemon has already said WYX_OK to the client (from precheck), so a refusal
-/// found now goes out as a delayed error. None may be ordered after its session's SessionGoneEvent; those of a host
-/// that is gone are refused with WYX_NO_INIT.
+/// found now goes out as a delayed error. None may be ordered after its session's SessionGoneEvent; those of a
+/// host that is gone are refused with WYX_NO_INIT.
 struct RequestEvent {
   SessionId session;
   Request request;
@@ -236,7 +237,7 @@ struct ProtocolNotification {
   std::uint64_t seqnum = 0;
 };
 struct AnnouncementNotification {
-  std::uint32_t summary = 0;  // flags of wyx_summary_code_t
+  std::uint32_t summary = 0;   // flags of wyx_summary_code_t
   SharedMembership providers;  // whom it is about; null: nobody in particular
 };
 struct SubscriptionNotification {
@@ -269,8 +270,8 @@ struct TimerRequest {
   std::uint16_t seconds = 0;
 };
 
-/// What came of one ordered event. `rc` answers a RequestEvent; where it was answered before, a refusal is among the
-/// deliveries instead.
+/// What came of one ordered event. `rc` answers a RequestEvent; where it was answered before, a refusal is among
+/// the deliveries instead.
 struct Outcome {
   wyx_rc_t rc = WYX_OK;
   std::vector<Delivery> deliveries;  // in the order in which each endpoint must see them
