@@ -279,30 +279,33 @@ void Group::add_to(Digest& digest) const {
     }
   }
   digest.add(run_.has_value());
-  if (!run_) return;
-  digest.add(run_->traits->type);
-  digest.add(run_->number);
-  digest.add(run_->terms);
-  digest.add(run_->phase);
-  digest.add(run_->proposed_by);
-  add_members(digest, run_->changing);
-  for (const LeaveCode& code : run_->leave_codes) {
+  if (run_) add_to(digest, *run_);
+}
+
+void Group::add_to(Digest& digest, const Run& run) {
+  digest.add(run.traits->type);
+  digest.add(run.number);
+  digest.add(run.terms);
+  digest.add(run.phase);
+  digest.add(run.proposed_by);
+  add_members(digest, run.changing);
+  for (const LeaveCode& code : run.leave_codes) {
     digest.add(code.voluntary_or_failure);
     digest.add(code.voluntary_code);
   }
-  digest.add(run_->expel_info ? run_->expel_info->deactivate_phase : -1);
-  digest.add(run_->expel_info ? run_->expel_info->flag : Bytes());
-  digest.add(run_->new_attributes != nullptr);
-  if (run_->new_attributes) digest.add(*run_->new_attributes);
-  digest.add(run_->proposed_state);
-  digest.add(run_->message);
-  digest.add(run_->voted_message);
-  digest.add(run_->voters.size());
-  for (const MemberPtr& m : run_->voters) digest.add(m->to);
-  digest.add(run_->missing);
-  digest.add(run_->collect);
-  digest.add(run_->collected);
-  digest.add(run_->defaults);
+  digest.add(run.expel_info ? run.expel_info->deactivate_phase : -1);
+  digest.add(run.expel_info ? run.expel_info->flag : Bytes());
+  digest.add(run.new_attributes != nullptr);
+  if (run.new_attributes) digest.add(*run.new_attributes);
+  digest.add(run.proposed_state);
+  digest.add(run.message);
+  digest.add(run.voted_message);
+  digest.add(run.voters.size());
+  for (const MemberPtr& m : run.voters) digest.add(m->to);
+  digest.add(run.missing);
+  digest.add(run.collect);
+  digest.add(run.collected);
+  digest.add(run.defaults);
 }
 
 }  // namespace gs

@@ -99,6 +99,8 @@ class Group {
     std::uint32_t defaults = 0;     // summary flags of the default votes counted so far
   };
 
+  static void add_to(Digest& digest, const Run& run);
+
   // The queue (group.cpp).
   bool start_next(Surroundings& env);
   bool start_failure_leave(Surroundings& env);
