@@ -1,5 +1,5 @@
-// A page of memory that the processes of one benchmark share: each reports there what it has seen and when, without a
-// message that would disturb what is measured.
+// A page of memory that the processes of one benchmark share: each reports there what it has seen and when,
+// without a message that would disturb what is measured.
 #pragma once
 
 #include <fcntl.h>
@@ -21,13 +21,13 @@ inline int64_t now_ns() {
 
 /// One process's report. Everything is written before `count`, with release order.
 struct alignas(64) Slot {
-  std::atomic<uint64_t> count;      // events seen
-  std::atomic<uint64_t> seqnum;     // of the latest
-  std::atomic<int64_t> time;        // of the latest, now_ns()
-  std::atomic<uint64_t> digest;     // of everything seen, in order
-  std::atomic<uint64_t> errors;     // a gap in the sequence, contents that are not what was sent
-  std::atomic<uint64_t> failures;   // members seen to have failed
-  std::atomic<uint32_t> ready;      // joined, subscribed or connected
+  std::atomic<uint64_t> count;     // events seen
+  std::atomic<uint64_t> seqnum;    // of the latest
+  std::atomic<int64_t> time;       // of the latest, now_ns()
+  std::atomic<uint64_t> digest;    // of everything seen, in order
+  std::atomic<uint64_t> errors;    // a gap in the sequence, contents that are not what was sent
+  std::atomic<uint64_t> failures;  // members seen to have failed
+  std::atomic<uint32_t> ready;     // joined, subscribed or connected
 };
 
 class Board {
@@ -37,8 +37,8 @@ class Board {
   explicit Board(const std::string& path) {
     const int file = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
     const bool sized = file >= 0 && ::ftruncate(file, kSlots * sizeof(Slot)) == 0;
-    void* memory = sized ? ::mmap(nullptr, kSlots * sizeof(Slot), PROT_READ | PROT_WRITE, MAP_SHARED, file, 0)
-                         : MAP_FAILED;
+    void* memory =
+        sized ? ::mmap(nullptr, kSlots * sizeof(Slot), PROT_READ | PROT_WRITE, MAP_SHARED, file, 0) : MAP_FAILED;
     if (file >= 0) ::close(file);
     if (memory != MAP_FAILED) slots_ = static_cast<Slot*>(memory);
   }

@@ -50,8 +50,8 @@ bool Figures::write_json(const std::string& path) const {
   out << "{\"figures\": [";
   const char* separator = "\n";
   for (const Figure& f : figures_) {
-    out << separator << "  {\"name\": \"" << f.name << "\", \"measured\": " << f.measured << ", \"unit\": \"" << f.unit
-        << '"';
+    out << separator << "  {\"name\": \"" << f.name << "\", \"measured\": " << f.measured << ", \"unit\": \""
+        << f.unit << '"';
     if (f.at_most) out << ", \"at_most\": " << *f.at_most << ", \"verdict\": \"" << verdict(f) << '"';
     out << '}';
     separator = ",\n";

@@ -21,7 +21,8 @@ namespace {
 using zelt_gscl_V1::GSController;
 using zelt_gscl_V1::GSProvider;
 
-// ------------------------------------------------------------------------------------ a base API that does nothing
+// ------------------------------------------------------------------------------------ a base API that does
+// nothing
 
 wyx_rc_t setup(int, int, wyx_descriptor_t* descriptor, wyx_socket_ctrl_t, const wyx_responsiveness_t*, const char*,
                wyx_responsiveness_cb_t*, wyx_delayed_error_cb_t*, wyx_query_cb_t*, ...) {
@@ -73,8 +74,8 @@ class Approval {
     std::memset(bytes_, 's', sizeof bytes_);
     proposal_.gs_phase_info = {1, 1};
     proposal_.gs_proposed_by = ids_[0];
-    proposal_.gs_whats_changed =
-        static_cast<wyx_whats_changed_t>(WYX_UPDATED_MEMBERSHIP | WYX_UPDATED_STATE_VALUE | WYX_CURRENT_STATE_VALUE);
+    proposal_.gs_whats_changed = static_cast<wyx_whats_changed_t>(
+        WYX_UPDATED_MEMBERSHIP | WYX_UPDATED_STATE_VALUE | WYX_CURRENT_STATE_VALUE);
     proposal_.gs_current_providers = &members_;
     proposal_.gs_current_state_value = &state_;
     record_.gs_notification_type = WYX_APPROVED_NOTIFICATION;
@@ -195,7 +196,8 @@ BENCHMARK(trace_off);
 BENCHMARK(read_lock);
 BENCHMARK(write_lock);
 
-// ------------------------------------------------------------------------------------------------------- the figures
+// ------------------------------------------------------------------------------------------------------- the
+// figures
 
 /// Prints as usual and keeps the medians, in nanoseconds.
 class Medians : public benchmark::ConsoleReporter {
@@ -219,7 +221,8 @@ zn::Figures judge(const Medians& m) {
   const double pair = m.of("mutex_pair");
   zn::Figures figures;
   figures.add("request, trace off", m.of("request") / pair, "mutex pairs", 8);
-  figures.add("static query, over the same call through a pointer", m.of("query") - m.of("plain_pointer"), "ns", 2);
+  figures.add("static query, over the same call through a pointer", m.of("query") - m.of("plain_pointer"), "ns",
+              2);
   figures.add("routing an approval (8 members, 64 bytes), 1 client", m.of("routing1") / pair, "mutex pairs", 20);
   figures.add("the same with 1,000 clients", m.of("routing1000") / m.of("routing1"), "times that");
   figures.add("a trace line that is off", m.of("trace_off"), "ns", 2);

@@ -20,8 +20,8 @@ struct Payload {
   static bool read(const char* bytes, int length, Payload* payload);
 };
 
-/// Checks what a process sees and reports it on the board: no gap in the group's sequence (for a member; a subscriber
-/// is not told everything), each sender's numbers one after the other, contents intact.
+/// Checks what a process sees and reports it on the board: no gap in the group's sequence (for a member; a
+/// subscriber is not told everything), each sender's numbers one after the other, contents intact.
 class Witness {
  public:
   explicit Witness(Slot& slot) : slot_(slot) {}

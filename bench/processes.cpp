@@ -1,10 +1,12 @@
-// Whole processes over a daemon of their own: how long until a group has agreed, how many messages it takes, how far
-// one change spreads, how soon a death is known, what an idle client costs the daemon. Set against the same kind of
-// socket used bare, in the same run; and everything that is measured is also checked: sequence, contents, agreement.
+// Whole processes over a daemon of their own: how long until a group has agreed, how many messages it takes, how
+// far one change spreads, how soon a death is known, what an idle client costs the daemon. Set against the same
+// kind of socket used bare, in the same run; and everything that is measured is also checked: sequence, contents,
+// agreement.
 //
 //   processes [--quick] [--benchmark_out=FILE]
 #include "examples/processes.h"
 
+#include <sched.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -32,14 +34,40 @@ constexpr int kSpread = 200;                       // subscribers, receivers and
 constexpr int kProposer = 0, kTalker = 10, kVictim = 20, kFirstOfMany = 100;
 
 struct Settings {
-  int rounds = 20;          // of each latency, alternating
-  int samples = 200;        // in each round
-  int messages = 20000;     // of each sender
-  int changes = 60;         // spread to all subscribers
+  int rounds = 20;       // of each latency, alternating
+  int samples = 200;     // in each round
+  int messages = 20000;  // of each sender
+  int changes = 60;      // spread to all subscribers
   int deaths = 100;
   int spread = kSpread;
 
   static Settings quick() { return {2, 50, 500, 3, 3, 10}; }
+};
+
+/// Puts processes on one core, or leaves them where they are; all are set free again at the end.
+class Placement {
+ public:
+  Placement(bool one_core, std::vector<pid_t> processes) : processes_(std::move(processes)) {
+    ::sched_getaffinity(0, sizeof all_, &all_);
+    if (!one_core) return;
+    cpu_set_t one;
+    CPU_ZERO(&one);
+    int core = 0;
+    while (!CPU_ISSET(core, &all_)) core++;
+    CPU_SET(core, &one);
+    set(one);
+  }
+  ~Placement() { set(all_); }
+  Placement(const Placement&) = delete;
+  Placement& operator=(const Placement&) = delete;
+
+ private:
+  void set(const cpu_set_t& cores) {
+    for (pid_t process : processes_) ::sched_setaffinity(process, sizeof cores, &cores);
+  }
+
+  const std::vector<pid_t> processes_;
+  cpu_set_t all_;
 };
 
 class Benchmark {
@@ -51,8 +79,10 @@ class Benchmark {
  private:
   using Children = std::vector<std::unique_ptr<Process>>;
 
-  std::unique_ptr<Process> start(const std::string& role, const std::vector<std::string>& arguments);
-  Children start_many(const std::string& role, int first, int count, const std::string& last_argument);
+  std::unique_ptr<Process> start(const zn::PrivateDaemon& daemon, const std::string& role,
+                                 const std::vector<std::string>& arguments);
+  Children start_many(const zn::PrivateDaemon& daemon, const std::string& role, int first, int count,
+                      const std::string& last_argument);
   /// Dispatches for the proposer, when it has something to do, until the condition holds.
   template <class Condition>
   void until(Condition condition);
@@ -60,7 +90,8 @@ class Benchmark {
   int64_t await_counts(int first, int count, uint64_t target);
   void check(int first, int count);
 
-  void latencies();
+  void latencies(bool one_core);
+  void add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& bare);
   void ping_pong(int socket, std::vector<double>* samples);
   void agreement(wyx_num_phases_t phases, std::vector<double>* samples);
   void message_rate(int senders, double ping_pong_us);
@@ -80,17 +111,19 @@ class Benchmark {
   double ping_pong_us_ = 0;
 };
 
-std::unique_ptr<Process> Benchmark::start(const std::string& role, const std::vector<std::string>& arguments) {
+std::unique_ptr<Process> Benchmark::start(const zn::PrivateDaemon& daemon, const std::string& role,
+                                          const std::vector<std::string>& arguments) {
   std::vector<std::string> command{zn::program("processes"), "--role=" + role};
   command.insert(command.end(), arguments.begin(), arguments.end());
-  return std::make_unique<Process>(command, daemon_.environment());
+  return std::make_unique<Process>(command, daemon.environment());
 }
 
-Benchmark::Children Benchmark::start_many(const std::string& role, int first, int count, const std::string& last) {
+Benchmark::Children Benchmark::start_many(const zn::PrivateDaemon& daemon, const std::string& role, int first,
+                                          int count, const std::string& last) {
   Children children;
   for (int i = first; i < first + count; i++) {
     board_[i].count = board_[i].errors = board_[i].ready = 0;
-    children.push_back(start(role, {daemon_.folder() + "/board", std::to_string(i), last}));
+    children.push_back(start(daemon, role, {daemon_.folder() + "/board", std::to_string(i), last}));
   }
   return children;
 }
@@ -131,7 +164,7 @@ Benchmark::Benchmark(const Settings& settings) : settings_(settings) {
   if (controller_->initialize() != WYX_OK) throw Failure{"no session"};
   proposer_ = std::make_unique<BenchMember>("agree", static_cast<short>(kProposer), board_[kProposer]);
   if (proposer_->joinGroup() != WYX_OK) throw Failure{"no join"};
-  members_ = start_many("member", kProposer + 1, 2, "agree");
+  members_ = start_many(daemon_, "member", kProposer + 1, 2, "agree");
   until([&] { return proposer_->getMemberCount() == 3; });
 }
 
@@ -157,12 +190,15 @@ void Benchmark::agreement(wyx_num_phases_t phases, std::vector<double>* samples)
   }
 }
 
-// The three latencies in turns, so that what else the machine does falls on all of them.
-void Benchmark::latencies() {
+// The three latencies in turns, so that what else the machine does falls on all of them. On one core a hand-over
+// costs a change of context; over all cores, where the scheduler puts the processes, it may cost the wake-up of
+// another core.
+void Benchmark::latencies(bool one_core) {
   const std::string path = daemon_.folder() + "/echo.sock";
   const int listening = zn::listen_on(path);
-  auto echo = start("echo", {path});
+  auto echo = start(daemon_, "echo", {path});
   const int socket = ::accept(listening, nullptr, nullptr);
+  const Placement placement(one_core, {0, daemon_.pid(), echo->pid(), members_[0]->pid(), members_[1]->pid()});
 
   std::vector<double> bare, one, several, warm_up;
   ping_pong(socket, &warm_up);
@@ -174,21 +210,24 @@ void Benchmark::latencies() {
   }
   ::close(socket);
   ::close(listening);
+  ::unlink(path.c_str());
   await_counts(kProposer, 3, board_[kProposer].count);
   check(kProposer, 3);
 
+  const std::string where = one_core ? ", one core" : ", all cores";
   ping_pong_us_ = zn::percentile(bare, 0.5);
-  const double bare_p99 = zn::percentile(bare, 0.99);
-  figures_.add("bare ping-pong between two processes, p50", ping_pong_us_, "us");
-  figures_.add("bare ping-pong, p99", bare_p99, "us");
-  figures_.add("request to own approval, one phase, three processes, p50", zn::percentile(one, 0.5), "us");
-  figures_.add("  in ping-pongs (p50)", zn::percentile(one, 0.5) / ping_pong_us_, "ping-pongs", 4);
-  figures_.add("  p99", zn::percentile(one, 0.99), "us");
-  figures_.add("  in ping-pongs (p99)", zn::percentile(one, 0.99) / bare_p99, "ping-pongs");
-  figures_.add("request to own approval, n phases, three voters, p50", zn::percentile(several, 0.5), "us");
-  figures_.add("  in ping-pongs (p50)", zn::percentile(several, 0.5) / ping_pong_us_, "ping-pongs", 4);
-  figures_.add("  p99", zn::percentile(several, 0.99), "us");
-  figures_.add("  in ping-pongs (p99)", zn::percentile(several, 0.99) / bare_p99, "ping-pongs");
+  figures_.add("bare ping-pong between two processes" + where + ", p50", ping_pong_us_, "us");
+  figures_.add("  p99", zn::percentile(bare, 0.99), "us");
+  add_agreement("one phase, three processes" + where, one, bare);
+  add_agreement("n phases, three voters" + where, several, bare);
+}
+
+void Benchmark::add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& bare) {
+  const double p50 = zn::percentile(samples, 0.5), p99 = zn::percentile(samples, 0.99);
+  figures_.add("request to own approval, " + what + ", p50", p50, "us");
+  figures_.add("  over a bare ping-pong (p50)", p50 / zn::percentile(bare, 0.5), "x", 4);
+  figures_.add("  p99", p99, "us");
+  figures_.add("  over a bare ping-pong (p99)", p99 / zn::percentile(bare, 0.99), "x");
 }
 
 void Benchmark::message_rate(int senders, double ping_pong_us) {
@@ -197,42 +236,46 @@ void Benchmark::message_rate(int senders, double ping_pong_us) {
   for (int i = 0; i < 3; i++) {
     zn::Slot& slot = board_[kTalker + i];
     slot.digest = slot.count = slot.errors = slot.ready = 0;
-    Children one = start_many("member", kTalker + i, 1, group);
+    Children one = start_many(daemon_, "member", kTalker + i, 1, group);
     talkers.push_back(std::move(one.front()));
     while (board_[kTalker + i].ready == 0) ::usleep(200);
   }
   const int64_t start = zn::now_ns();
-  for (int i = 0; i < senders; i++) talkers[static_cast<size_t>(i)]->write_line("send " + std::to_string(settings_.messages));
+  for (int i = 0; i < senders; i++)
+    talkers[static_cast<size_t>(i)]->write_line("send " + std::to_string(settings_.messages));
   const uint64_t total = static_cast<uint64_t>(senders) * static_cast<uint64_t>(settings_.messages);
   const double seconds = static_cast<double>(await_counts(kTalker, 3, total) - start) / 1e9;
   check(kTalker, 3);
   const double rate = static_cast<double>(total) / seconds;
   figures_.add("messages into a group of three, " + std::to_string(senders) + " sending", rate, "per second");
-  figures_.add("  each, in ping-pongs", 1e6 / rate / ping_pong_us, "ping-pongs");
+  figures_.add("  time for each, over a bare ping-pong", 1e6 / rate / ping_pong_us, "x");
 }
 
+// With a daemon that has served nobody yet, so that no memory of earlier clients is used again.
 void Benchmark::idle_memory() {
+  zn::PrivateDaemon fresh;
   auto resident_kib = [&] {
-    std::ifstream status("/proc/" + std::to_string(daemon_.pid()) + "/status");
+    std::ifstream status("/proc/" + std::to_string(fresh.pid()) + "/status");
     for (std::string line; std::getline(status, line);) {
       if (line.rfind("VmRSS:", 0) == 0) return std::atof(line.c_str() + 6);
     }
     throw Failure{"the daemon is gone"};
   };
   const double before = resident_kib();
-  Children idle = start_many("idle", kFirstOfMany, settings_.spread, "");
+  Children idle = start_many(fresh, "idle", kFirstOfMany, settings_.spread, "");
   const auto deadline = Clock::now() + kLimit;
   for (int i = kFirstOfMany; i < kFirstOfMany + settings_.spread; i++) {
     while (board_[i].ready == 0 && Clock::now() < deadline) ::usleep(200);
     if (board_[i].ready == 0) throw Failure{"an idle client did not connect"};
   }
-  const double per_client = (resident_kib() - before) / settings_.spread;
-  figures_.add("memory of the daemon for an idle client", per_client, "KiB", 64);
-  figures_.add("  of what it has without clients", per_client / before, "x");
+  const double clients = resident_kib() - before;
+  figures_.add("memory of the daemon for an idle client", clients / settings_.spread, "KiB", 64);
+  figures_.add("  " + std::to_string(settings_.spread) + " of them, over the daemon without clients",
+               clients / before, "x");
 }
 
 void Benchmark::spread(int subscribers) {
-  Children children = start_many("subscriber", kFirstOfMany, subscribers, "agree");
+  Children children = start_many(daemon_, "subscriber", kFirstOfMany, subscribers, "agree");
   await_counts(kFirstOfMany, subscribers, 1);  // the state as it was
   std::vector<double> samples;
   for (int i = 0; i < settings_.changes; i++) {
@@ -257,7 +300,7 @@ void Benchmark::spread(int subscribers) {
 double Benchmark::bare_spread(int receivers) {
   const std::string path = daemon_.folder() + "/bare.sock";
   const int listening = zn::listen_on(path);
-  Children children = start_many("receiver", kFirstOfMany, receivers, path);
+  Children children = start_many(daemon_, "receiver", kFirstOfMany, receivers, path);
   std::vector<int> sockets;
   for (int i = 0; i < receivers; i++) sockets.push_back(::accept(listening, nullptr, nullptr));
   std::vector<double> samples;
@@ -282,7 +325,7 @@ void Benchmark::deaths() {
   std::vector<double> samples, bare;
   for (int i = 0; i < settings_.deaths; i++) {
     zn::Slot& mine = board_[kProposer];
-    Children victim = start_many("member", kVictim, 1, "agree");
+    Children victim = start_many(daemon_, "member", kVictim, 1, "agree");
     until([&] { return proposer_->getMemberCount() == 4; });
     while (board_[kVictim].ready == 0) ::usleep(200);
     const uint64_t target = mine.failures + 1;
@@ -309,7 +352,7 @@ void Benchmark::deaths() {
 double Benchmark::bare_death() {
   const std::string path = daemon_.folder() + "/death.sock";
   const int listening = zn::listen_on(path);
-  auto echo = start("echo", {path});
+  auto echo = start(daemon_, "echo", {path});
   const int socket = ::accept(listening, nullptr, nullptr);
   const int64_t start = zn::now_ns();
   echo->signal(SIGKILL);
@@ -324,7 +367,8 @@ double Benchmark::bare_death() {
 }
 
 void Benchmark::run() {
-  latencies();
+  latencies(true);
+  latencies(false);
   message_rate(1, ping_pong_us_);
   message_rate(3, ping_pong_us_);
   idle_memory();

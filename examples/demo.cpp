@@ -1,5 +1,5 @@
-// The demonstration: a private daemon, three members and a watcher, each a process of its own; one timeline of what
-// every one of them saw and when. It ends with status 0 only when all of it is as it must be.
+// The demonstration: a private daemon, three members and a watcher, each a process of its own; one timeline of
+// what every one of them saw and when. It ends with status 0 only when all of it is as it must be.
 #include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -199,7 +199,8 @@ void Demo::run() {
   expect_end(0, false);
   expect_end(kWatcher, false);
 
-  if (!daemon_.stop(Clock::now() + kStepLimit)) throw Failure{"the daemon did not stop in order: " + daemon_.log()};
+  if (!daemon_.stop(Clock::now() + kStepLimit))
+    throw Failure{"the daemon did not stop in order: " + daemon_.log()};
   std::printf("\nEverybody saw the same events in the same order. Times in milliseconds; %.1f seconds in all.\n",
               timeline_.seconds());
 }

@@ -23,7 +23,8 @@ using zelt_gscl_V1::GSProvider;
 
 class Member : public GSProvider {
  public:
-  Member(const char* group, short instance, std::string veto) : GSProvider(group, instance, nullptr), veto_(veto) {}
+  Member(const char* group, short instance, std::string veto)
+      : GSProvider(group, instance, nullptr), veto_(veto) {}
 
   // The members vote: on to a second phase first, then yes, and no to what this one has a veto on.
   void nPhaseCb(const wyx_n_phase_notification_t* n) override {

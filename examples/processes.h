@@ -39,14 +39,15 @@ class TempFolder {
 /// The path of a program of this project: beside the running one, or one folder up.
 std::string program(const std::string& name);
 
-/// A child process: lines to its standard input, lines from its standard output. It is killed, if it still runs, and
-/// reaped with the object, and killed by the kernel should this process die.
+/// A child process: lines to its standard input, lines from its standard output. It is killed, if it still runs,
+/// and reaped with the object, and killed by the kernel should this process die.
 class Process {
  public:
   using Environment = std::vector<std::pair<std::string, std::string>>;
 
   /// `stderr_file` empty: the child shares this process's standard error.
-  Process(const std::vector<std::string>& command, const Environment& environment, const std::string& stderr_file = "");
+  Process(const std::vector<std::string>& command, const Environment& environment,
+          const std::string& stderr_file = "");
   ~Process();
   Process(const Process&) = delete;
   Process& operator=(const Process&) = delete;

@@ -1,5 +1,5 @@
-// What member and watcher print: one line for each thing they are told, with the time and the group's own number of
-// the event, so that lines of several processes can be put side by side.
+// What member and watcher print: one line for each thing they are told, with the time and the group's own number
+// of the event, so that lines of several processes can be put side by side.
 #pragma once
 
 #include <time.h>

@@ -15,10 +15,11 @@ fixed_addresses() {
   if setarch -R true 2>/dev/null; then setarch -R "$@"; else "$@"; fi
 }
 
-# build PRESET [TARGET...]
+# build PRESET [TARGET...]: always configures, since what was missing last time may be there now.
 build() {
   local preset=$1
   shift
-  if [ ! -f "build/$preset/build.ninja" ]; then cmake --preset "$preset"; fi
+  local said
+  said=$(cmake --preset "$preset" 2>&1) || { echo "$said"; return 1; }
   fixed_addresses cmake --build --preset "$preset" -j "$jobs" ${1:+--target "$@"}
 }
