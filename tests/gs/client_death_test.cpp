@@ -141,6 +141,29 @@ TEST_F(ClientOfAFake, AfterTheEnd_aNewSessionWorks) {
   accepted_join("group");
 }
 
+TEST_F(ClientOfAFake, NewSessionBeforeTheEndWasTold_tellsItFirst) {
+  const wyx_token_t provider = accepted_join("group");
+  const wyx_token_t subscriber = accepted_subscription("group");
+  session.close();
+  EXPECT_EQ(send_message(provider, "x"), WYX_NO_INIT);
+  open();
+  const wyx_token_t after = accepted_join("group");
+  EXPECT_NE(after, provider);
+  recorder().set_hook([](const Seen&) { wyx_dispatch(WYX_NON_BLOCKING); });  // nested, to the end of the old one
+  dispatch_next();
+  EXPECT_EQ(recorder().of(provider).size(), 1u);
+  EXPECT_EQ(recorder().of(subscriber).size(), 1u);
+  EXPECT_EQ(recorder().count(), 2u);
+  EXPECT_FALSE(readable(fd));
+  notify(after, AnnouncementNotification{WYX_RESPONSIVENESS_RESPONSE, nullptr});
+  dispatch_next();
+  EXPECT_EQ(recorder().of(after).size(), 1u);
+  session.close();
+  dispatch_next();
+  EXPECT_EQ(recorder().of(after).size(), 2u);
+  expect_quiet_end();
+}
+
 TEST_F(ClientOfAFake, SetupThatFails_leavesTheDeadSessionToTellItsClients) {
   const wyx_token_t token = accepted_join("group");
   session.close();

@@ -34,12 +34,13 @@ std::unique_ptr<Transport> open_transport(const SetupOptions& options, wyx_rc_t*
   return SocketTransport::open(address->path, hello, rc);
 }
 
-/// False: another session is open. On success the one that is replaced, if any, is left in `session`.
-bool install(std::shared_ptr<Session>& session) {
+/// False: another session is open.
+bool install(const std::shared_ptr<Session>& session) {
   Current& c = current();
   MutexLock lock(c.mutex);
   if (c.session && !c.session->gone()) return false;
-  std::swap(c.session, session);
+  if (c.session) session->inherit(std::move(c.session));
+  c.session = session;
   return true;
 }
 
@@ -61,10 +62,12 @@ wyx_rc_t open_session(const SetupOptions& options, wyx_descriptor_t* descriptor)
   auto session = std::make_shared<Session>(std::move(transport), options.routines);
   const bool checked = options.responsiveness.gs_responsiveness_type != WYX_NO_RESPONSIVENESS;
   if (checked) rc = session->set_responsiveness(options.responsiveness);
-  const wyx_descriptor_t opened = session->descriptor();
   if (rc == WYX_OK && !install(session)) rc = WYX_EXISTS;
-  if (session) session->quit();  // ours, refused or not wanted, or the one that it has replaced
-  if (rc == WYX_OK) *descriptor = opened;
+  if (rc == WYX_OK) {
+    *descriptor = session->descriptor();
+  } else {
+    session->quit();
+  }
   return rc;
 }
 

@@ -20,7 +20,7 @@ struct SetupOptions {
 };
 
 /// Opens the session. WYX_EXISTS when there is one whose group services are not gone; one whose are gone is
-/// replaced, and its clients are not told any more.
+/// replaced, and what it has not handed out yet comes first in the new one.
 wyx_rc_t open_session(const SetupOptions& options, wyx_descriptor_t* descriptor);
 wyx_rc_t quit_session();
 

@@ -1,6 +1,7 @@
 #include "client/registry.h"
 
 #include <algorithm>
+#include <atomic>
 #include <limits>
 
 namespace gs::client {
@@ -33,6 +34,12 @@ bool is_last(const Notification& notification, const Client& client, bool joined
   return error.protocol == WYX_JOIN || error.protocol == WYX_SUBSCRIPTION;
 }
 
+/// From 1, and after the highest from 1 again.
+Token next_token() {
+  static std::atomic<std::uint32_t> count = 0;
+  return static_cast<Token>(count.fetch_add(1) % std::numeric_limits<Token>::max()) + 1;
+}
+
 bool is_own_join(const Notification& notification, ProviderId id) {
   const auto* n = std::get_if<ProtocolNotification>(&notification);
   return n != nullptr && n->type == WYX_APPROVED_NOTIFICATION && n->protocol == WYX_JOIN &&
@@ -44,11 +51,12 @@ bool is_own_join(const Notification& notification, ProviderId id) {
 std::optional<Token> Registry::add(const Client& client) {
   MutexLock lock(mutex_);
   if (closed_) return std::nullopt;
+  Token token;
   do {
-    last_ = last_ == std::numeric_limits<Token>::max() ? 1 : last_ + 1;
-  } while (entries_.contains(last_));
-  entries_.emplace(last_, Entry{client, false, false});
-  return last_;
+    token = next_token();
+  } while (entries_.contains(token));
+  entries_.emplace(token, Entry{client, false, false});
+  return token;
 }
 
 bool Registry::accept(Token token) {

@@ -26,7 +26,8 @@ struct Client {
 /// Any thread.
 class Registry {
  public:
-  /// Before the request goes out, so that no notification can come before it. Nothing: the registry is closed.
+  /// Before the request goes out, so that no notification can come before it. Tokens count up through the sessions
+  /// of a process, so that one from before the session is nobody's. Nothing: the registry is closed.
   std::optional<Token> add(const Client& client);
   /// The request was answered WYX_OK. False: the registry has been closed since, and the client is forgotten.
   bool accept(Token token);
@@ -54,7 +55,6 @@ class Registry {
 
   Mutex mutex_;
   std::map<Token, Entry> entries_ GS_GUARDED_BY(mutex_);
-  Token last_ GS_GUARDED_BY(mutex_) = 0;
   bool closed_ GS_GUARDED_BY(mutex_) = false;
 };
 

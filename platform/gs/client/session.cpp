@@ -1,5 +1,8 @@
 #include "client/session.h"
 
+#include <sys/epoll.h>
+#include <unistd.h>
+
 #include <utility>
 
 #include "client/entry_guard.h"
@@ -35,7 +38,24 @@ class Session::Turn {
 };
 
 Session::Session(std::unique_ptr<Transport> transport, const SessionRoutines& routines)
-    : transport_(std::move(transport)), routines_(routines) {}
+    : transport_(std::move(transport)), routines_(routines), descriptor_(transport_->descriptor()) {}
+
+Session::~Session() {
+  if (descriptor_ != transport_->descriptor()) close(descriptor_);
+}
+
+void Session::inherit(std::shared_ptr<Session> previous) {
+  if (previous->ended_ || previous->quit_) return;
+  previous_ = std::move(previous);
+  const int both = epoll_create1(EPOLL_CLOEXEC);
+  if (both < 0) return;
+  for (const int fd : {previous_->descriptor_, descriptor_}) {
+    epoll_event event{};
+    event.events = EPOLLIN;
+    epoll_ctl(both, EPOLL_CTL_ADD, fd, &event);
+  }
+  descriptor_ = both;
+}
 
 wyx_rc_t Session::check_token(Token token, Client::Kind kind) {
   if (registry_.has(token, kind)) return WYX_OK;
@@ -78,7 +98,7 @@ wyx_rc_t Session::dispatch(bool blocking, int cancel_state) {
     {
       Turn turn(*this, blocking, cancel_state);
       if (!turn.held()) return WYX_OK;  // another thread is handing out what there is
-      if (drain() > 0) return WYX_OK;
+      if (drain(quit_) > 0) return WYX_OK;
     }
     if (quit_ || ended_) return WYX_NO_INIT;
     if (!blocking) return WYX_OK;
@@ -118,14 +138,24 @@ void Session::end_turn() {
   }
 }
 
-int Session::drain() {
+int Session::drain(const std::atomic<bool>& stop) {
   int delivered = 0;
-  while (delivered < kMaxDeliveries && !quit_) {
+  if (const auto previous = previous_) {  // kept here: a dispatch nested in it may be the one that ends it
+    delivered = previous->hand_out_rest(stop);
+    if (previous->ended_) previous_.reset();
+  }
+  while (delivered < kMaxDeliveries && !stop) {
     const Step step = deliver_next();
     if (step == Step::kNothing) break;
     if (step == Step::kDelivered) ++delivered;
   }
   return delivered;
+}
+
+/// Of the session before the one that the caller hands out for.
+int Session::hand_out_rest(const std::atomic<bool>& stop) {
+  Turn turn(*this, false, PTHREAD_CANCEL_DISABLE);
+  return turn.held() ? drain(stop) : 0;
 }
 
 Session::Step Session::deliver_next() {

@@ -23,7 +23,14 @@ class Session {
  public:
   Session(std::unique_ptr<Transport> transport, const SessionRoutines& routines);
 
-  int descriptor() const { return transport_->descriptor(); }
+  ~Session();
+  Session(const Session&) = delete;
+  Session& operator=(const Session&) = delete;
+
+  /// Before the first use: takes over what `previous`, whose group services are gone, has not handed out yet.
+  void inherit(std::shared_ptr<Session> previous);
+
+  int descriptor() const { return descriptor_; }
   std::uint32_t node_number() const { return transport_->node_number(); }
   /// Group services have gone or the session was quit.
   bool gone() { return transport_->gone(); }
@@ -54,7 +61,8 @@ class Session {
   void end_turn();
   bool has_turn() GS_REQUIRES(turn_mutex_);
 
-  int drain();
+  int drain(const std::atomic<bool>& stop);
+  int hand_out_rest(const std::atomic<bool>& stop);
   Step deliver_next();
   Step deliver(Token token, const Notification& notification);
   Step deliver(Token token, const Client& client, const ProtocolNotification& n);
@@ -66,6 +74,7 @@ class Session {
 
   const std::unique_ptr<Transport> transport_;
   const SessionRoutines routines_;
+  int descriptor_;  // the transport's, or one that holds it beside the previous session's
   Registry registry_;
   std::atomic<bool> quit_ = false;
   std::atomic<bool> ended_ = false;  // group services are gone and every client has been told
@@ -82,6 +91,7 @@ class Session {
   // Of the thread that hands out.
   std::deque<Records> records_;  // one for each level of nesting, so that an inner callback spoils no outer record
   std::size_t level_ = 0;
+  std::shared_ptr<Session> previous_;  // until its clients have been told
   bool gone_seen_ = false;
 };
 

@@ -37,9 +37,10 @@
 /// a moment); it stays the library's. `socket_control`: WYX_SOCKET_SIGNAL raises SIGIO for each arrival from a
 /// daemon; the other flags change nothing. `responsiveness` as for wyx_change_responsiveness; null: none.
 /// `deactivate_path` is accepted and not used. A routine that is null gets nothing; there are no query
-/// notifications. WYX_EXISTS: there is a session. A session whose group services are gone is replaced; its clients
-/// that have not been told yet will not be. WYX_CONNECT_FAILED: no daemon there. WYX_SOCK_CREATE_FAILED.
-/// WYX_BAD_PARAMETER: also for a GSD_ENDPOINT that is none of the above.
+/// notifications.
+/// WYX_EXISTS: there is a session. A session whose group services are gone is replaced; clients of it that have
+/// not been told yet are told by the first wyx_dispatch. WYX_CONNECT_FAILED: no daemon there.
+/// WYX_SOCK_CREATE_FAILED. WYX_BAD_PARAMETER: also for a GSD_ENDPOINT that is none of the above.
 WYX_ENTRY wyx_rc_t wyx_setup(int version, int count, wyx_descriptor_t* descriptor,
                              wyx_socket_ctrl_t socket_control, const wyx_responsiveness_t* responsiveness,
                              const char* deactivate_path, wyx_responsiveness_cb_t* responsiveness_routine,
