@@ -46,11 +46,17 @@ class GSTransaction;
 ///
 /// Lifetime: the application owns its clients. The destructor takes the client out of the registry and then waits
 /// until no other thread delivers a notification to it, so that the library never touches a client that is gone.
-/// The parts of a derived class are gone before that, though. Therefore destroy a client of a class of your own
-/// while it is idle, or on the dispatching thread (from a callback, its own too), or otherwise ordered after the
-/// last delivery. No thread may be inside any other operation of a client that is destroyed, and two callbacks
-/// must not destroy each other's client at the same time. Cancellation: waitForNotification is a cancellation
-/// point; requests and destructors are not.
+/// A GSProvider or GSSubscriber itself may thus be destroyed at any time. The parts of a derived class are gone
+/// before that wait, though: destroy a client of a class of your own
+/// - on the dispatching thread, from a callback, its own too, or between two calls of dispatch(); or
+/// - when waitForNotification has returned GS_WAITFOR_RECEIVED for the client's last notification, with no further
+///   one on its way; or
+/// - otherwise ordered after its last callback.
+/// To be idle is not enough: an approved leave makes the client idle before its callback. No thread may be inside
+/// any other operation of a client that is destroyed, and callbacks on two threads must not destroy each other's
+/// client.
+///
+/// Cancellation: waitForNotification is a cancellation point; requests and destructors are not.
 class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
  public:
   /// Names the group (see setGroupName) and registers with the current controller; without one the client will

@@ -100,6 +100,7 @@ wyx_rc_t GSController::initialize() {
   const int count = zelt_vrmf_version.load(std::memory_order_relaxed) >= kFirstVersionWithDomainControl
                         ? kSetupArgumentsWithDomainControl
                         : kSetupArguments;
+  gscl_internal::baseApi();  // first, so that the options are those at the time of the call
   const wyx_rc_t rc = callBaseApi<&GSAPIRtnCollection::wyx_setup>(
       static_cast<int>(gsapi_compiled_version.load(std::memory_order_relaxed)), count, &descriptor,
       _ctrlData->sockOption, &_ctrlData->responsiveness, static_cast<const char*>(_ctrlData->deactive_path),

@@ -31,16 +31,20 @@ struct GSxControllerData;
 ///
 ///   constructed --initialize() WYX_OK--> session open --quit()--> constructed
 ///
-/// Threads: every operation may be called from any thread, but no thread may be inside any operation of the
-/// controller, of a client, or inside dispatch() of another thread, while the controller is destroyed. The
-/// controller's lock is taken before a client's, never the reverse.
+/// Threads: every operation may be called from any thread. While a controller is destroyed no thread may be inside
+/// dispatch() or any other operation of it or of a client. The controller's lock is taken before a client's, never
+/// the reverse.
+///
 /// Callbacks (the virtual functions below and those of the clients) run on the thread that called dispatch(),
 /// inside it, with no lock of the library held: they may issue requests, call dispatch() again, construct clients
-/// and destroy them, the one that the callback belongs to included. They must not wait for notifications. Errors:
-/// results are the base API's, passed on unchanged. WYX_NOT_SUPPORTED also stands for an operation that the base
-/// API library does not have. Fatal: the base API library or the product version cannot be had; the process aborts
-/// with a message on standard error. Cancellation: dispatch() may be a cancellation point through the
-/// application's callbacks; a request and a destructor are not: a cancelled thread finishes them first.
+/// and destroy them, the one that the callback belongs to included. They must not wait for notifications.
+///
+/// Errors: results are the base API's, passed on unchanged. WYX_NOT_SUPPORTED also stands for an operation that
+/// the base API library does not have. Fatal: the base API library or the product version cannot be had; the
+/// process aborts with a message on standard error.
+///
+/// Cancellation: dispatch() may be a cancellation point through the application's callbacks. A request and a
+/// destructor are not: a cancelled thread finishes them first. (The base API's entry points are none either.)
 class ZN_GSCL_EXPORT GSController : public GSLockableObject {
  public:
   /// Becomes the current controller, whichever was current before, and reads the installed product version.

@@ -150,7 +150,10 @@ void GSController::stub_approvedCb(const wyx_approved_notification_t* notificati
     provider->approvedCb(notification);
     GS_TRACE(GSCL_TRC_DETAIL, "returned from approvedCb()\n");
   });
-  if (alive) GS_TRACE(GSCL_TRC_API, "GSController::stub_approvedCb(%s) done\n", GSCL_ID(provider));
+  if (!alive) return;
+  // A thread that waited for this notification has gone on and may be destroying the provider.
+  GS_TRACE(GSCL_TRC_API, "GSController::stub_approvedCb(%s) done\n",
+           gscl_internal::text(gscl_internal::providerTraceId(provider)));
 }
 
 void GSController::stub_rejectedCb(const wyx_rejected_notification_t* notification) {

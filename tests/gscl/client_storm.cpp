@@ -60,6 +60,23 @@ class Vanishing : public GSProvider {
 };
 std::atomic<int> Vanishing::vanished{0};
 
+// Of a class of its own, destroyed on another thread when its last notification has been waited for.
+class Counting : public GSProvider {
+ public:
+  using GSProvider::GSProvider;
+  void approvedCb(const wyx_approved_notification_t*) override { ++approved; }
+  int approved = 0;  // ordered by dispatch and wait
+};
+
+void lifeOfACounter(short instance) {
+  Counting provider("storm", instance, nullptr);
+  EXPECT_EQ(provider.joinGroup(), WYX_OK);
+  EXPECT_EQ(waitFor(provider, nullptr), zelt_gscl::GS_WAITFOR_RECEIVED);
+  EXPECT_EQ(provider.changeStateValue(wyx_state_value_t{0, nullptr}, WYX_1_PHASE, 0), WYX_OK);
+  EXPECT_EQ(waitFor(provider, nullptr), zelt_gscl::GS_WAITFOR_RECEIVED);
+  EXPECT_EQ(provider.approved, 2);
+}
+
 void lifeOfAMember(short instance, int round) {
   GSProvider provider("storm", instance, nullptr);
   wyx_notification_type_t type;
@@ -92,7 +109,25 @@ void lifeOfASubscriber(int round) {
   EXPECT_EQ(members.count(), 8);
 }
 
+/// Every trace line is made, then dropped.
+class TraceIntoNothing {
+ public:
+  TraceIntoNothing() : before_(GSSetTraceRtn([](int, char*) {})) {
+    GSSetDebugLevel(GSCL_TRC_API | GSCL_TRC_DETAIL | GSCL_TRC_WARNING);
+  }
+  ~TraceIntoNothing() {
+    GSSetDebugLevel(0);
+    GSSetTraceRtn(before_);
+  }
+  TraceIntoNothing(const TraceIntoNothing&) = delete;
+  TraceIntoNothing& operator=(const TraceIntoNothing&) = delete;
+
+ private:
+  gscl_tracef_rtn before_;
+};
+
 TEST(ClientStorm, EverythingAtOnce) {
+  TraceIntoNothing trace;
   FakeDaemon daemon;
   GSController controller;
   Vanishing::vanished = 0;
@@ -104,6 +139,7 @@ TEST(ClientStorm, EverythingAtOnce) {
         for (int round = 0; round < kRounds; ++round) {
           lifeOfAMember(static_cast<short>(worker), round);
           lifeOfASubscriber(round);
+          lifeOfACounter(static_cast<short>(worker));
         }
       });
     }
