@@ -1,22 +1,13 @@
 #include "local_socket.h"
 
-#include <errno.h>
 #include <stddef.h>
 #include <string.h>
-#include <unistd.h>
 
 namespace kpl {
 
-void Descriptor::reset(int fd) {
-  if (fd_ >= 0) {
-    const int saved_errno = errno;
-    close(fd_);
-    errno = saved_errno;
-  }
-  fd_ = fd;
+platform::Descriptor open_datagram_socket() {
+  return platform::Descriptor(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
 }
-
-int open_datagram_socket() { return socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0); }
 
 socklen_t address_length(const sockaddr_un& address) {
   constexpr size_t kPathOffset = offsetof(sockaddr_un, sun_path);

@@ -20,12 +20,12 @@ constexpr milliseconds kPatience{2000};
 /// The answer that a thread is giving.
 struct Answer {
   kplhdr header;
-  kpl::Descriptor socket;
+  platform::Descriptor socket;
   milliseconds patience = kPatience;
   int gone = 0;  ///< the error that told that the requester is gone; 0 while it is there
 
   void restart() {
-    socket.reset();
+    socket = platform::Descriptor();
     patience = kPatience;
     gone = 0;
   }
@@ -36,8 +36,8 @@ thread_local Answer answer;
 int connect_to(const sockaddr_un& retaddr) {
   const socklen_t length = kpl::address_length(retaddr);
   if (length == 0) return EDESTADDRREQ;
-  answer.socket.reset(kpl::open_datagram_socket());
-  if (!answer.socket.is_open()) return errno;
+  answer.socket = kpl::open_datagram_socket();
+  if (!answer.socket) return errno;
   const auto* address = reinterpret_cast<const sockaddr*>(&retaddr);
   return connect(answer.socket.get(), address, length) == 0 ? 0 : errno;
 }
@@ -83,7 +83,7 @@ int kplsrpy(kplhdr* header, char* reply, int reply_len, int cont) {
   own.retaddr = header->retaddr;
   own.dversion = header->dversion;
   own.cont = static_cast<short>(cont);
-  if (answer.gone == 0 && !answer.socket.is_open()) answer.gone = connect_to(own.retaddr);
+  if (answer.gone == 0 && !answer.socket) answer.gone = connect_to(own.retaddr);
   if (answer.gone == 0) answer.gone = send_packet(&own, reply + sizeof own, reply_len - sizeof own);
   const int error = answer.gone;
   if (cont == KPL_CONT_END) answer.restart();

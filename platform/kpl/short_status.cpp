@@ -45,12 +45,12 @@ struct Question {
 static_assert(sizeof(Question) == 160);
 
 /// Opens a socket with an address that the kernel chooses, sends the question from it; returns an error number.
-int ask(const char* subsystem, pid_t pid, kpl::Descriptor* socket) {
+int ask(const char* subsystem, pid_t pid, platform::Descriptor* socket) {
   sockaddr_un master;
   const char* place = getenv(KPL_MASTER_ENV);
   if (!kpl::address_from_text(place != nullptr ? place : KPL_MASTER_DEFAULT, &master)) return EINVAL;
-  socket->reset(kpl::open_datagram_socket());
-  if (!socket->is_open()) return errno;
+  *socket = kpl::open_datagram_socket();
+  if (!*socket) return errno;
 
   const int on = 1;
   const timeval patience = {kPatience.count(), 0};
@@ -164,7 +164,7 @@ int kplstat(char* host, char* subsystem, pid_t pid, short* reply_len, char* repl
   const size_t room = (*reply_len - sizeof(kplhdr)) / sizeof(statcode);
   if (*cont == KPL_CONT_FIRST) {
     query.forget();
-    kpl::Descriptor socket;
+    platform::Descriptor socket;
     short rtncode = KPL_RC_OK;
     int error = ask(subsystem != nullptr ? subsystem : "", pid, &socket);
     if (error == 0) error = collect(socket.get(), &rtncode);
