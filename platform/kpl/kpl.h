@@ -37,10 +37,10 @@ extern "C" {
 /// The version word of records made by this release.
 #define KPL_VERSION 1
 
-/// Where the master listens: the path in this environment variable (a leading '@' stands for the NUL of an
+/// Where the master answers kplstat: the path in this environment variable (a leading '@' stands for the NUL of an
 /// abstract name), which the master sets for every subsystem; without it, the default path.
 #define KPL_MASTER_ENV "KPL_MASTER_SOCKET"
-#define KPL_MASTER_DEFAULT "/run/kplmstr/control"
+#define KPL_MASTER_DEFAULT "/run/kplmstr/status"
 
 enum {
   KPL_OBJECT_SUBSYSTEM = 17  ///< `subreq.object`: a subsystem, the only object that subsystems serve

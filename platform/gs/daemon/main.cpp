@@ -1,6 +1,4 @@
 // gsd: the group-services daemon, in the foreground.
-#include <spdlog/sinks/stdout_sinks.h>
-#include <spdlog/spdlog.h>
 #include <sys/resource.h>
 #include <unistd.h>
 
@@ -8,6 +6,7 @@
 #include <cstdio>
 #include <exception>
 
+#include "common/log.h"
 #include "daemon/options.h"
 #include "daemon/server.h"
 
@@ -24,13 +23,6 @@ void raise_descriptor_limit() {
   setrlimit(RLIMIT_NOFILE, &limit);
 }
 
-std::shared_ptr<spdlog::logger> make_log(spdlog::level::level_enum level) {
-  auto log = spdlog::stderr_logger_st("gsd");
-  log->set_pattern("%Y-%m-%dT%H:%M:%S.%e%z %l %v");
-  log->set_level(level);
-  return log;
-}
-
 void tell_ready(int fd) {
   if (fd < 0) return;
   constexpr char kReady[] = "ready\n";
@@ -41,7 +33,7 @@ void tell_ready(int fd) {
 void serve(const gs::daemon::Options& options) {
   signal(SIGPIPE, SIG_IGN);
   raise_descriptor_limit();
-  const auto log = make_log(options.log_level);
+  const auto log = platform::make_log("gsd", options.log_level);
   gs::daemon::Server server(options, log);
   log->info("gsd " GSD_VERSION " serves {} as node {}", options.socket_path, options.node_number);
   tell_ready(options.ready_fd);

@@ -7,6 +7,7 @@
 #include <iostream>
 #include <iterator>
 
+#include "common/log.h"
 #include "common/toml_file.h"
 
 namespace gs::daemon {
@@ -51,19 +52,10 @@ Problem set_queue_bound(Options& options, const std::string& text) {
   return problem;
 }
 Problem set_log_level(Options& options, const std::string& text) {
-  static constexpr struct {
-    const char* name;
-    spdlog::level::level_enum level;
-  } kLevels[] = {{"error", spdlog::level::err},
-                 {"warning", spdlog::level::warn},
-                 {"info", spdlog::level::info},
-                 {"debug", spdlog::level::debug}};
-  for (const auto& level : kLevels) {
-    if (text != level.name) continue;
-    options.log_level = level.level;
-    return {};
-  }
-  return "must be error, warning, info or debug, not '" + text + "'";
+  const auto level = platform::log_level(text);
+  if (!level) return "must be error, warning, info or debug, not '" + text + "'";
+  options.log_level = *level;
+  return {};
 }
 
 /// One setting, of the same name on the command line (with -- before it) and in the configuration file.

@@ -1,0 +1,18 @@
+// The daemons' log: lines on standard error.
+#pragma once
+
+#include <spdlog/logger.h>
+
+#include <memory>
+#include <optional>
+#include <string>
+
+namespace platform {
+
+/// "error", "warning", "info" or "debug"; nothing for any other text.
+std::optional<spdlog::level::level_enum> log_level(const std::string& name);
+
+/// For one thread. `name` is the logger's, not printed.
+std::shared_ptr<spdlog::logger> make_log(const std::string& name, spdlog::level::level_enum level);
+
+}  // namespace platform

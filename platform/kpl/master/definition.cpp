@@ -1,0 +1,212 @@
+#include "master/definition.h"
+
+#include <cctype>
+#include <algorithm>
+#include <cstring>
+#include <filesystem>
+#include <iterator>
+#include <system_error>
+
+#include "common/toml_file.h"
+#include "kpl.h"
+
+namespace kpl::master {
+namespace {
+
+using platform::place_of;
+using platform::Problem;
+using platform::SettingError;
+
+constexpr std::size_t kMaxName = sizeof(subreq::objname) - 1;
+constexpr double kMinSeconds = 0.001;
+constexpr double kMaxSeconds = 86'400;
+constexpr int kMaxSignal = 30;
+
+Problem set_text(const toml::value& value, std::string* text) {
+  if (!value.is_string()) return "must be a text in quotes";
+  *text = value.as_string().str;
+  if (text->find('\0') != std::string::npos) return "may hold no NUL";
+  return {};
+}
+
+/// Names go into status lines and log lines, and into records of fixed size.
+Problem set_name(const toml::value& value, std::string* name) {
+  Problem problem = set_text(value, name);
+  if (!problem.empty()) return problem;
+  const auto allowed = [](unsigned char c) { return std::isalnum(c) || strchr("._-", c) != nullptr; };
+  if (!name->empty() && name->size() <= kMaxName && std::all_of(name->begin(), name->end(), allowed)) return {};
+  return "must be 1 to " + std::to_string(kMaxName) + " letters, digits, '.', '_' or '-'";
+}
+
+Problem set_path(const toml::value& value, std::string* path) {
+  Problem problem = set_text(value, path);
+  if (problem.empty() && !path->starts_with('/')) problem = "must be a path that begins with '/'";
+  return problem;
+}
+
+Problem set_number(const toml::value& value, int min, int max, int* number) {
+  if (value.is_integer() && value.as_integer() >= min && value.as_integer() <= max) {
+    *number = static_cast<int>(value.as_integer());
+    return {};
+  }
+  return "must be a whole number from " + std::to_string(min) + " to " + std::to_string(max);
+}
+
+Problem set_truth(const toml::value& value, bool* truth) {
+  if (!value.is_boolean()) return "must be true or false";
+  *truth = value.as_boolean();
+  return {};
+}
+
+Problem set_seconds(const toml::value& value, Duration* time) {
+  double seconds = 0;
+  if (value.is_integer()) seconds = static_cast<double>(value.as_integer());
+  if (value.is_floating()) seconds = value.as_floating();
+  if (!(seconds >= kMinSeconds && seconds <= kMaxSeconds)) return "must be 0.001 to 86400 seconds";
+  *time = std::chrono::duration_cast<Duration>(std::chrono::duration<double>(seconds));
+  return {};
+}
+
+Problem set_signal(const toml::value& value, int* signal) {
+  std::string name;
+  Problem problem = set_text(value, &name);
+  if (!problem.empty()) return problem;
+  if (name.starts_with("SIG")) name.erase(0, 3);
+  for (int number = 1; number <= kMaxSignal; ++number) {
+    const char* known = sigabbrev_np(number);
+    if (known == nullptr || name != known) continue;
+    *signal = number;
+    return {};
+  }
+  return "must be the name of a signal, such as \"SIGUSR1\"";
+}
+
+Problem set_arguments(const toml::value& value, std::vector<std::string>* arguments) {
+  if (!value.is_array()) return "must be a list of texts in quotes";
+  for (const toml::value& one : value.as_array()) {
+    Problem problem = set_text(one, &arguments->emplace_back());
+    if (!problem.empty()) return "each " + problem;
+  }
+  return {};
+}
+
+Problem set_transport(const toml::value& value, Transport* transport) {
+  std::string name;
+  Problem problem = set_text(value, &name);
+  if (!problem.empty()) return problem;
+  for (const Transport known : {Transport::kSocket, Transport::kQueue, Transport::kSignals}) {
+    if (name != name_of(known)) continue;
+    *transport = known;
+    return {};
+  }
+  return "must be \"socket\", \"queue\" or \"signals\"";
+}
+
+using Value = const toml::value&;
+
+struct Setting {
+  const char* name;
+  Problem (*set)(Definition&, Value);
+};
+constexpr Setting kSettings[] = {
+    {"name", [](Definition& d, Value v) { return set_name(v, &d.name); }},
+    {"group", [](Definition& d, Value v) { return set_name(v, &d.group); }},
+    {"program", [](Definition& d, Value v) { return set_path(v, &d.program); }},
+    {"arguments", [](Definition& d, Value v) { return set_arguments(v, &d.arguments); }},
+    {"user", [](Definition& d, Value v) { return set_text(v, &d.user); }},
+    {"output", [](Definition& d, Value v) { return set_path(v, &d.output); }},
+    {"autostart", [](Definition& d, Value v) { return set_truth(v, &d.autostart); }},
+    {"restart", [](Definition& d, Value v) { return set_truth(v, &d.restart); }},
+    {"transport", [](Definition& d, Value v) { return set_transport(v, &d.transport); }},
+    {"queue-key", [](Definition& d, Value v) { return set_number(v, 1, INT32_MAX, &d.queue_key); }},
+    {"queue-type", [](Definition& d, Value v) { return set_number(v, 1, INT32_MAX, &d.queue_type); }},
+    {"normal-signal", [](Definition& d, Value v) { return set_signal(v, &d.normal_signal); }},
+    {"forced-signal", [](Definition& d, Value v) { return set_signal(v, &d.forced_signal); }},
+    {"request-time", [](Definition& d, Value v) { return set_seconds(v, &d.request_time); }},
+    {"stop-time", [](Definition& d, Value v) { return set_seconds(v, &d.stop_time); }},
+    {"restart-delay", [](Definition& d, Value v) { return set_seconds(v, &d.restart_delay); }},
+    {"restart-delay-max", [](Definition& d, Value v) { return set_seconds(v, &d.restart_delay_max); }},
+};
+
+void apply(const std::string& name, const toml::value& value, Definition& definition) {
+  const auto* setting =
+      std::find_if(std::begin(kSettings), std::end(kSettings), [&](const Setting& s) { return name == s.name; });
+  if (setting == std::end(kSettings)) throw SettingError(place_of(value) + ": unknown setting '" + name + "'");
+  const Problem problem = setting->set(definition, value);
+  if (!problem.empty()) throw SettingError(place_of(value) + ": " + name + ": " + problem);
+}
+
+/// Settings that say nothing without another one are mistakes.
+void check(const toml::value& file, const Definition& definition) {
+  for (const char* needed : {"name", "program"}) {
+    if (!file.contains(needed)) throw SettingError(definition.file + ": '" + needed + "' is missing");
+  }
+  const bool queue = definition.transport == Transport::kQueue;
+  if (queue && definition.queue_key == 0) {
+    throw SettingError(place_of(file.at("transport")) + ": transport: a queue needs a 'queue-key' too");
+  }
+  const auto refuse = [&](const char* name, const char* transport) {
+    if (!file.contains(name)) return;
+    throw SettingError(place_of(file.at(name)) + ": " + name + ": is for transport = \"" + transport + "\" only");
+  };
+  if (!queue) {
+    refuse("queue-key", "queue");
+    refuse("queue-type", "queue");
+  }
+  if (definition.transport != Transport::kSignals) {
+    refuse("normal-signal", "signals");
+    refuse("forced-signal", "signals");
+  }
+}
+
+std::vector<std::string> toml_files(const std::string& folder) {
+  std::error_code error;
+  std::vector<std::string> files;
+  std::filesystem::directory_iterator entries(folder, error);
+  for (; !error && entries != std::filesystem::directory_iterator(); entries.increment(error)) {
+    if (entries->path().extension() == ".toml") files.push_back(entries->path());
+  }
+  if (error) throw SettingError(folder + ": cannot be read: " + error.message());
+  std::sort(files.begin(), files.end());
+  return files;
+}
+
+}  // namespace
+
+const char* name_of(Transport transport) {
+  switch (transport) {
+    case Transport::kSocket: return "socket";
+    case Transport::kQueue: return "queue";
+    case Transport::kSignals: return "signals";
+  }
+  return "unknown";
+}
+
+Definition read_definition(const std::string& file) {
+  const toml::value content = platform::parse_toml_file(file);
+  Definition definition;
+  definition.file = file;
+  for (const auto& [name, value] : content.as_table()) apply(name, value, definition);
+  check(content, definition);
+  return definition;
+}
+
+Folder read_folder(const std::string& folder) {
+  Folder result;
+  for (const std::string& file : toml_files(folder)) {
+    try {
+      Definition definition = read_definition(file);
+      const auto same = [&](const Definition& other) { return other.name == definition.name; };
+      const auto taken = std::find_if(result.definitions.begin(), result.definitions.end(), same);
+      if (taken != result.definitions.end()) {
+        throw SettingError(file + ": name: '" + definition.name + "' is taken by " + taken->file);
+      }
+      result.definitions.push_back(std::move(definition));
+    } catch (const SettingError& error) {
+      result.problems.push_back(error.what());
+    }
+  }
+  return result;
+}
+
+}  // namespace kpl::master

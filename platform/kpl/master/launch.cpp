@@ -1,0 +1,159 @@
+#include "master/launch.h"
+
+#include <fcntl.h>
+#include <grp.h>
+#include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <vector>
+
+#include "kpl.h"
+
+extern char** environ;
+
+namespace kpl::master {
+namespace {
+
+using platform::Descriptor;
+
+constexpr int kExitNotRun = 127;
+
+/// What the new process tells when it cannot become the program.
+struct Failure {
+  enum Step : int { kSession, kDescriptors, kUser, kProgram } step;
+  int error;
+};
+
+/// Made before the fork: between fork and exec nothing may allocate.
+struct Plan {
+  std::vector<std::string> texts;
+  std::vector<char*> argv;
+  std::vector<char*> envp;
+  bool change_user = false;
+  uid_t uid = 0;
+  gid_t gid = 0;
+  std::vector<gid_t> groups;
+  Descriptor null;
+  Descriptor output;  // empty: the master's own
+};
+
+void plan_user(const Definition& definition, Plan& plan) {
+  std::uint64_t number = 0;
+  const bool is_number = platform::set_number(definition.user, 0, UINT32_MAX - 1, &number).empty();
+  const passwd* user =
+      is_number ? getpwuid(static_cast<uid_t>(number)) : getpwnam(definition.user.c_str());
+  if (user == nullptr) throw LaunchError("there is no user '" + definition.user + "'");
+  if (user->pw_uid == geteuid()) return;
+  plan.change_user = true;
+  plan.uid = user->pw_uid;
+  plan.gid = definition.transport == Transport::kSignals ? user->pw_gid : 0;
+  int count = 64;
+  plan.groups.resize(static_cast<std::size_t>(count));
+  while (getgrouplist(user->pw_name, user->pw_gid, plan.groups.data(), &count) < 0) {
+    plan.groups.resize(static_cast<std::size_t>(count));
+  }
+  plan.groups.resize(static_cast<std::size_t>(count));
+}
+
+void plan_texts(const Definition& definition, const std::string& status_socket, Plan& plan) {
+  const std::string variable = KPL_MASTER_ENV "=";
+  plan.texts = {variable + status_socket, definition.program};
+  plan.texts.insert(plan.texts.end(), definition.arguments.begin(), definition.arguments.end());
+  for (std::size_t i = 1; i < plan.texts.size(); ++i) plan.argv.push_back(plan.texts[i].data());
+  plan.argv.push_back(nullptr);
+  for (char** one = environ; *one != nullptr; ++one) {
+    if (strncmp(*one, variable.c_str(), variable.size()) != 0) plan.envp.push_back(*one);
+  }
+  plan.envp.push_back(plan.texts[0].data());
+  plan.envp.push_back(nullptr);
+}
+
+void plan_files(const Definition& definition, Plan& plan) {
+  struct stat found {};
+  if (stat(definition.program.c_str(), &found) != 0) {
+    throw LaunchError("cannot run " + definition.program + ": " + strerror(errno));
+  }
+  plan.null = Descriptor(open("/dev/null", O_RDWR | O_CLOEXEC));
+  if (!plan.null) throw LaunchError(std::string("cannot open /dev/null: ") + strerror(errno));
+  if (definition.output.empty()) return;
+  plan.output = Descriptor(
+      open(definition.output.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NOFOLLOW, 0640));
+  if (!plan.output) throw LaunchError("cannot open " + definition.output + ": " + strerror(errno));
+}
+
+[[noreturn]] void give_up(int report, Failure::Step step) {
+  const Failure failure{step, errno};
+  if (write(report, &failure, sizeof failure) < 0) _exit(kExitNotRun + 1);
+  _exit(kExitNotRun);
+}
+
+/// The handlers of the master's loop would write into what it shares with this process.
+void reset_signals(const sigset_t& mask) {
+  struct sigaction by_default {};
+  by_default.sa_handler = SIG_DFL;
+  for (int number = 1; number < NSIG; ++number) sigaction(number, &by_default, nullptr);
+  sigprocmask(SIG_SETMASK, &mask, nullptr);
+}
+
+[[noreturn]] void become(const Plan& plan, int request_end, int report, const sigset_t& mask) {
+  if (setsid() < 0) give_up(report, Failure::kSession);
+  const int output = plan.output ? plan.output.get() : STDERR_FILENO;
+  if (dup2(request_end >= 0 ? request_end : plan.null.get(), STDIN_FILENO) < 0 ||
+      dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0) {
+    give_up(report, Failure::kDescriptors);
+  }
+  if (plan.change_user && (setgroups(plan.groups.size(), plan.groups.data()) != 0 || setgid(plan.gid) != 0 ||
+                           setuid(plan.uid) != 0)) {
+    give_up(report, Failure::kUser);
+  }
+  reset_signals(mask);
+  execve(plan.argv[0], plan.argv.data(), plan.envp.data());
+  give_up(report, Failure::kProgram);
+}
+
+}  // namespace
+
+Launched launch(const Definition& definition, int request_end, const std::string& status_socket) {
+  Plan plan;
+  plan_user(definition, plan);
+  plan_texts(definition, status_socket, plan);
+  plan_files(definition, plan);
+  std::array<int, 2> report{};
+  if (pipe2(report.data(), O_CLOEXEC) != 0) throw LaunchError(std::string("cannot make a pipe: ") + strerror(errno));
+  Descriptor reader(report[0]);
+  const Descriptor writer(report[1]);
+  fcntl(reader.get(), F_SETFL, O_NONBLOCK);
+
+  sigset_t all;
+  sigset_t before;
+  sigfillset(&all);
+  sigprocmask(SIG_SETMASK, &all, &before);
+  const pid_t pid = fork();
+  if (pid == 0) become(plan, request_end, writer.get(), before);
+  const int error = errno;
+  sigprocmask(SIG_SETMASK, &before, nullptr);
+  if (pid < 0) throw LaunchError(std::string("cannot make a process: ") + strerror(error));
+  return {pid, std::move(reader)};
+}
+
+std::optional<std::string> launch_result(const Definition& definition, int report) {
+  Failure failure{};
+  const ssize_t got = read(report, &failure, sizeof failure);
+  if (got < 0 && (errno == EAGAIN || errno == EINTR)) return std::nullopt;
+  if (got != sizeof failure) return "";
+  const std::string why = std::string(": ") + strerror(failure.error);
+  switch (failure.step) {
+    case Failure::kSession: return "cannot make a session" + why;
+    case Failure::kDescriptors: return "cannot set up descriptors" + why;
+    case Failure::kUser: return "cannot become user '" + definition.user + "'" + why;
+    case Failure::kProgram: break;
+  }
+  return "cannot run " + definition.program + why;
+}
+
+}  // namespace kpl::master

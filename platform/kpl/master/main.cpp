@@ -1,0 +1,105 @@
+// kplmstr: the KPL master.
+#include <fcntl.h>
+#include <sys/prctl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <optional>
+#include <system_error>
+
+#include "common/log.h"
+#include "master/definition.h"
+#include "master/master.h"
+#include "master/options.h"
+#include "master/parent.h"
+
+namespace {
+
+using kpl::master::Options;
+using platform::Descriptor;
+
+constexpr int kExitFailure = 1;
+constexpr int kExitBadOption = 2;
+
+Descriptor checked_open(const std::string& path, int flags) {
+  Descriptor opened(open(path.c_str(), flags | O_CLOEXEC | O_NOCTTY, 0640));
+  if (!opened) throw std::system_error(errno, std::generic_category(), path);
+  return opened;
+}
+
+/// Descriptors 0 to 2 are open, and 1 and 2 are the log file where one is wanted.
+void set_standard_descriptors(const std::string& log_file) {
+  const Descriptor null(open("/dev/null", O_RDWR | O_NOCTTY));
+  if (null.get() >= 0 && null.get() <= STDERR_FILENO) return set_standard_descriptors(log_file);
+  if (log_file.empty()) return;
+  const Descriptor log = checked_open(log_file, O_WRONLY | O_APPEND | O_CREAT);
+  dup2(log.get(), STDOUT_FILENO);
+  dup2(log.get(), STDERR_FILENO);
+}
+
+/// A daemon keeps nothing of what it was started with.
+void leave_standard_descriptors(bool keep_log) {
+  const Descriptor null = checked_open("/dev/null", O_RDWR);
+  dup2(null.get(), STDIN_FILENO);
+  if (keep_log) return;
+  dup2(null.get(), STDOUT_FILENO);
+  dup2(null.get(), STDERR_FILENO);
+}
+
+int check(const Options& options) {
+  const auto folder = kpl::master::read_folder(options.definitions);
+  for (const std::string& problem : folder.problems) fprintf(stderr, "kplmstr: %s\n", problem.c_str());
+  printf("%zu subsystems defined in %s\n", folder.definitions.size(), options.definitions.c_str());
+  return folder.problems.empty() ? 0 : kExitFailure;
+}
+
+/// Throws when subsystems would not take this process for the master: they would detach from it and be lost.
+void be_the_parent() {
+  setsid();  // fails where this process leads a group already, which parent_problem tells apart
+  const std::string problem = kpl::master::parent_problem();
+  if (!problem.empty()) throw std::runtime_error("cannot serve subsystems: " + problem);
+  prctl(PR_SET_NAME, "kplmstr");  // the name that subsystems look for
+}
+
+void serve(const Options& options) {
+  signal(SIGPIPE, SIG_IGN);
+  set_standard_descriptors("");
+  std::optional<kpl::master::Detached> detached;
+  if (options.daemon) detached.emplace();
+  be_the_parent();
+  umask(S_IWGRP | S_IWOTH);
+  if (chdir("/") != 0) throw std::system_error(errno, std::generic_category(), "chdir");
+  if (!options.daemon) set_standard_descriptors(options.log_file);
+  const auto log = platform::make_log("kplmstr", options.log_level);
+  kpl::master::Master master(options, log);
+  if (detached) {
+    set_standard_descriptors(options.log_file);
+    leave_standard_descriptors(!options.log_file.empty());
+  }
+  log->info("kplmstr " KPL_PROGRAM_VERSION " serves {}", options.socket_path);
+  master.start_subsystems();
+  if (detached) detached->ready();
+  master.run();
+  log->info("stopped");
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  try {
+    const auto options = kpl::master::parse_options(argc, argv);
+    if (!options) return 0;
+    if (options->check) return check(*options);
+    serve(*options);
+    return 0;
+  } catch (const platform::SettingError& error) {
+    fprintf(stderr, "kplmstr: %s\n", error.what());
+    return kExitBadOption;
+  } catch (const std::exception& error) {
+    fprintf(stderr, "kplmstr: %s\n", error.what());
+    return kExitFailure;
+  }
+}

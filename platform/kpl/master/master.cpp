@@ -1,0 +1,183 @@
+#include "master/master.h"
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <csignal>
+
+#include "kpl.h"
+
+namespace kpl::master {
+namespace {
+
+using control::Action;
+using control::End;
+using control::Result;
+
+constexpr int kFirstOwnCode = 256;
+
+platform::AccessRule access_rule(const Options& options) {
+  return {geteuid(), platform::group_id(options.access_group)};
+}
+
+/// The default socket's directory is the master's own.
+const std::string& prepared(const std::string& path) {
+  if (path == control::kDefaultSocketPath) platform::make_directory_of(path);
+  return path;
+}
+
+Question question_of(const control::Request& request) {
+  const auto is_long = static_cast<short>(request.long_form);
+  switch (request.action) {
+    case Action::kStatus: return {KPL_ACTION_STATUS, is_long, 0, {}};
+    case Action::kTrace: return {KPL_ACTION_TRACE, is_long, static_cast<short>(request.on), {}};
+    case Action::kRefresh: return {KPL_ACTION_REFRESH, 0, 0, {}};
+    default: break;
+  }
+  return {static_cast<short>(request.code), static_cast<short>(request.parm1), static_cast<short>(request.parm2),
+          request.data};
+}
+
+std::string padded(std::string text, std::size_t width) {
+  text.resize(std::max(text.size() + 1, width), ' ');
+  return text;
+}
+
+control::Line short_line(const std::string& name, const std::string& group, const std::string& pid,
+                         const std::string& state) {
+  return {name, padded(group, 18) + padded(pid, 9) + state};
+}
+
+}  // namespace
+
+Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log)
+    : log_(std::move(log)),
+      folder_(options.definitions),
+      status_socket_(options.status_socket_path()),
+      control_(loop_, *log_, prepared(options.socket_path), access_rule(options),
+               [this](const control::Request& request, const Reply& reply) { on_request(request, reply); }),
+      status_(loop_, status_socket_, [this](const std::string& name, int pid) { return short_status(name, pid); }),
+      children_(loop_, SIGCHLD, EV_SIGNAL | EV_PERSIST, [this] { on_children(); }),
+      hangup_(loop_, SIGHUP, EV_SIGNAL | EV_PERSIST, [this] { read_definitions(); }),
+      terminated_(loop_, SIGTERM, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }),
+      interrupted_(loop_, SIGINT, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }) {
+  read_definitions();
+}
+
+// -------------------------------------------------------------------------------------------------- definitions
+
+/// A subsystem that is no longer defined is forgotten once it has no process.
+void Master::read_definitions() {
+  Folder folder;
+  try {
+    folder = read_folder(folder_);
+  } catch (const platform::SettingError& error) {
+    folder.problems.push_back(error.what());
+  }
+  problems_ = std::move(folder.problems);
+  for (const std::string& problem : problems_) log_->error("{}; skipped", problem);
+  std::erase_if(subsystems_, [&](const auto& entry) {
+    const auto same = [&](const Definition& definition) { return definition.name == entry.first; };
+    return entry.second.state() == Subsystem::State::kInactive &&
+           std::none_of(folder.definitions.begin(), folder.definitions.end(), same);
+  });
+  for (Definition& definition : folder.definitions) {
+    const auto found = subsystems_.find(definition.name);
+    if (found != subsystems_.end()) {
+      found->second.set_definition(std::move(definition));
+    } else {
+      const std::string name = definition.name;
+      subsystems_.try_emplace(name, std::move(definition), Surroundings{loop_, *log_, status_socket_});
+    }
+  }
+  log_->info("{} subsystems defined in {}", subsystems_.size(), folder_);
+}
+
+void Master::start_subsystems() {
+  for (auto& [name, subsystem] : subsystems_) {
+    if (subsystem.definition().autostart) subsystem.start([](const control::Answer&) {});  // logged there
+  }
+}
+
+// ------------------------------------------------------------------------------------------------- processes
+
+void Master::on_children() {
+  for (;;) {
+    int status = 0;
+    const pid_t pid = waitpid(-1, &status, WNOHANG);
+    if (pid <= 0) break;
+    const auto found = std::find_if(subsystems_.begin(), subsystems_.end(),
+                                    [&](const auto& entry) { return entry.second.pid() == pid; });
+    if (found != subsystems_.end()) found->second.ended(status);
+  }
+  if (stopping_) stop_when_all_ended();
+}
+
+void Master::on_terminate() {
+  if (stopping_) return;
+  stopping_ = true;
+  log_->info("stopping");
+  for (auto& [name, subsystem] : subsystems_) {
+    if (subsystem.state() == Subsystem::State::kInactive) continue;
+    subsystem.stop(control::StopKind::kCancel, [](const control::Answer&) {});
+  }
+  stop_when_all_ended();
+}
+
+void Master::stop_when_all_ended() {
+  const auto has_process = [](const auto& entry) { return entry.second.pid() > 0; };
+  if (std::none_of(subsystems_.begin(), subsystems_.end(), has_process)) loop_.stop();
+}
+
+// --------------------------------------------------------------------------------------------------- requests
+
+void Master::on_request(const control::Request& request, const Reply& reply) {
+  const bool for_all = request.subsystem.empty();
+  const bool short_answer = request.action == Action::kList || (request.action == Action::kStatus && !request.long_form);
+  if (for_all && !short_answer) return reply(End{Result::kFailed, 0, "a subsystem must be named"});
+  const auto found = subsystems_.find(request.subsystem);
+  if (!for_all && found == subsystems_.end()) {
+    return reply(End{Result::kWrongState, 0, "there is no subsystem '" + request.subsystem + "'"});
+  }
+  if (short_answer) return tell_subsystems(request, reply);
+  on_subsystem_request(found->second, request, reply);
+}
+
+void Master::tell_subsystems(const control::Request& request, const Reply& reply) {
+  for (const auto& [name, subsystem] : subsystems_) {
+    if (request.subsystem.empty() || name == request.subsystem) reply(subsystem.entry());
+  }
+  if (request.action == Action::kList && request.subsystem.empty()) {
+    for (const std::string& problem : problems_) reply(control::Message{problem + "; skipped"});
+  }
+  reply(End{});
+}
+
+void Master::on_subsystem_request(Subsystem& subsystem, const control::Request& request, const Reply& reply) {
+  if (request.action == Action::kStart && stopping_) return reply(End{Result::kWrongState, 0, "kplmstr is stopping"});
+  if (request.action == Action::kStart) return subsystem.start(reply);
+  if (request.action == Action::kStop) return subsystem.stop(request.stop, reply);
+  if (request.action == Action::kRequest && request.code < kFirstOwnCode) {
+    return reply(End{Result::kFailed, 0, "the code must be 256 or more"});
+  }
+  if (request.data.size() > control::kMaxData) {
+    return reply(End{Result::kFailed, 0, "the data is longer than " + std::to_string(control::kMaxData) + " bytes"});
+  }
+  subsystem.ask(question_of(request), reply);
+}
+
+std::optional<std::vector<control::Line>> Master::short_status(const std::string& name, int pid) const {
+  const auto wanted = [&](const auto& entry) {
+    return name.empty() ? pid > 0 && entry.second.pid() == pid : entry.first == name;
+  };
+  const auto found = std::find_if(subsystems_.begin(), subsystems_.end(), wanted);
+  if (found == subsystems_.end()) return std::nullopt;
+  const Subsystem& subsystem = found->second;
+  const std::string id = subsystem.pid() > 0 ? std::to_string(subsystem.pid()) : "-";
+  return std::vector<control::Line>{
+      short_line("Subsystem", "Group", "PID", "State"),
+      short_line(found->first, subsystem.definition().group, id, subsystem.state_name())};
+}
+
+}  // namespace kpl::master

@@ -1,0 +1,203 @@
+#include "master/requests.h"
+
+#include <sys/socket.h>
+#include <sys/un.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <optional>
+
+namespace kpl::master {
+namespace {
+
+using control::End;
+using control::Result;
+using platform::Descriptor;
+
+constexpr std::size_t kMaxWaiting = 100;
+constexpr std::size_t kMaxPacket = sizeof(kplhdr) + 80 * sizeof(statcode);
+constexpr int kPacketsAtOnce = 32;  // before others are served again
+
+/// A socket with an address that the kernel chooses, for one answer: what comes late finds nobody.
+Descriptor open_reply_socket(sockaddr_un* address) {
+  Descriptor made(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  const int on = 1;
+  *address = {};
+  address->sun_family = AF_UNIX;
+  socklen_t length = sizeof *address;
+  auto* generic = reinterpret_cast<sockaddr*>(address);
+  if (!made || setsockopt(made.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0 ||
+      bind(made.get(), generic, sizeof(sa_family_t)) != 0 || getsockname(made.get(), generic, &length) != 0) {
+    return {};
+  }
+  return made;
+}
+
+pid_t sender_of(msghdr* message) {
+  for (cmsghdr* c = CMSG_FIRSTHDR(message); c != nullptr; c = CMSG_NXTHDR(message, c)) {
+    if (c->cmsg_level != SOL_SOCKET || c->cmsg_type != SCM_CREDENTIALS) continue;
+    ucred sender{};
+    memcpy(&sender, CMSG_DATA(c), sizeof sender);
+    return sender.pid;
+  }
+  return -1;
+}
+
+/// Subsystems double each "%" of their status and error text.
+std::string single_percents(std::string text) {
+  for (std::size_t at = 0; (at = text.find("%%", at)) != std::string::npos; ++at) text.erase(at, 1);
+  return text;
+}
+
+std::string field(const char* text, std::size_t size) { return {text, strnlen(text, size)}; }
+
+control::Lines lines_in(const char* packet, std::size_t length) {
+  control::Lines result;
+  for (std::size_t at = sizeof(kplhdr); at + sizeof(statcode) <= length; at += sizeof(statcode)) {
+    statcode record{};
+    memcpy(&record, packet + at, sizeof record);
+    result.lines.push_back({field(record.objname, sizeof record.objname),
+                            single_percents(field(record.objtext, sizeof record.objtext))});
+  }
+  return result;
+}
+
+std::string message_in(const char* packet, std::size_t length) {
+  constexpr std::size_t kAt = offsetof(kplrep, svrreply) + offsetof(svrreply, rtnmsg);
+  std::string text = length > kAt ? field(packet + kAt, length - kAt) : "";
+  if (text.ends_with('\n')) text.pop_back();
+  return text;
+}
+
+End end_in(const std::string& name, const char* packet, std::size_t length) {
+  short code = 0;
+  memcpy(&code, packet + offsetof(kplrep, svrreply), sizeof code);
+  std::string text = single_percents(message_in(packet, length));
+  switch (code) {
+    case KPL_RC_OK: return {Result::kOk, code, text};
+    case KPL_RC_NOT_SUPPORTED: return {Result::kNotSupported, code, name + " does not support this request"};
+    case KPL_RC_BAD_REQUEST: return {Result::kNotSupported, code, name + " does not know this request"};
+    default: break;
+  }
+  if (text.empty()) text = name + " answered with code " + std::to_string(code);
+  return {Result::kFailed, code, text};
+}
+
+std::string in_seconds(Duration time) {
+  std::string text = std::to_string(static_cast<double>(time.count()) / 1000);
+  text.erase(text.find_last_not_of('0') + 1);
+  if (text.ends_with('.')) text.pop_back();
+  return text + " s";
+}
+
+}  // namespace
+
+struct Requests::Pending {
+  Pending(const Loop& loop, const Question& what, Reply to, Event::Action on_late)
+      : question(what), reply(std::move(to)), late(loop, std::move(on_late)) {}
+
+  Question question;
+  Reply reply;
+  Event late;
+  bool sent = false;
+  Descriptor socket;
+  std::optional<Event> readable;  // goes before the socket
+};
+
+Requests::Requests(const Loop& loop, Channel& channel, std::string name, pid_t pid)
+    : loop_(loop), channel_(channel), name_(std::move(name)), pid_(pid) {}
+
+Requests::~Requests() { end_all(); }
+
+void Requests::ask(const Question& question, Duration limit, Reply reply) {
+  if (waiting_.size() >= kMaxWaiting) {
+    return reply(End{Result::kNoAnswer, 0, "too many requests wait for " + name_});
+  }
+  const auto place = waiting_.emplace(waiting_.end());
+  *place = std::make_unique<Pending>(loop_, question, std::move(reply), [this, place, limit] {
+    finish(place, End{Result::kNoAnswer, 0, name_ + " has not answered within " + in_seconds(limit)});
+  });
+  (*place)->late.arm(limit);
+  if (waiting_.size() == 1) send_first();
+}
+
+void Requests::end_all() {
+  while (!waiting_.empty()) {
+    const auto ended = std::move(waiting_.front());
+    waiting_.pop_front();
+    ended->reply(End{Result::kFailed, 0, name_ + " ended before it answered"});
+  }
+}
+
+/// Until one is sent: those that cannot be are answered at once.
+void Requests::send_first() {
+  while (!waiting_.empty() && !waiting_.front()->sent) {
+    const std::string problem = send(*waiting_.front());
+    if (!problem.empty()) drop(waiting_.begin(), End{Result::kNoAnswer, 0, problem});
+  }
+}
+
+std::string Requests::send(Pending& first) {
+  kplreq request{};
+  first.socket = open_reply_socket(&request.kplhdr.retaddr);
+  if (!first.socket) return std::string("no socket for the answer: ") + strerror(errno);
+  request.kplhdr.dversion = KPL_VERSION;
+  request.subreq.object = KPL_OBJECT_SUBSYSTEM;
+  request.subreq.action = first.question.action;
+  request.subreq.parm1 = first.question.parm1;
+  request.subreq.parm2 = first.question.parm2;
+  name_.copy(request.subreq.objname, sizeof request.subreq.objname);
+  first.readable.emplace(loop_, first.socket.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
+  first.sent = true;
+  switch (channel_.send(request, first.question.data)) {
+    case Channel::Sent::kDone: return {};
+    case Channel::Sent::kFull: return name_ + " does not read its requests";
+    case Channel::Sent::kGone: break;
+  }
+  return name_ + " has closed its request channel";
+}
+
+void Requests::on_readable() {
+  const int fd = waiting_.front()->socket.get();
+  for (int i = 0; i < kPacketsAtOnce; ++i) {
+    char packet[kMaxPacket];
+    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(ucred))];
+    iovec part = {packet, sizeof packet};
+    msghdr message{};
+    message.msg_iov = &part;
+    message.msg_iovlen = 1;
+    message.msg_control = control;
+    message.msg_controllen = sizeof control;
+    const ssize_t got = recvmsg(fd, &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
+    if (got < 0) return;
+    // The address is known to all who look for it; only the subsystem is listened to.
+    if ((message.msg_flags & MSG_TRUNC) != 0 || sender_of(&message) != pid_) continue;
+    if (on_packet(packet, static_cast<std::size_t>(got))) return;
+  }
+}
+
+bool Requests::on_packet(const char* packet, std::size_t length) {
+  if (length < sizeof(kplhdr)) return false;
+  kplhdr header{};
+  memcpy(&header, packet, sizeof header);
+  Pending& first = *waiting_.front();
+  if (header.cont == KPL_CONT_STATUS) first.reply(lines_in(packet, length));
+  if (header.cont == KPL_CONT_MESSAGE) first.reply(control::Message{message_in(packet, length)});
+  if (header.cont != KPL_CONT_END || length < sizeof(kplhdr) + sizeof(short)) return false;
+  finish(waiting_.begin(), end_in(name_, packet, length));
+  return true;
+}
+
+void Requests::finish(Place which, const End& end) {
+  drop(which, end);
+  send_first();
+}
+
+void Requests::drop(Place which, const End& end) {
+  const auto dropped = std::move(*which);
+  waiting_.erase(which);
+  dropped->reply(end);
+}
+
+}  // namespace kpl::master
