@@ -1,6 +1,7 @@
 #include "control/control.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <iterator>
 #include <limits>
 
@@ -16,8 +17,8 @@ struct Named {
 };
 
 constexpr Named<Action> kActions[] = {
-    {Action::kStart, "start"},     {Action::kStop, "stop"},       {Action::kStatus, "status"},
-    {Action::kTrace, "trace"},     {Action::kRefresh, "refresh"}, {Action::kRequest, "request"},
+    {Action::kStart, "start"}, {Action::kStop, "stop"},       {Action::kStatus, "status"},
+    {Action::kTrace, "trace"}, {Action::kRefresh, "refresh"}, {Action::kRequest, "request"},
     {Action::kList, "list"},
 };
 constexpr Named<StopKind> kStopKinds[] = {
@@ -36,13 +37,15 @@ constexpr Named<Result> kResults[] = {
 
 template <class Value, std::size_t N>
 const char* name_in(const Named<Value> (&table)[N], Value value) {
-  const auto* found = std::find_if(std::begin(table), std::end(table), [&](auto& row) { return row.value == value; });
+  const auto* found =
+      std::find_if(std::begin(table), std::end(table), [&](auto& row) { return row.value == value; });
   return found != std::end(table) ? found->name : "unknown";
 }
 
 template <class Value, std::size_t N>
 Value value_in(const Named<Value> (&table)[N], const std::string& name) {
-  const auto* found = std::find_if(std::begin(table), std::end(table), [&](auto& row) { return name == row.name; });
+  const auto* found =
+      std::find_if(std::begin(table), std::end(table), [&](auto& row) { return name == row.name; });
   if (found == std::end(table)) throw Malformed("'" + name + "' is unknown");
   return found->value;
 }
@@ -74,8 +77,9 @@ int number(const json& message, const char* name) {
   const auto found = message.find(name);
   if (found == message.end()) return 0;
   constexpr auto kMin = std::numeric_limits<short>::min();
-  constexpr auto kMax = std::numeric_limits<short>::max();
-  const bool fits = found->is_number_integer() && *found >= kMin && *found <= kMax;
+  constexpr std::uint64_t kMax = std::numeric_limits<short>::max();
+  const bool fits = found->is_number_unsigned() ? found->get<std::uint64_t>() <= kMax
+                                                : found->is_number_integer() && found->get<std::int64_t>() >= kMin;
   if (!fits) throw Malformed(std::string(name) + " is no number that fits in 16 bits");
   return found->get<int>();
 }
@@ -100,9 +104,7 @@ json to_json(const Lines& lines) {
   for (const Line& line : lines.lines) list.push_back(json::array({line.margin, line.body}));
   return {{"lines", std::move(list)}};
 }
-json to_json(const End& end) {
-  return {{"end", name_of(end.result)}, {"code", end.code}, {"text", end.text}};
-}
+json to_json(const End& end) { return {{"end", name_of(end.result)}, {"code", end.code}, {"text", end.text}}; }
 
 }  // namespace
 

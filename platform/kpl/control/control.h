@@ -1,6 +1,6 @@
-// How kplctl and kplmstr talk: packets over the master's control socket (local, SOCK_SEQPACKET), one message in JSON
-// to a packet. A connection carries any number of requests, one after the other. Each is answered by any number of
-// interim answers and one End.
+// How kplctl and kplmstr talk: packets over the master's control socket (local, SOCK_SEQPACKET), one message in
+// JSON to a packet. A connection carries any number of requests, one after the other. Each is answered by any
+// number of interim answers and one End.
 //
 //   -> {"action":"trace","subsystem":"gsd","on":true,"long":false}
 //   <- {"wait":10}                                     the next packet comes within so many seconds

@@ -58,7 +58,8 @@ End Client::ask(const control::Request& request, const Interim& interim) {
 }
 
 End Client::exchange(const std::string& question, const Interim& interim, bool* ended) {
-  if (send(socket_.get(), question.data(), question.size(), MSG_NOSIGNAL) < 0 && errno != EPIPE) return not_reached();
+  if (send(socket_.get(), question.data(), question.size(), MSG_NOSIGNAL) < 0 && errno != EPIPE)
+    return not_reached();
   double patience = 0;
   std::string packet;
   for (;;) {
@@ -67,8 +68,9 @@ End Client::exchange(const std::string& question, const Interim& interim, bool* 
     }
     packet.resize(control::kMaxPacket + 1);
     const ssize_t length = recv(socket_.get(), packet.data(), packet.size(), 0);
-    if (length < 0) return not_reached();
-    if (length == 0) return {Result::kNotReached, 0, "kplmstr has closed the connection: not permitted, or it ended"};
+    if (length < 0 && errno != ECONNRESET) return not_reached();
+    if (length <= 0)
+      return {Result::kNotReached, 0, "kplmstr has closed the connection: not permitted, or it ended"};
     packet.resize(static_cast<std::size_t>(length));
     const Answer answer = control::decode_answer(packet);
     if (const End* end = std::get_if<End>(&answer)) {

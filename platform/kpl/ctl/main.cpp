@@ -26,7 +26,8 @@ Outcome ask(Client& client, const kpl::control::Request& request) {
   Outcome outcome;
   outcome.subsystem = request.subsystem;
   outcome.end = client.ask(request, [&](const kpl::control::Answer& answer) {
-    if (const auto* message = std::get_if<kpl::control::Message>(&answer)) outcome.messages.push_back(message->text);
+    if (const auto* message = std::get_if<kpl::control::Message>(&answer))
+      outcome.messages.push_back(message->text);
     if (const auto* entry = std::get_if<kpl::control::Entry>(&answer)) outcome.entries.push_back(entry->subsystem);
     const auto* lines = std::get_if<kpl::control::Lines>(&answer);
     if (lines != nullptr) outcome.lines.insert(outcome.lines.end(), lines->lines.begin(), lines->lines.end());

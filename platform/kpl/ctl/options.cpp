@@ -14,7 +14,8 @@ constexpr int kMaxParameter = 32767;
 
 constexpr char kFooter[] =
     "Exit status: 0 done, 1 the subsystem or the master reported an error, 2 wrong use, 3 the master cannot be "
-    "reached,\n4 no such subsystem or not in the state for it, 5 no answer within its time, 6 not supported by the "
+    "reached,\n4 no such subsystem or not in the state for it, 5 no answer within its time, 6 not supported by "
+    "the "
     "subsystem";
 
 CLI::App* add_command(CLI::App& app, Options& options, const char* name, const char* help, Action action) {
@@ -32,18 +33,19 @@ void add_subsystem(CLI::App* command, Options& options) {
 
 void add_stop(CLI::App& app, Options& options) {
   CLI::App* stop = add_command(app, options, "stop", "Stop a subsystem and wait for its end", Action::kStop);
-  CLI::Option* forced =
-      stop->add_flag_callback("--forced", [&options] { options.request.stop = StopKind::kForced; }, "Without its usual care");
-  stop->add_flag_callback("--cancel", [&options] { options.request.stop = StopKind::kCancel; },
-                          "By SIGTERM, then SIGKILL")
+  CLI::Option* forced = stop->add_flag_callback(
+      "--forced", [&options] { options.request.stop = StopKind::kForced; }, "Without its usual care");
+  stop->add_flag_callback(
+          "--cancel", [&options] { options.request.stop = StopKind::kCancel; }, "By SIGTERM, then SIGKILL")
       ->excludes(forced);
   add_subsystem(stop, options);
 }
 
 void add_trace(CLI::App& app, Options& options) {
   CLI::App* trace = add_command(app, options, "trace", "Switch a subsystem's trace", Action::kTrace);
-  trace->add_option_function<std::string>(
-           "SWITCH", [&options](const std::string& text) { options.request.on = text == "on"; }, "on or off")
+  trace
+      ->add_option_function<std::string>(
+          "SWITCH", [&options](const std::string& text) { options.request.on = text == "on"; }, "on or off")
       ->type_name("")
       ->required()
       ->check(CLI::IsMember({"on", "off"}));
@@ -92,12 +94,14 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
   app.footer(kFooter);
   add_subsystem(add_command(app, options, "start", "Start a subsystem", Action::kStart), options);
   add_stop(app, options);
-  CLI::App* status = add_command(app, options, "status", "Tell the state of all subsystems, or of one", Action::kStatus);
+  CLI::App* status =
+      add_command(app, options, "status", "Tell the state of all subsystems, or of one", Action::kStatus);
   status->add_flag("--long", options.request.long_form, "What the subsystem itself tells");
   add_subsystem(status, options);
   add_trace(app, options);
-  add_subsystem(add_command(app, options, "refresh", "Have a subsystem read its configuration again", Action::kRefresh),
-                options);
+  add_subsystem(
+      add_command(app, options, "refresh", "Have a subsystem read its configuration again", Action::kRefresh),
+      options);
   add_request(app, options);
   add_command(app, options, "list", "Tell how subsystems are defined", Action::kList);
   try {

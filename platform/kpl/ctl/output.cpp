@@ -41,7 +41,9 @@ std::string duration_of(const json& entry) {
   const auto found = entry.find("seconds");
   if (found == entry.end() || !found->is_number()) return "-";
   const auto seconds = static_cast<std::int64_t>(found->get<double>());
-  const auto two = [](std::int64_t number) { return std::string(number < 10 ? "0" : "") + std::to_string(number); };
+  const auto two = [](std::int64_t number) {
+    return std::string(number < 10 ? "0" : "") + std::to_string(number);
+  };
   const std::string clock = two(seconds / 3600 % 24) + ":" + two(seconds / 60 % 60) + ":" + two(seconds % 60);
   return seconds < 86'400 ? clock : std::to_string(seconds / 86'400) + "d " + clock;
 }
@@ -60,8 +62,9 @@ std::string command_of(const json& entry) {
 std::string status_table(const std::vector<json>& entries) {
   std::vector<Row> rows = {{"Subsystem", "Group", "PID", "State", "Time", "Restarts", "Last end"}};
   for (const json& entry : entries) {
-    rows.push_back({text_of(entry, "name"), text_of(entry, "group"), text_of(entry, "pid"), text_of(entry, "state"),
-                    duration_of(entry), text_of(entry, "restarts"), text_of(entry, "last_end")});
+    rows.push_back({text_of(entry, "name"), text_of(entry, "group"), text_of(entry, "pid"),
+                    text_of(entry, "state"), duration_of(entry), text_of(entry, "restarts"),
+                    text_of(entry, "last_end")});
   }
   return table(rows);
 }
@@ -87,12 +90,9 @@ std::string long_status(const std::vector<control::Line>& lines) {
 json to_json(const Outcome& outcome) {
   json lines = json::array();
   for (const control::Line& line : outcome.lines) lines.push_back({{"margin", line.margin}, {"body", line.body}});
-  return {{"subsystem", outcome.subsystem},
-          {"result", control::name_of(outcome.end.result)},
-          {"code", outcome.end.code},
-          {"text", outcome.end.text},
-          {"messages", outcome.messages},
-          {"lines", std::move(lines)}};
+  return {{"subsystem", outcome.subsystem}, {"result", control::name_of(outcome.end.result)},
+          {"code", outcome.end.code},       {"text", outcome.end.text},
+          {"messages", outcome.messages},   {"lines", std::move(lines)}};
 }
 
 }  // namespace kpl::ctl

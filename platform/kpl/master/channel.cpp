@@ -100,9 +100,12 @@ class QueueChannel : public Channel {
 
 std::unique_ptr<Channel> open_channel(const Definition& definition) {
   switch (definition.transport) {
-    case Transport::kSocket: return std::make_unique<SocketChannel>();
-    case Transport::kQueue: return std::make_unique<QueueChannel>(definition.queue_key, definition.queue_type);
-    case Transport::kSignals: break;
+    case Transport::kSocket:
+      return std::make_unique<SocketChannel>();
+    case Transport::kQueue:
+      return std::make_unique<QueueChannel>(definition.queue_key, definition.queue_type);
+    case Transport::kSignals:
+      break;
   }
   return nullptr;
 }

@@ -10,10 +10,10 @@ namespace {
 
 using platform::Descriptor;
 
-constexpr int kAcceptsAtOnce = 16;                  // before the connected are served again
-constexpr std::size_t kMaxConnections = 256;        // one more is closed at once
-constexpr std::size_t kMaxWaiting = 4 * 1024 * 1024;  // bytes; a requester that does not read is closed
-constexpr int kSendBuffer = 512 * 1024;               // bytes; the system may give less
+constexpr int kAcceptsAtOnce = 16;                      // before the connected are served again
+constexpr std::size_t kMaxConnections = 256;            // one more is closed at once
+constexpr std::size_t kMaxWaiting = 4 * 1024 * 1024;    // bytes; a requester that does not read is closed
+constexpr int kSendBuffer = 512 * 1024;                 // bytes; the system may give less
 constexpr std::chrono::milliseconds kAcceptPause{100};  // when descriptors have run out
 
 }  // namespace
@@ -61,7 +61,8 @@ void ControlServer::add_connection(Descriptor socket) {
   const ConnectionId id = ++last_connection_;
   Connection& connection = connections_[id];
   connection.socket = std::move(socket);
-  connection.readable.emplace(loop_, connection.socket.get(), EV_READ | EV_PERSIST, [this, id] { on_readable(id); });
+  connection.readable.emplace(loop_, connection.socket.get(), EV_READ | EV_PERSIST,
+                              [this, id] { on_readable(id); });
 }
 
 void ControlServer::on_readable(ConnectionId id) {

@@ -1,7 +1,7 @@
 #include "master/definition.h"
 
-#include <cctype>
 #include <algorithm>
+#include <cctype>
 #include <cstring>
 #include <filesystem>
 #include <iterator>
@@ -175,9 +175,12 @@ std::vector<std::string> toml_files(const std::string& folder) {
 
 const char* name_of(Transport transport) {
   switch (transport) {
-    case Transport::kSocket: return "socket";
-    case Transport::kQueue: return "queue";
-    case Transport::kSignals: return "signals";
+    case Transport::kSocket:
+      return "socket";
+    case Transport::kQueue:
+      return "queue";
+    case Transport::kSignals:
+      return "signals";
   }
   return "unknown";
 }

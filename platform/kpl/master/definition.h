@@ -32,9 +32,9 @@ struct Definition {
   int queue_type = 1;
   int normal_signal = SIGTERM;  // with Transport::kSignals
   int forced_signal = SIGTERM;
-  Duration request_time{10'000};      // for an answer
-  Duration stop_time{20'000};         // for the end after a stop request
-  Duration restart_delay{1'000};      // before the first restart; doubles with each crash
+  Duration request_time{10'000};  // for an answer
+  Duration stop_time{20'000};     // for the end after a stop request
+  Duration restart_delay{1'000};  // before the first restart; doubles with each crash
   Duration restart_delay_max{60'000};
 };
 

@@ -45,8 +45,7 @@ struct Plan {
 void plan_user(const Definition& definition, Plan& plan) {
   std::uint64_t number = 0;
   const bool is_number = platform::set_number(definition.user, 0, UINT32_MAX - 1, &number).empty();
-  const passwd* user =
-      is_number ? getpwuid(static_cast<uid_t>(number)) : getpwnam(definition.user.c_str());
+  const passwd* user = is_number ? getpwuid(static_cast<uid_t>(number)) : getpwnam(definition.user.c_str());
   if (user == nullptr) throw LaunchError("there is no user '" + definition.user + "'");
   if (user->pw_uid == geteuid()) return;
   plan.change_user = true;
@@ -107,8 +106,8 @@ void reset_signals(const sigset_t& mask) {
       dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0) {
     give_up(report, Failure::kDescriptors);
   }
-  if (plan.change_user && (setgroups(plan.groups.size(), plan.groups.data()) != 0 || setgid(plan.gid) != 0 ||
-                           setuid(plan.uid) != 0)) {
+  if (plan.change_user &&
+      (setgroups(plan.groups.size(), plan.groups.data()) != 0 || setgid(plan.gid) != 0 || setuid(plan.uid) != 0)) {
     give_up(report, Failure::kUser);
   }
   reset_signals(mask);
@@ -124,7 +123,8 @@ Launched launch(const Definition& definition, int request_end, const std::string
   plan_texts(definition, status_socket, plan);
   plan_files(definition, plan);
   std::array<int, 2> report{};
-  if (pipe2(report.data(), O_CLOEXEC) != 0) throw LaunchError(std::string("cannot make a pipe: ") + strerror(errno));
+  if (pipe2(report.data(), O_CLOEXEC) != 0)
+    throw LaunchError(std::string("cannot make a pipe: ") + strerror(errno));
   Descriptor reader(report[0]);
   const Descriptor writer(report[1]);
   fcntl(reader.get(), F_SETFL, O_NONBLOCK);
@@ -148,10 +148,14 @@ std::optional<std::string> launch_result(const Definition& definition, int repor
   if (got != sizeof failure) return "";
   const std::string why = std::string(": ") + strerror(failure.error);
   switch (failure.step) {
-    case Failure::kSession: return "cannot make a session" + why;
-    case Failure::kDescriptors: return "cannot set up descriptors" + why;
-    case Failure::kUser: return "cannot become user '" + definition.user + "'" + why;
-    case Failure::kProgram: break;
+    case Failure::kSession:
+      return "cannot make a session" + why;
+    case Failure::kDescriptors:
+      return "cannot set up descriptors" + why;
+    case Failure::kUser:
+      return "cannot become user '" + definition.user + "'" + why;
+    case Failure::kProgram:
+      break;
   }
   return "cannot run " + definition.program + why;
 }

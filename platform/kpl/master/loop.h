@@ -24,8 +24,8 @@ class Loop {
   std::unique_ptr<event_base, Free> base_;
 };
 
-/// Calls an action when a descriptor is ready, a signal has come or a time is over. The action may destroy the event
-/// that it belongs to.
+/// Calls an action when a descriptor is ready, a signal has come or a time is over. The action may destroy the
+/// event that it belongs to.
 class Event {
  public:
   using Action = std::function<void()>;

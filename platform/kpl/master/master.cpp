@@ -30,10 +30,14 @@ const std::string& prepared(const std::string& path) {
 Question question_of(const control::Request& request) {
   const auto is_long = static_cast<short>(request.long_form);
   switch (request.action) {
-    case Action::kStatus: return {KPL_ACTION_STATUS, is_long, 0, {}};
-    case Action::kTrace: return {KPL_ACTION_TRACE, is_long, static_cast<short>(request.on), {}};
-    case Action::kRefresh: return {KPL_ACTION_REFRESH, 0, 0, {}};
-    default: break;
+    case Action::kStatus:
+      return {KPL_ACTION_STATUS, is_long, 0, {}};
+    case Action::kTrace:
+      return {KPL_ACTION_TRACE, is_long, static_cast<short>(request.on), {}};
+    case Action::kRefresh:
+      return {KPL_ACTION_REFRESH, 0, 0, {}};
+    default:
+      break;
   }
   return {static_cast<short>(request.code), static_cast<short>(request.parm1), static_cast<short>(request.parm2),
           request.data};
@@ -134,7 +138,8 @@ void Master::stop_when_all_ended() {
 
 void Master::on_request(const control::Request& request, const Reply& reply) {
   const bool for_all = request.subsystem.empty();
-  const bool short_answer = request.action == Action::kList || (request.action == Action::kStatus && !request.long_form);
+  const bool short_answer =
+      request.action == Action::kList || (request.action == Action::kStatus && !request.long_form);
   if (for_all && !short_answer) return reply(End{Result::kFailed, 0, "a subsystem must be named"});
   const auto found = subsystems_.find(request.subsystem);
   if (!for_all && found == subsystems_.end()) {
@@ -155,14 +160,16 @@ void Master::tell_subsystems(const control::Request& request, const Reply& reply
 }
 
 void Master::on_subsystem_request(Subsystem& subsystem, const control::Request& request, const Reply& reply) {
-  if (request.action == Action::kStart && stopping_) return reply(End{Result::kWrongState, 0, "kplmstr is stopping"});
+  if (request.action == Action::kStart && stopping_)
+    return reply(End{Result::kWrongState, 0, "kplmstr is stopping"});
   if (request.action == Action::kStart) return subsystem.start(reply);
   if (request.action == Action::kStop) return subsystem.stop(request.stop, reply);
   if (request.action == Action::kRequest && request.code < kFirstOwnCode) {
     return reply(End{Result::kFailed, 0, "the code must be 256 or more"});
   }
   if (request.data.size() > control::kMaxData) {
-    return reply(End{Result::kFailed, 0, "the data is longer than " + std::to_string(control::kMaxData) + " bytes"});
+    return reply(
+        End{Result::kFailed, 0, "the data is longer than " + std::to_string(control::kMaxData) + " bytes"});
   }
   subsystem.ask(question_of(request), reply);
 }

@@ -39,11 +39,10 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
       ->type_name("GROUP");
   app.add_option("--log-file", options.log_file, "File to append the log to (none: standard error)")
       ->type_name("FILE");
-  app.add_option("--log-level", level, "error, warning, info or debug")
-      ->capture_default_str()
-      ->type_name("LEVEL");
+  app.add_option("--log-level", level, "error, warning, info or debug")->capture_default_str()->type_name("LEVEL");
   app.add_flag("--daemon", options.daemon, "Detach from the terminal; return once subsystems can be started");
-  app.add_flag("--check", options.check, "Only tell what is wrong with the definitions; exit status 1 if anything is");
+  app.add_flag("--check", options.check,
+               "Only tell what is wrong with the definitions; exit status 1 if anything is");
   try {
     app.parse(argc, argv);
   } catch (const CLI::Success& asked) {
@@ -53,7 +52,8 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
     throw platform::SettingError(platform::first_line(error.what()));
   }
   const auto known = platform::log_level(level);
-  if (!known) throw platform::SettingError("--log-level: must be error, warning, info or debug, not '" + level + "'");
+  if (!known)
+    throw platform::SettingError("--log-level: must be error, warning, info or debug, not '" + level + "'");
   options.log_level = *known;
   make_absolute(&options.definitions);
   make_absolute(&options.socket_path);

@@ -1,9 +1,9 @@
 // How the master has to look to its subsystems, and how it gets there.
 #pragma once
 
-#include "common/descriptor.h"
-
 #include <string>
+
+#include "common/descriptor.h"
 
 namespace kpl::master {
 

@@ -75,10 +75,14 @@ End end_in(const std::string& name, const char* packet, std::size_t length) {
   memcpy(&code, packet + offsetof(kplrep, svrreply), sizeof code);
   std::string text = single_percents(message_in(packet, length));
   switch (code) {
-    case KPL_RC_OK: return {Result::kOk, code, text};
-    case KPL_RC_NOT_SUPPORTED: return {Result::kNotSupported, code, name + " does not support this request"};
-    case KPL_RC_BAD_REQUEST: return {Result::kNotSupported, code, name + " does not know this request"};
-    default: break;
+    case KPL_RC_OK:
+      return {Result::kOk, code, text};
+    case KPL_RC_NOT_SUPPORTED:
+      return {Result::kNotSupported, code, name + " does not support this request"};
+    case KPL_RC_BAD_REQUEST:
+      return {Result::kNotSupported, code, name + " does not know this request"};
+    default:
+      break;
   }
   if (text.empty()) text = name + " answered with code " + std::to_string(code);
   return {Result::kFailed, code, text};
@@ -151,9 +155,12 @@ std::string Requests::send(Pending& first) {
   first.readable.emplace(loop_, first.socket.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
   first.sent = true;
   switch (channel_.send(request, first.question.data)) {
-    case Channel::Sent::kDone: return {};
-    case Channel::Sent::kFull: return name_ + " does not read its requests";
-    case Channel::Sent::kGone: break;
+    case Channel::Sent::kDone:
+      return {};
+    case Channel::Sent::kFull:
+      return name_ + " does not read its requests";
+    case Channel::Sent::kGone:
+      break;
   }
   return name_ + " has closed its request channel";
 }

@@ -54,7 +54,8 @@ StatusServer::StatusServer(const Loop& loop, const std::string& path, Lookup loo
     : path_(path), lookup_(std::move(lookup)) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
-  if (path.size() >= sizeof address.sun_path) throw platform::ListenError("the socket path " + path + " is too long");
+  if (path.size() >= sizeof address.sun_path)
+    throw platform::ListenError("the socket path " + path + " is too long");
   memcpy(address.sun_path, path.c_str(), path.size() + 1);
   struct stat found {};
   if (lstat(path.c_str(), &found) == 0) {

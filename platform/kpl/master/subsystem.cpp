@@ -36,7 +36,8 @@ Subsystem::Subsystem(Definition definition, const Surroundings& around)
 
 void Subsystem::start(Reply reply) {
   if (process_) {
-    const std::string what = definition_.name + " is " + state_name() + " already (pid " + std::to_string(pid()) + ")";
+    const std::string what =
+        definition_.name + " is " + state_name() + " already (pid " + std::to_string(pid()) + ")";
     return reply(End{Result::kWrongState, 0, what});
   }
   delay_over_.disarm();
@@ -155,9 +156,8 @@ void Subsystem::stop(StopKind kind, Reply reply) {
   state_ = State::kStopping;
   reply(wait_for(definition_.stop_time));
   const StopId which = ++last_stop_;
-  const auto placed = stops_.try_emplace(which, around_.loop, std::move(reply), [this, which, kind] {
-    on_stop_late(which, kind);
-  });
+  const auto placed = stops_.try_emplace(which, around_.loop, std::move(reply),
+                                         [this, which, kind] { on_stop_late(which, kind); });
   placed.first->second.late.arm(definition_.stop_time);
   send_stop(kind, which);
 }
@@ -209,23 +209,34 @@ void Subsystem::ask(const Question& question, Reply reply) {
 
 const char* Subsystem::state_name() const {
   switch (state_) {
-    case State::kInactive: return "inactive";
-    case State::kStarting: return "starting";
-    case State::kActive: return "active";
-    case State::kStopping: return "stopping";
-    case State::kWaiting: return "waiting";
+    case State::kInactive:
+      return "inactive";
+    case State::kStarting:
+      return "starting";
+    case State::kActive:
+      return "active";
+    case State::kStopping:
+      return "stopping";
+    case State::kWaiting:
+      return "waiting";
   }
   return "unknown";
 }
 
 control::Entry Subsystem::entry() const {
   nlohmann::json entry = {
-      {"name", definition_.name},           {"group", definition_.group},
-      {"state", state_name()},              {"restarts", restarts_},
-      {"last_end", last_end_},              {"program", definition_.program},
-      {"arguments", definition_.arguments}, {"user", definition_.user},
-      {"autostart", definition_.autostart}, {"restart", definition_.restart},
-      {"file", definition_.file},           {"transport", name_of(definition_.transport)},
+      {"name", definition_.name},
+      {"group", definition_.group},
+      {"state", state_name()},
+      {"restarts", restarts_},
+      {"last_end", last_end_},
+      {"program", definition_.program},
+      {"arguments", definition_.arguments},
+      {"user", definition_.user},
+      {"autostart", definition_.autostart},
+      {"restart", definition_.restart},
+      {"file", definition_.file},
+      {"transport", name_of(definition_.transport)},
   };
   if (process_) {
     entry["pid"] = pid();

@@ -37,7 +37,8 @@ struct Surroundings {
 ///   waiting  | -> starting  | -            | -                    | inactive | -                     | starting
 ///
 /// (1) The process says why and ends; only its end counts. A first start that fails is not tried again.
-/// (2) Waiting where the definition says restart. The delay doubles from crash to crash; a run that was longer than
+/// (2) Waiting where the definition says restart. The delay doubles from crash to crash; a run that was longer
+/// than
 ///     the longest delay starts over with the shortest.
 /// A stop that the subsystem refuses leads back to active.
 class Subsystem {
@@ -80,7 +81,8 @@ class Subsystem {
     std::optional<Event> report_readable;
   };
   struct Stop {
-    Stop(const Loop& loop, Reply to, Event::Action on_late) : reply(std::move(to)), late(loop, std::move(on_late)) {}
+    Stop(const Loop& loop, Reply to, Event::Action on_late)
+        : reply(std::move(to)), late(loop, std::move(on_late)) {}
     Reply reply;
     Event late;
   };
@@ -103,14 +105,14 @@ class Subsystem {
   Surroundings around_;
   State state_ = State::kInactive;
   std::unique_ptr<Process> process_;
-  std::string launch_problem_;   // of the process that could not become the program
+  std::string launch_problem_;    // of the process that could not become the program
   std::optional<Reply> starter_;  // waits for the program to run
   std::map<StopId, Stop> stops_;  // wait for the end
   StopId last_stop_ = 0;
   Event delay_over_;
   Duration next_delay_;
-  int restarts_ = 0;         // since the last start that was asked for
-  std::string last_end_;     // of the last process
+  int restarts_ = 0;      // since the last start that was asked for
+  std::string last_end_;  // of the last process
 };
 
 }  // namespace kpl::master
