@@ -2,10 +2,12 @@
 //
 // Each routing function finds and pins the client, brings it up to date, and delivers. A trace line names the
 // client as it stands at that step; after the callback the client may be gone, and then nothing is said of it.
+#include "gscl/GSClientData_internal.h"
 #include "gscl/GSController.h"
 #include "gscl/GSDelivery_internal.h"
 #include "gscl/GSProvider.h"
 #include "gscl/GSSubscriber.h"
+#include "gscl/scopes_internal.h"
 #include "gscl/trace_text_internal.h"
 
 namespace {
@@ -53,6 +55,13 @@ int isOwnRequest(GSProvider* provider, wyx_request_t protocol, const wyx_proposa
 }
 
 }  // namespace
+
+void GSDelivery::updateStateValues(GSProvider* provider, const wyx_proposal_t* proposal) {
+  gscl_internal::WriteScope<GSClient> lock(*provider);
+  auto* data = static_cast<GSxClientData*>(provider->_clData);
+  data->_currentStateValue = proposal->gs_current_state_value;
+  data->_proposedStateValue = proposal->gs_proposed_state_value;
+}
 
 int GSDelivery::joinApproved(GSProvider* provider, const wyx_proposal_t* proposal, int for_my_req) {
   if (provider->getClientState() == GS_IAM_JOINING) {
@@ -143,8 +152,7 @@ void GSController::stub_approvedCb(const wyx_approved_notification_t* notificati
     GS_TRACE(GSCL_TRC_API, "GSController::stub_approved: set new members\n");
     provider->setMembers(proposal->gs_current_providers);
   }
-  provider->setCurrentStateValue(proposal->gs_current_state_value);
-  provider->setProposedStateValue(proposal->gs_proposed_state_value);
+  GSDelivery::updateStateValues(provider, proposal);
   const bool alive = delivery.deliver(notification, for_my_req, [&] {
     GS_TRACE(GSCL_TRC_DETAIL, "calling approvedCb()\n");
     provider->approvedCb(notification);
@@ -177,8 +185,7 @@ void GSController::stub_rejectedCb(const wyx_rejected_notification_t* notificati
   } else if (protocol == WYX_LEAVE && proposedBy(provider, proposal)) {
     provider->setClientState(GS_IAM_IDLE);
   }
-  provider->setCurrentStateValue(proposal->gs_current_state_value);
-  provider->setProposedStateValue(proposal->gs_proposed_state_value);
+  GSDelivery::updateStateValues(provider, proposal);
   delivery.deliver(notification, for_my_req, [&] { provider->rejectedCb(notification); });
 }
 

@@ -51,6 +51,8 @@ class GSDelivery {
   /// A join was approved: when the provider was joining it is joined now, with the proposer's id as its own.
   /// Returns for_my_req as it is then.
   static int joinApproved(GSProvider* provider, const wyx_proposal_t* proposal, int for_my_req);
+  /// Current and proposed state value as the proposal has them, under one hold of the client lock.
+  static void updateStateValues(GSProvider* provider, const wyx_proposal_t* proposal);
   /// The subscriber's membership after a notification: full list, joins or leaves, the first that is there.
   static void updateMembership(GSSubscriber* subscriber, const wyx_subscription_notification_t* notification);
 
