@@ -1,11 +1,13 @@
 // A provider's requests in all their forms.
 #include "gscl/GSController.h"
 #include "gscl/GSProvider.h"
+#include "gscl/scopes_internal.h"
 #include "gscl/trace_text_internal.h"
 
 namespace zelt_gscl_V1 {
 
 wyx_rc_t GSProvider::joinGroup() {
+  gscl_internal::CancellationHold hold;
   GS_TRACE(GSCL_TRC_API, "GSProvider::joinGroup(%s) begins\n", GSCL_ID(this));
   wyx_group_attributes_t attributes;
   getGroupAttributes(&attributes);
@@ -29,6 +31,7 @@ wyx_rc_t GSProvider::joinGroup() {
 }
 
 wyx_rc_t GSProvider::goodbyeGroup() {
+  gscl_internal::CancellationHold hold;
   if (getClientState() == zelt_gscl::GS_IAM_IDLE) {
     GS_TRACE(GSCL_TRC_API, "%s was already out-of-group.\n", GSCL_ID(this));
     return WYX_NOT_OK;

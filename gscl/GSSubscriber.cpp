@@ -41,6 +41,7 @@ GSSubscriber::~GSSubscriber() {
 GSClientType GSSubscriber::type() { return zelt_gscl::GS_SUBSCRIBER; }
 
 wyx_rc_t GSSubscriber::subscribeGroup() {
+  gscl_internal::CancellationHold hold;
   wyx_proposal_info_t proposal;
   wyx_subscribe_request_t& request = proposal._gs_protocol_info._gs_subscribe_request;
   request.gs_subscription_control = dataOf(_subsData)._subctrl;
@@ -52,6 +53,7 @@ wyx_rc_t GSSubscriber::subscribeGroup() {
 }
 
 wyx_rc_t GSSubscriber::unsubscribeGroup() {
+  gscl_internal::CancellationHold hold;
   const wyx_rc_t rc = GSController::stub_unsubscribe_group(this);
   GS_TRACE(GSCL_TRC_API, "%s: unsubscribe sync_rc=%s\n", GSCL_ID(this), gscl_rc_name(rc));
   return rc;

@@ -302,19 +302,30 @@ TEST(Client, CancelledRequest_isFinishedFirst) {
   RecordingApi api;
   GSController controller;
   GSProvider provider("g", 3, nullptr);
+  GSSubscriber subscriber("g", WYX_SUBSCRIBE_STATE);
   api.during = [] {
     pthread_cancel(pthread_self());
     pthread_testcancel();
   };
-  lock_peek::CancellableThread thread([&] {
-    provider.joinGroup();
-    pthread_testcancel();
-  });
-  EXPECT_TRUE(thread.join());
-  api.during = nullptr;
+  // Every trace line is a cancellation point, as with the standard routine.
+  GSSetTraceRtn([](int, char*) { pthread_testcancel(); });
+  const auto cancelled = [](const std::function<wyx_rc_t()>& request) {
+    wyx_rc_t answer = WYX_NOT_OK;
+    lock_peek::CancellableThread thread([&] {
+      answer = request();
+      pthread_testcancel();
+    });
+    EXPECT_TRUE(thread.join());
+    return answer;
+  };
+  EXPECT_EQ(cancelled([&] { return provider.joinGroup(); }), WYX_OK);
   EXPECT_EQ(provider.getClientState(), GS_IAM_JOINING);
   EXPECT_EQ(provider.getToken(), kToken);
-  EXPECT_EQ(provider.goodbyeGroup(), WYX_OK) << "no lock was left behind";
+  EXPECT_EQ(cancelled([&] { return provider.goodbyeGroup(); }), WYX_OK);
+  EXPECT_EQ(cancelled([&] { return subscriber.subscribeGroup(); }), WYX_OK);
+  EXPECT_EQ(cancelled([&] { return subscriber.unsubscribeGroup(); }), WYX_OK);
+  api.during = nullptr;
+  EXPECT_EQ(provider.joinGroup(), WYX_OK) << "no lock was left behind";
 }
 
 }  // namespace
