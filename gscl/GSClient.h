@@ -75,8 +75,8 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   virtual void delayedErrorCb(const wyx_delayed_error_notification_t* notification);
 
   GSClientState getClientState() const;  ///< no lock
-  GSClientState getOldClientState()
-      const;                     ///< before the last move, which may have been to the same state; no lock
+  /// Before the last move, which may have been to the same state; no lock.
+  GSClientState getOldClientState() const;
   wyx_token_t getToken() const;  ///< -1: none; no lock
 
   /// Stores at most the first 32 characters; null: no name. Write lock. Not while another thread uses the name.
@@ -99,8 +99,7 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   /// absolute wall-clock time (GSGetAbsTime); null: no limit. The outputs may be null and are the caller's.
   ///
   /// GS_WAITFOR_RECEIVED       the outputs say what was delivered; it is not reported a second time. For a
-  /// provider
-  ///                           the phases of its own protocol do not count, only its end.
+  ///                           provider the phases of its own protocol do not count, only its end.
   /// GS_WAITFOR_PENDING        the time is over
   /// GS_WAITFOR_NOT_A_MEMBER   the client is idle and nothing was recorded
   /// GS_WAITFOR_ERROR          the calling thread has not requested anything

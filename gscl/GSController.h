@@ -43,8 +43,9 @@ struct GSxControllerData;
 /// the base API library does not have. Fatal: the base API library or the product version cannot be had; the
 /// process aborts with a message on standard error.
 ///
-/// Cancellation: dispatch() may be a cancellation point through the application's callbacks. A request and a
-/// destructor are not: a cancelled thread finishes them first. (The base API's entry points are none either.)
+/// Cancellation: dispatch(WYX_BLOCKING) is a cancellation point while it waits, and leaves nothing behind; the
+/// base API library runs the callbacks with cancellation disabled. A client's request and a destructor are none: a
+/// cancelled thread finishes them first.
 class ZN_GSCL_EXPORT GSController : public GSLockableObject {
  public:
   /// Becomes the current controller, whichever was current before, and reads the installed product version.

@@ -13,9 +13,9 @@
 //
 // Threads: every function here may be called from any thread at any time. The level word, the routines and the
 // function name and depth of GSTraceFn are one for the process. A standard routine writes its line in one piece
-// and holds a lock of its own while it does; no other lock is held while a routine runs. Errors: what cannot be
-// written is dropped. Only a failed allocation of the message's buffer is thrown. After a fork in a process with
-// several threads the child may write only after exec, like with every stream.
+// and holds a lock of its own while it does; other routines run with no lock of this facility held. Errors: what
+// cannot be written is dropped. Only a failed allocation of the message's buffer is thrown. After a fork in a
+// process with several threads the child may write only after exec, like with every stream.
 #ifndef GSCL_GSDEBUG_H
 #define GSCL_GSDEBUG_H
 

@@ -4,12 +4,11 @@
 // - Any thread may call any operation on a live object. No operation holds two internal mutexes, so the classes
 //   impose no lock order of their own.
 // - Results: 0, otherwise the error number of the threads library (ETIMEDOUT when a deadline passed). Nothing
-// throws.
+//   throws.
 // - A deadline is an absolute wall-clock time, as GSGetAbsTime makes it; null waits without limit. It matters only
 //   when there is something to wait for: a free lock is taken also past it.
 // - Every wait is a cancellation point. A thread that is cancelled in one leaves the object as if it had never
-// called:
-//   counters restored, internal mutex released, waiters that it held up woken. The cancellation unwinds
+//   called: counters restored, internal mutex released, waiters that it held up woken. The cancellation unwinds
 //   through the caller's frames.
 // - A failure of an internal mutex is fatal: "asserted: rc=%d in %s (line=%d)\n" on standard error, then abort.
 // - An object may be destroyed when no thread is inside it and, for a lock, nobody holds it.

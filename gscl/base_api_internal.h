@@ -19,8 +19,8 @@ inline GSAPIRtnCollection_t* baseApi() {
   return loadedBaseApi();
 }
 
-/// Calls one entry point; WYX_NOT_SUPPORTED when the base API library does not have it. Entry points are not
-/// cancellation points: the base API library holds cancellation off or has none.
+/// Calls one entry point; WYX_NOT_SUPPORTED when the base API library does not have it. A wyx_dispatch that waits
+/// is a cancellation point, with nothing of ours held.
 template <auto Entry, class... Arguments>
 wyx_rc_t callBaseApi(Arguments... arguments) {
   auto function = baseApi()->*Entry;
