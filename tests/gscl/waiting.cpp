@@ -172,6 +172,27 @@ TEST_F(Waiting, ClientThatBecomesIdle_endsTheWaitAtItsNextWakeUp) {
   EXPECT_EQ(out.type, -1);
 }
 
+TEST_F(Waiting, ClientThatBecameIdleUnnoticed_saysSoAtTheDeadline) {
+  for (long millis = 50;; millis *= 2) {
+    joined(member);
+    const timespec until = inMillis(millis);
+    GSWaitForRC rc = GS_WAITFOR_ERROR;
+    std::thread waiter([&] {
+      member.changeStateValue(wyx_state_value_t{0, nullptr}, WYX_1_PHASE, 0);
+      rc = member.waitForNotification(GS_TRIGGER_AFTER_CALLBACK, &until, nullptr, nullptr);
+    });
+    ASSERT_TRUE(eventually([&] { return waiterAsleep(); }));
+    member.send_message({0, nullptr}, WYX_1_PHASE, 0);  // takes the wait mutex: the waiter has looked
+    member.goodbyeGroup();                              // wakes nobody
+    const timespec now = inMillis(0);
+    const bool in_time = now.tv_sec < until.tv_sec || (now.tv_sec == until.tv_sec && now.tv_nsec < until.tv_nsec);
+    waiter.join();
+    if (!in_time) continue;
+    EXPECT_EQ(rc, GS_WAITFOR_NOT_A_MEMBER);
+    return;
+  }
+}
+
 TEST_F(Waiting, OthersProtocols_leaveTheBlocksAlone) {
   joined(member);
   member.changeStateValue(wyx_state_value_t{0, nullptr}, WYX_1_PHASE, 0);
