@@ -7,9 +7,22 @@ namespace zelt_gscl_V1 {
 
 static_assert(sizeof(GSMarket) == 64, "fixed layout");
 
-GSMarket::GSMarket(int n) : _queue(n), _cond(new GSCondition), _running(1) {}
+namespace {
 
-GSMarket::~GSMarket() { delete _cond; }
+// Consumers set `awaited` before the look that precedes a wait, so a producer whose object they missed finds it
+// set (the queue's lock orders look and enqueue). While it is clear, every consumer that waits has been woken and
+// will look again, and a producer need not touch the condition: what a woken consumer costs is paid once.
+struct MarketCondition : GSCondition {
+  std::atomic<bool> awaited{false};
+};
+
+std::atomic<bool>& awaited(GSCondition* condition) { return static_cast<MarketCondition*>(condition)->awaited; }
+
+}  // namespace
+
+GSMarket::GSMarket(int n) : _queue(n), _cond(new MarketCondition), _running(1) {}
+
+GSMarket::~GSMarket() { delete static_cast<MarketCondition*>(_cond); }
 
 void GSMarket::stopMarket() {
   GS_DEBUG(GSCL_TRC_API, "GSMarket::stopMarket \n");
@@ -25,7 +38,7 @@ void GSMarket::resumeMarket() {
 
 int GSMarket::produce(GSObject* obj) {
   const int count = _queue.enqueue(obj);
-  _cond->broadcast();
+  if (awaited(_cond) && awaited(_cond).exchange(false)) _cond->broadcast();
   return count;
 }
 
@@ -40,6 +53,7 @@ GSObject* GSMarket::consume(const timespec* abstime) {
   if (GSObject* obj = take()) return obj;
   GSConditionGuard guard(*_cond);
   for (bool waited = false;; waited = true) {
+    awaited(_cond) = true;
     if (_running == 0) return waited ? nullptr : take();
     if (GSObject* obj = take()) return obj;
     if (guard.wait(abstime) != 0) return nullptr;

@@ -61,7 +61,7 @@ class ZN_GSCL_EXPORT GSMarket {
   ZN_GSCL_HIDDEN GSObject* take();
 
   GSQueue<GSObject*> _queue;  // guards itself
-  GSCondition* _cond;         // owned; consumers wait here; broadcast by every produce, stop and resume
+  GSCondition* _cond;         // owned; consumers wait here; broadcast by stop, resume, and produce when one waits
   std::atomic<int> _running;  // 1 or 0
 };
 

@@ -6,6 +6,7 @@
 
 #include <limits.h>
 
+#include <algorithm>
 #include <memory>
 #include <new>
 
@@ -54,7 +55,7 @@ class ZN_GSCL_EXPORT GSQueue : public zelt_gscl_V1::GSLockableObject {
   };
 
   ZN_GSCL_HIDDEN void grow();
-  ZN_GSCL_HIDDEN int advance(int i, int n) { return (i + 1) % n; }
+  ZN_GSCL_HIDDEN int advance(int i, int n) { return i + 1 == n ? 0 : i + 1; }  // (i + 1) mod n
 
   // All guarded by the lock of the lockable object.
   T* _data;     // circular; array new, or null
@@ -110,7 +111,9 @@ void GSQueue<T>::grow() {
   const int kStep = 16;
   if (_nalloc > INT_MAX - kStep) throw std::bad_alloc();
   std::unique_ptr<T[]> bigger(new T[static_cast<unsigned>(_nalloc + kStep)]);
-  for (int i = 0, from = _head; i < _nitems; ++i, from = advance(from, _nalloc)) bigger[i] = _data[from];
+  const int toEnd = std::min(_nitems, _nalloc - _head);
+  std::copy(_data + _head, _data + _head + toEnd, bigger.get());
+  std::copy(_data, _data + (_nitems - toEnd), bigger.get() + toEnd);
   delete[] _data;
   _data = bigger.release();
   _head = 0;
