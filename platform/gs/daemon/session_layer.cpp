@@ -185,19 +185,29 @@ void SessionLayer::too_slow(std::uint64_t session) {
 
 // ------------------------------------------------------------------------------------------------ ordered side
 
+// What a request brings its own client is written before the answer, the rest after it: a client that wakes for
+// its answer finds its notifications there and need not sleep again, and no answer waits for hundreds of sends.
 void SessionLayer::ordered(const Event& event) {
   const Outcome outcome = engine_.apply(event);
   const auto* request = std::get_if<RequestEvent>(&event);
-  if (request != nullptr && !request->answered && request->session.node == settings_.node_number) {
-    Session* session = find_session(request->session.number);
-    if (session != nullptr && session->answer_due) {
-      session->answer_due = false;
-      answer(session->request, outcome.rc);
-    }
+  const SessionId asker = request != nullptr ? request->session : SessionId{};
+  for (const Delivery& delivery : outcome.deliveries) {
+    if (request != nullptr && delivery.to.session == asker) deliver(delivery);
   }
-  for (const Delivery& delivery : outcome.deliveries) deliver(delivery);
+  if (request != nullptr && !request->answered) answer_request(asker, outcome.rc);
+  for (const Delivery& delivery : outcome.deliveries) {
+    if (request == nullptr || delivery.to.session != asker) deliver(delivery);
+  }
   encoded_.clear();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
+}
+
+void SessionLayer::answer_request(SessionId asker, wyx_rc_t rc) {
+  if (asker.node != settings_.node_number) return;
+  Session* session = find_session(asker.number);
+  if (session == nullptr || !session->answer_due) return;
+  session->answer_due = false;
+  answer(session->request, rc);
 }
 
 void SessionLayer::deliver(const Delivery& delivery) {

@@ -112,6 +112,7 @@ class SessionLayer : private PingSink {
 
   // The ordered side.
   void ordered(const Event& event);
+  void answer_request(SessionId asker, wyx_rc_t rc);
   void deliver(const Delivery& delivery);
   void arm(const TimerRequest& timer);
   SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
