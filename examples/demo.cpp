@@ -61,13 +61,13 @@ class Timeline {
   void action(const std::string& text) { std::printf("%s%7s%s%s\n", on("2"), "", text.c_str(), off()); }
   void row(unsigned long long event, const std::string& text, const std::map<size_t, double>& times) {
     std::printf("%5llu  %s%-44s%s", event, on(colour(text)), text.c_str(), off());
+    int blank = 0;  // kept back, so that no line ends in blanks
     for (size_t c = 0; c < kColumns; c++) {
+      blank += 10;
       auto time = times.find(c);
-      if (time == times.end()) {
-        std::printf("%10s", "");
-      } else {
-        std::printf("%10.1f", (time->second - start_) * 1e3);
-      }
+      if (time == times.end()) continue;
+      std::printf("%*.1f", blank, (time->second - start_) * 1e3);
+      blank = 0;
     }
     std::printf("\n");
     std::fflush(stdout);
@@ -201,8 +201,8 @@ void Demo::run() {
 
   if (!daemon_.stop(Clock::now() + kStepLimit))
     throw Failure{"the daemon did not stop in order: " + daemon_.log()};
-  std::printf("\nEverybody saw the same events in the same order. Times in milliseconds; %.1f seconds in all.\n",
-              timeline_.seconds());
+  std::printf("\nEverybody saw the same events in the same order. Times in milliseconds; %.0f in all.\n",
+              timeline_.seconds() * 1e3);
 }
 
 }  // namespace
