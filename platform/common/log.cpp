@@ -1,7 +1,14 @@
 #include "common/log.h"
 
+#include <fcntl.h>
 #include <spdlog/sinks/stdout_sinks.h>
 #include <spdlog/spdlog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <system_error>
+
+#include "common/descriptor.h"
 
 namespace platform {
 
@@ -17,6 +24,13 @@ std::optional<spdlog::level::level_enum> log_level(const std::string& name) {
     if (name == known.name) return known.level;
   }
   return std::nullopt;
+}
+
+void log_to_file(const std::string& path) {
+  const Descriptor file(open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOCTTY, 0640));
+  if (!file) throw std::system_error(errno, std::generic_category(), path);
+  dup2(file.get(), STDOUT_FILENO);
+  dup2(file.get(), STDERR_FILENO);
 }
 
 std::shared_ptr<spdlog::logger> make_log(const std::string& name, spdlog::level::level_enum level) {

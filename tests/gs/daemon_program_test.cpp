@@ -246,7 +246,7 @@ TEST(DaemonOptions, HelpAndVersion_AreAnsweredOnStandardOutput) {
   const GsdRun help = run_gsd({"--help"});
   EXPECT_EQ(help.status, 0);
   for (const char* option :
-       {"--config", "--socket-path", "--access-group", "--node-number", "--queue-bound", "--log-level"}) {
+       {"--config", "--socket-path", "--access-group", "--node-number", "--queue-bound", "--log-level", "--log-file", "--daemon"}) {
     EXPECT_THAT(help.out, HasSubstr(option));
   }
 }
@@ -293,7 +293,7 @@ class DaemonConfig : public testing::Test {
 TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const std::string path = write(
       "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\nlog-level = "
-      "\"debug\"\n");
+      "\"debug\"\nlog-file = \"/tmp/log\"\n");
   const char* argv[] = {"gsd", "--config", path.c_str(), "--node-number", "13"};
   const auto options = parse_options(5, argv);
   ASSERT_TRUE(options);
@@ -302,6 +302,7 @@ TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   EXPECT_EQ(options->node_number, 13u);
   EXPECT_EQ(options->queue_bound, 100'000u);
   EXPECT_EQ(options->log_level, spdlog::level::debug);
+  EXPECT_EQ(options->log_file, "/tmp/log");
 }
 
 TEST_F(DaemonConfig, WrongFile_IsNamedWithItsLine) {
@@ -322,6 +323,7 @@ TEST_F(DaemonConfig, Sample_SaysTheDefaults) {
   changed.node_number = 99;
   changed.queue_bound = 0;
   changed.log_level = spdlog::level::off;
+  changed.log_file = "changed";
   const Options sample = read_config(SAMPLE_CONFIG, changed);
   const Options defaults;
   EXPECT_EQ(sample.socket_path, defaults.socket_path);
@@ -329,6 +331,7 @@ TEST_F(DaemonConfig, Sample_SaysTheDefaults) {
   EXPECT_EQ(sample.node_number, defaults.node_number);
   EXPECT_EQ(sample.queue_bound, defaults.queue_bound);
   EXPECT_EQ(sample.log_level, defaults.log_level);
+  EXPECT_EQ(sample.log_file, defaults.log_file);
 }
 
 TEST(DaemonManPage, EveryOption_IsThereWithItsDefault) {
@@ -345,6 +348,7 @@ TEST(DaemonManPage, EveryOption_IsThereWithItsDefault) {
   EXPECT_THAT(entry_of("access\\-group"), HasSubstr("Default: none"));
   EXPECT_THAT(entry_of("node\\-number"), HasSubstr("Default: " + std::to_string(defaults.node_number) + "."));
   EXPECT_THAT(entry_of("queue\\-bound"), HasSubstr("Default: " + std::to_string(defaults.queue_bound) + "."));
+  EXPECT_THAT(entry_of("log\\-file"), HasSubstr("Default: none"));
   EXPECT_THAT(entry_of("log\\-level"), HasSubstr(std::string("Default: ") +
                                                  spdlog::level::to_string_view(defaults.log_level).data() + "."));
 }

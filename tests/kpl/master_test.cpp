@@ -38,6 +38,11 @@ class Kplmstr : public testing::Test {
     const std::string obstacle = PrivateMaster::obstacle();
     if (!obstacle.empty()) GTEST_SKIP() << obstacle;
   }
+  /// Whatever a test has done to it, the master ends well.
+  void TearDown() override {
+    if (!master.is_started()) return;
+    EXPECT_EQ(master.stop(), kOk) << master.master_log();
+  }
   Outcome ctl(const std::vector<std::string>& arguments) const { return master.ctl(arguments); }
   json status_of(const std::string& name) const {
     return json::parse(ctl({"status", name, "--json"}).out)["subsystems"][0];
@@ -359,6 +364,10 @@ TEST_F(Kplmstr, Daemon_ReturnsWhenItServesAndTellsWhyItDoesNot) {
   master.start(options);
   EXPECT_TRUE(master.wait_for_log("probe", "started as probe\n"));
   EXPECT_EQ(ctl({"refresh", "probe"}).status, kOk);
+
+  const Outcome second = run("kplmstr", {"--daemon", "--socket-path", master.socket_path()});
+  EXPECT_EQ(second.status, kFailed);
+  EXPECT_THAT(second.err, testing::StartsWith("kplmstr: "));
 }
 
 TEST(KplmstrProgram, WrongUse_IsToldAndTheExitStatusSaysSo) {

@@ -55,6 +55,7 @@ class PrivateMaster {
   bool wait_for_master_log(const std::string& text) const;
 
   void signal(const std::string& name);
+  bool is_started() const { return shell_ > 0; }
   /// SIGTERM; its exit status.
   int stop();
 

@@ -1,14 +1,16 @@
-// gsd: the group-services daemon, in the foreground.
+// gsd: the group-services daemon, in the foreground or as a daemon.
 #include <sys/resource.h>
 #include <unistd.h>
 
 #include <csignal>
 #include <cstdio>
 #include <exception>
+#include <functional>
 
 #include "common/log.h"
 #include "daemon/options.h"
 #include "daemon/server.h"
+#include "daemon/service.h"
 
 namespace {
 
@@ -30,11 +32,16 @@ void tell_ready(int fd) {
   close(fd);
 }
 
-void serve(const gs::daemon::Options& options) {
+void serve(gs::daemon::Options options, std::function<gs::daemon::Options()> reread) {
+  // Never destroyed: SIGTERM may find it until the process ends.
+  static auto* const service = new gs::daemon::Service(std::move(reread));
+  if (options.daemon) service->detach();
   signal(SIGPIPE, SIG_IGN);
   raise_descriptor_limit();
+  if (!options.log_file.empty()) platform::log_to_file(options.log_file);
   const auto log = platform::make_log("gsd", options.log_level);
   gs::daemon::Server server(options, log);
+  service->attach(server, options);
   log->info("gsd " GSD_VERSION " serves {} as node {}", options.socket_path, options.node_number);
   tell_ready(options.ready_fd);
   server.run();
@@ -46,7 +53,7 @@ void serve(const gs::daemon::Options& options) {
 int main(int argc, char** argv) {
   try {
     const auto options = gs::daemon::parse_options(argc, argv);
-    if (options) serve(*options);
+    if (options) serve(*options, [=] { return *gs::daemon::parse_options(argc, argv); });
     return 0;
   } catch (const gs::daemon::OptionError& error) {
     fprintf(stderr, "gsd: %s\n", error.what());

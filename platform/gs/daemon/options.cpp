@@ -4,6 +4,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <filesystem>
 #include <iostream>
 #include <iterator>
 
@@ -58,6 +59,11 @@ Problem set_log_level(Options& options, const std::string& text) {
   return {};
 }
 
+Problem set_log_file(Options& options, const std::string& text) {
+  options.log_file = text;
+  return {};
+}
+
 /// One setting, of the same name on the command line (with -- before it) and in the configuration file.
 struct Setting {
   const char* name;
@@ -73,6 +79,7 @@ constexpr Setting kSettings[] = {
     {"node-number", "N", true, "Number of this node, 0 to 32767", set_node_number},
     {"queue-bound", "BYTES", true, "Bytes that may wait for a client before it is closed", set_queue_bound},
     {"log-level", "LEVEL", false, "error, warning, info or debug", set_log_level},
+    {"log-file", "FILE", false, "File to append the log to (none: standard error)", set_log_file},
 };
 
 void apply(const std::string& name, const toml::value& value, Options& options) {
@@ -95,6 +102,12 @@ void parse_ready_fd(const std::string& text, Options& options) {
   options.ready_fd = static_cast<int>(fd);
 }
 
+/// A daemon works in "/": relative paths are those of where it was started, also when they are read again.
+void make_absolute(std::string* path) {
+  static const std::filesystem::path kStart = std::filesystem::current_path();
+  if (!path->empty()) *path = kStart / *path;
+}
+
 }  // namespace
 
 Options read_config(const std::string& path, Options options) {
@@ -114,6 +127,8 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
     app.add_option(std::string("--") + kSettings[i].name, given[i], kSettings[i].help)
         ->type_name(kSettings[i].value);
   }
+  bool daemon = false;
+  app.add_flag("--daemon", daemon, "Become a daemon, under the KPL master or from a shell");
   app.add_option("--ready-fd", ready_fd, "Descriptor that is told \"ready\" once clients can connect")
       ->type_name("FD");
   try {
@@ -126,6 +141,7 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
   }
 
   Options options;
+  if (daemon) make_absolute(&config);
   if (app.count("--config") != 0) options = read_config(config, options);
   for (std::size_t i = 0; i < std::size(kSettings); ++i) {
     const std::string option = std::string("--") + kSettings[i].name;
@@ -134,6 +150,11 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
     if (!problem.empty()) throw OptionError(option + ": " + problem);
   }
   if (app.count("--ready-fd") != 0) parse_ready_fd(ready_fd, options);
+  options.daemon = daemon;
+  if (daemon) {
+    make_absolute(&options.socket_path);
+    make_absolute(&options.log_file);
+  }
   return options;
 }
 

@@ -19,6 +19,8 @@ struct Options {
   std::uint32_t node_number = 1;               // 0 to 32767
   std::size_t queue_bound = 16 * 1024 * 1024;  // bytes that may wait for each channel of a client
   spdlog::level::level_enum log_level = spdlog::level::info;
+  std::string log_file;  // empty: standard error
+  bool daemon = false;
   int ready_fd = -1;  // told "ready" once clients can connect; -1: nobody
 };
 

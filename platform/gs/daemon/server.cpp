@@ -70,7 +70,7 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
   const auto on_stop = [](evutil_socket_t signal, short, void* self) {
-    static_cast<Server*>(self)->on_signal(static_cast<int>(signal));
+    static_cast<Server*>(self)->stop(strsignal(static_cast<int>(signal)));
   };
   acceptable_ = make_event(listener_.fd(), EV_READ | EV_PERSIST, call<&Server::on_acceptable>, this);
   accept_again_ = make_event(
@@ -94,6 +94,15 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
 Server::~Server() = default;
 
 void Server::run() { event_base_dispatch(base_.get()); }
+
+void Server::watch(int fd, std::function<void()> action) {
+  watched_action_ = std::move(action);
+  const auto on_readable = [](evutil_socket_t, short, void* self) {
+    static_cast<Server*>(self)->watched_action_();
+  };
+  watched_ = make_event(fd, EV_READ | EV_PERSIST, on_readable, this);
+  event_add(watched_.get(), nullptr);
+}
 
 // ---------------------------------------------------------------------------------------------- new connections
 
@@ -201,9 +210,9 @@ void Server::arm_deadline() {
   event_add(deadline_.get(), &time);
 }
 
-void Server::on_signal(int signal) {
+void Server::stop(const std::string& why) {
   if (stopping_) return;
-  log_->info("stopping on {} with {} clients", strsignal(signal), sessions_.sessions());
+  log_->info("stopping on {} with {} clients", why, sessions_.sessions());
   stopping_ = true;
   event_del(acceptable_.get());
   event_del(accept_again_.get());

@@ -4,6 +4,7 @@
 #include <event2/event.h>
 #include <spdlog/logger.h>
 
+#include <functional>
 #include <memory>
 #include <unordered_map>
 #include <vector>
@@ -26,8 +27,17 @@ class Server : private Transport {
   Server(const Options& options, std::shared_ptr<spdlog::logger> log);
   ~Server();
 
-  /// Serves until SIGTERM or SIGINT, then tells the clients and gives them a bounded time to be told.
+  /// Serves until SIGTERM, SIGINT or `stop`, then tells the clients and gives them a bounded time to be told.
   void run();
+  /// `why` is for the log. Again: does nothing.
+  void stop(const std::string& why);
+
+  /// Calls `action` whenever `fd` is readable. One descriptor at most.
+  void watch(int fd, std::function<void()> action);
+  void set_log_level(spdlog::level::level_enum level) { log_->set_level(level); }
+  void set_queue_bound(std::size_t bytes) { sessions_.set_queue_bound(bytes); }
+  std::vector<Engine::GroupStatus> groups() const { return sessions_.groups(); }
+  std::vector<SessionLayer::SessionStatus> sessions() const { return sessions_.status(); }
 
  private:
   struct FreeEvent {
@@ -55,7 +65,6 @@ class Server : private Transport {
   void on_acceptable();
   void on_readable(ConnectionId id);
   void on_writable(ConnectionId id);
-  void on_signal(int signal);
   void on_deadline();
 
   bool accept_one();
@@ -83,6 +92,8 @@ class Server : private Transport {
   EventPtr terminated_;
   EventPtr interrupted_;
   EventPtr farewell_over_;
+  std::function<void()> watched_action_;
+  EventPtr watched_;
   std::optional<Time> armed_;  // for which time deadline_ stands
   std::unordered_map<ConnectionId, Connection> connections_;
   ConnectionId last_connection_ = 0;

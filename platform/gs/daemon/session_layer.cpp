@@ -281,4 +281,20 @@ std::string SessionLayer::describe(const Connection& connection) const {
   return "session " + std::to_string(session->first) + " (\"" + session->second.program + "\", " + peer + ")";
 }
 
+std::vector<SessionLayer::SessionStatus> SessionLayer::status() const {
+  std::vector<SessionStatus> result;
+  const auto bytes_for = [&](ConnectionId id) {
+    const auto found = connections_.find(id);
+    return found == connections_.end() ? 0 : found->second.out.bytes();
+  };
+  for (const auto& [number, session] : sessions_) {
+    const auto request = connections_.find(session.request);
+    const Peer peer = request == connections_.end() ? Peer{} : request->second.peer;
+    result.push_back(
+        {number, session.program, peer.pid, peer.uid, bytes_for(session.request), bytes_for(session.event)});
+  }
+  std::sort(result.begin(), result.end(), [](const auto& a, const auto& b) { return a.number < b.number; });
+  return result;
+}
+
 }  // namespace gs::daemon

@@ -73,6 +73,22 @@ class SessionLayer : private PingSink {
 
   std::size_t sessions() const { return sessions_.size(); }
 
+  /// For people: a session as it stands.
+  struct SessionStatus {
+    std::uint64_t number = 0;
+    std::string program;
+    int pid = 0;
+    std::uint32_t uid = 0;
+    std::size_t answer_bytes = 0;        // that wait for the client to read them
+    std::size_t notification_bytes = 0;  // likewise
+  };
+  /// In the order of their numbers.
+  std::vector<SessionStatus> status() const;
+  std::vector<Engine::GroupStatus> groups() const { return engine_.status(); }
+
+  /// Counts for what is queued from now on.
+  void set_queue_bound(std::size_t bytes) { settings_.queue_bound = bytes; }
+
  private:
   enum class Channel { kFresh, kRequest, kEvent };
   struct Connection {
@@ -129,7 +145,7 @@ class SessionLayer : private PingSink {
   Connection* find(ConnectionId id);
   Session* find_session(std::uint64_t number);
 
-  const Settings settings_;
+  Settings settings_;
   const Environment env_;
   Engine engine_;
   Timers timers_;

@@ -164,7 +164,7 @@ std::vector<std::string> toml_files(const std::string& folder) {
   std::vector<std::string> files;
   std::filesystem::directory_iterator entries(folder, error);
   for (; !error && entries != std::filesystem::directory_iterator(); entries.increment(error)) {
-    if (entries->path().extension() == ".toml") files.push_back(entries->path());
+    if (entries->path().extension() == ".toml" && !entries->is_fifo()) files.push_back(entries->path());
   }
   if (error) throw SettingError(folder + ": cannot be read: " + error.message());
   std::sort(files.begin(), files.end());

@@ -24,25 +24,17 @@ using platform::Descriptor;
 constexpr int kExitFailure = 1;
 constexpr int kExitBadOption = 2;
 
-Descriptor checked_open(const std::string& path, int flags) {
-  Descriptor opened(open(path.c_str(), flags | O_CLOEXEC | O_NOCTTY, 0640));
-  if (!opened) throw std::system_error(errno, std::generic_category(), path);
-  return opened;
-}
-
 /// Descriptors 0 to 2 are open, and 1 and 2 are the log file where one is wanted.
 void set_standard_descriptors(const std::string& log_file) {
   const Descriptor null(open("/dev/null", O_RDWR | O_NOCTTY));
   if (null.get() >= 0 && null.get() <= STDERR_FILENO) return set_standard_descriptors(log_file);
-  if (log_file.empty()) return;
-  const Descriptor log = checked_open(log_file, O_WRONLY | O_APPEND | O_CREAT);
-  dup2(log.get(), STDOUT_FILENO);
-  dup2(log.get(), STDERR_FILENO);
+  if (!log_file.empty()) platform::log_to_file(log_file);
 }
 
 /// A daemon keeps nothing of what it was started with.
 void leave_standard_descriptors(bool keep_log) {
-  const Descriptor null = checked_open("/dev/null", O_RDWR);
+  const Descriptor null(open("/dev/null", O_RDWR | O_CLOEXEC | O_NOCTTY));
+  if (!null) throw std::system_error(errno, std::generic_category(), "/dev/null");
   dup2(null.get(), STDIN_FILENO);
   if (keep_log) return;
   dup2(null.get(), STDOUT_FILENO);
@@ -67,7 +59,8 @@ void be_the_parent() {
 void serve(const Options& options) {
   signal(SIGPIPE, SIG_IGN);
   set_standard_descriptors("");
-  std::optional<kpl::master::Detached> detached;
+  static std::optional<kpl::master::Detached>
+      detached;  // until the end: the caller waits for the reason to be told
   if (options.daemon) detached.emplace();
   be_the_parent();
   umask(S_IWGRP | S_IWOTH);

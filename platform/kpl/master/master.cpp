@@ -50,7 +50,7 @@ std::string padded(std::string text, std::size_t width) {
 
 control::Line short_line(const std::string& name, const std::string& group, const std::string& pid,
                          const std::string& state) {
-  return {name, padded(group, 18) + padded(pid, 9) + state};
+  return {name, padded(group.empty() ? "-" : group, 18) + padded(pid, 9) + state};
 }
 
 }  // namespace

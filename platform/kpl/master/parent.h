@@ -8,7 +8,7 @@
 namespace kpl::master {
 
 /// Goes on in a process that is a child of process 1 and leads a session of its own. The calling process waits for
-/// `ready`, ends with status 0 then, and with 1 when the other one ends before.
+/// `ready`, ends with status 0 then, and with 1 when this object goes before.
 class Detached {
  public:
   /// Comes back in the new process only. Throws std::system_error.

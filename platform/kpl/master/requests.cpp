@@ -127,6 +127,8 @@ void Requests::ask(const Question& question, Duration limit, Reply reply) {
 }
 
 void Requests::end_all() {
+  ended_ = true;
+  if (!waiting_.empty() && waiting_.front()->sent) on_readable();  // it may have answered with its last breath
   while (!waiting_.empty()) {
     const auto ended = std::move(waiting_.front());
     waiting_.pop_front();
@@ -136,7 +138,7 @@ void Requests::end_all() {
 
 /// Until one is sent: those that cannot be are answered at once.
 void Requests::send_first() {
-  while (!waiting_.empty() && !waiting_.front()->sent) {
+  while (!ended_ && !waiting_.empty() && !waiting_.front()->sent) {
     const std::string problem = send(*waiting_.front());
     if (!problem.empty()) drop(waiting_.begin(), End{Result::kNoAnswer, 0, problem});
   }

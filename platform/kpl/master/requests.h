@@ -35,7 +35,7 @@ class Requests {
 
   /// `limit`: for the last answer, waiting for other requests included.
   void ask(const Question& question, Duration limit, Reply reply);
-  /// Answers all that wait: the subsystem is gone.
+  /// Answers all that wait: the subsystem is gone, and nothing is asked any more.
   void end_all();
 
  private:
@@ -55,6 +55,7 @@ class Requests {
   Channel& channel_;
   const std::string name_;
   const pid_t pid_;
+  bool ended_ = false;
   std::list<std::unique_ptr<Pending>> waiting_;  // only the first one has been sent
 };
 

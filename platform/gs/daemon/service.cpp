@@ -1,0 +1,92 @@
+#include "daemon/service.h"
+
+#include <stdexcept>
+
+#include "dae/dae.h"
+
+namespace gs::daemon {
+namespace {
+
+constexpr int kRestartCalls = 1;
+constexpr int kMarginWidth = 14;
+
+/// One line of long status: its label in the margin.
+void line(const char* label, const std::string& text) {
+  dae_margin_puts(kMarginWidth, label);
+  dae_status_printf("%s\n", text.c_str());
+}
+
+std::string members_of(const Engine::GroupStatus& group) {
+  std::string text;
+  for (const ProviderId& member : group.members) {
+    text += (text.empty() ? "" : " ") + std::to_string(member.instance) + "@" + std::to_string(member.node);
+  }
+  return text;
+}
+
+void print_group(const Engine::GroupStatus& group) {
+  line("group", group.name);
+  line("  members", std::to_string(group.members.size()) + ": " + members_of(group));
+  line("  state", std::to_string(group.state_length) + " bytes, event " + std::to_string(group.seqnum));
+  line("  protocol", group.running_protocol.empty() ? "none" : group.running_protocol);
+  line("  subscribers", std::to_string(group.subscribers));
+}
+
+void print_session(const SessionLayer::SessionStatus& session) {
+  line("session", std::to_string(session.number) + " " + session.program + " (pid " + std::to_string(session.pid) +
+                      ", uid " + std::to_string(session.uid) + ")");
+  line("  queued", std::to_string(session.answer_bytes) + " bytes of answers, " +
+                       std::to_string(session.notification_bytes) + " of notifications");
+}
+
+}  // namespace
+
+void Service::detach() {
+  const int code = InitKPL(kRestartCalls, nullptr, 0, nullptr);
+  if (code == 0) return;
+  throw std::runtime_error("cannot become a daemon: " + std::to_string(code) + " " + err_detail.dae_error_string);
+}
+
+void Service::attach(Server& server, Options& options) {
+  server_ = &server;
+  options_ = &options;
+  if (getKPLDescriptor() >= 0) server.watch(getKPLDescriptor(), [this] { on_request(); });
+}
+
+void Service::on_request() {
+  doKPLreq();
+  if (getStopCode() != 0) server_->stop(getStopMsg());
+}
+
+void Service::traceBegin(int dae_long) {
+  server_->set_log_level(dae_long == 1 ? spdlog::level::trace : spdlog::level::debug);
+}
+
+void Service::traceEnd() { server_->set_log_level(options_->log_level); }
+
+/// What cannot change while clients are connected is told, not dropped in silence.
+void Service::refresh() try {
+  const Options now = reread_();
+  options_->log_level = now.log_level;
+  options_->queue_bound = now.queue_bound;
+  server_->set_log_level(now.log_level);
+  server_->set_queue_bound(now.queue_bound);
+  const auto later = [](const char* setting) { inform_printf("%s: changes with the next start\n", setting); };
+  if (now.socket_path != options_->socket_path) later("socket-path");
+  if (now.access_group != options_->access_group) later("access-group");
+  if (now.node_number != options_->node_number) later("node-number");
+} catch (const std::exception& error) {
+  error_printf("%s", error.what());
+}
+
+void Service::longStatus() {
+  print_short_status();
+  const auto groups = server_->groups();
+  const auto sessions = server_->sessions();
+  for (const auto& group : groups) print_group(group);
+  for (const auto& session : sessions) print_session(session);
+  line("total", std::to_string(groups.size()) + " groups, " + std::to_string(sessions.size()) +
+                    " sessions, node " + std::to_string(options_->node_number));
+}
+
+}  // namespace gs::daemon
