@@ -144,89 +144,6 @@ std::string body(const DelayedErrorNotification& n) {
                             : all;
 }
 
-template <typename T>
-void add_optional(Digest& d, const std::optional<T>& value) {
-  d.add(value.has_value());
-  if (value) d.add(*value);
-}
-
-void add(Digest& d, const SharedMembership& ids) {
-  d.add(ids != nullptr);
-  if (!ids) return;
-  d.add(ids->size());
-  for (ProviderId id : *ids) d.add(id);
-}
-
-void add(Digest& d, const std::vector<LeaveCode>& codes) {
-  d.add(codes.size());
-  for (const LeaveCode& code : codes) {
-    d.add(code.voluntary_or_failure);
-    d.add(code.voluntary_code);
-  }
-}
-
-void add(Digest& d, const std::vector<VoteResult>& results) {
-  d.add(results.size());
-  for (const VoteResult& r : results) {
-    d.add(r.voter);
-    d.add(r.vote);
-    d.add(r.summary);
-    d.add(r.leave_code);
-    add_optional(d, r.proposed_state);
-    add_optional(d, r.message);
-  }
-}
-
-void add(Digest& d, const ProtocolNotification& n) {
-  const Proposal& p = n.proposal;
-  d.add(n.type);
-  d.add(n.protocol);
-  d.add(n.summary);
-  d.add(n.time_limit);
-  d.add(n.seqnum);
-  d.add(p.num_phases);
-  d.add(p.phase);
-  d.add(p.whats_changed);
-  d.add(p.proposed_by);
-  add(d, p.current_providers);
-  add(d, p.changing_providers);
-  add(d, p.leave_codes);
-  d.add(p.expel_info.has_value());
-  if (p.expel_info) {
-    d.add(p.expel_info->deactivate_phase);
-    d.add(p.expel_info->flag);
-  }
-  d.add(p.current_state);
-  d.add(p.proposed_state);
-  d.add(p.message);
-  d.add(p.new_attributes != nullptr);
-  if (p.new_attributes) d.add(*p.new_attributes);
-  add(d, p.current_vote_results);
-  add(d, p.changing_vote_results);
-}
-
-void add(Digest& d, const AnnouncementNotification& n) {
-  d.add(n.summary);
-  add(d, n.providers);
-}
-
-void add(Digest& d, const SubscriptionNotification& n) {
-  d.add(n.type);
-  d.add(n.seqnum);
-  d.add(n.state);
-  add(d, n.full_membership);
-  add(d, n.changing_membership);
-  add(d, n.leave_codes);
-}
-
-void add(Digest& d, const DelayedErrorNotification& n) {
-  d.add(n.protocol);
-  d.add(n.rc);
-  d.add(n.failing_request.index());
-  d.add(n.group_attributes != nullptr);
-  if (n.group_attributes) d.add(*n.group_attributes);
-}
-
 }  // namespace
 
 std::string text(ProviderId id) {
@@ -266,27 +183,6 @@ std::string text(const std::vector<Delivery>& deliveries) {
   }
   flush();
   return all;
-}
-
-std::uint64_t digest(const Outcome& outcome) {
-  Digest d;
-  d.add(outcome.rc);
-  const Notification* last = nullptr;
-  for (const Delivery& delivery : outcome.deliveries) {
-    d.add(delivery.to);
-    d.add(delivery.what.get() == last);
-    if (delivery.what.get() == last) continue;
-    last = delivery.what.get();
-    d.add(last->index());
-    std::visit([&](const auto& n) { add(d, n); }, *last);
-  }
-  for (const TimerRequest& timer : outcome.timers) {
-    d.add(timer.id.group);
-    d.add(timer.id.protocol);
-    d.add(timer.id.phase);
-    d.add(timer.seconds);
-  }
-  return d.value();
 }
 
 }  // namespace gs::test

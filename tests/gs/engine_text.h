@@ -1,9 +1,8 @@
-// Engine values as short texts, for comparing and for reading failures; and outcomes as digests, for replicas.
+// Engine values as short texts, for comparing and for reading failures.
 #pragma once
 
 #include <string>
 
-#include "engine/digest.h"
 #include "engine/types.h"
 
 namespace gs::test {
@@ -21,8 +20,5 @@ std::string text(const std::vector<Delivery>& deliveries);
 inline constexpr Token kSubscriberToken = 100;
 
 std::string name_of(const Endpoint& endpoint);
-
-/// Every field of every delivery and timer.
-std::uint64_t digest(const Outcome& outcome);
 
 }  // namespace gs::test

@@ -1,43 +1,12 @@
 // Deep equality of messages, so that a round trip can be held against what went in.
 #pragma once
 
+#include "gs/engine_equal.h"
 #include "wire/messages.h"
 
 namespace gs::wire {
 
-template <typename T>
-bool same(const std::shared_ptr<const T>& a, const std::shared_ptr<const T>& b) {
-  return (a == nullptr) == (b == nullptr) && (a == nullptr || *a == *b);
-}
-
-inline bool same(const Proposal& a, const Proposal& b) {
-  return a.num_phases == b.num_phases && a.phase == b.phase && a.proposed_by == b.proposed_by &&
-         a.whats_changed == b.whats_changed && same(a.current_providers, b.current_providers) &&
-         same(a.changing_providers, b.changing_providers) && a.leave_codes == b.leave_codes &&
-         a.expel_info == b.expel_info && same(a.current_state, b.current_state) &&
-         same(a.proposed_state, b.proposed_state) && same(a.message, b.message) &&
-         same(a.new_attributes, b.new_attributes) && a.current_vote_results == b.current_vote_results &&
-         a.changing_vote_results == b.changing_vote_results;
-}
-inline bool same(const ProtocolNotification& a, const ProtocolNotification& b) {
-  return a.type == b.type && a.protocol == b.protocol && a.summary == b.summary && a.time_limit == b.time_limit &&
-         same(a.proposal, b.proposal) && a.seqnum == b.seqnum;
-}
-inline bool same(const AnnouncementNotification& a, const AnnouncementNotification& b) {
-  return a.summary == b.summary && same(a.providers, b.providers);
-}
-inline bool same(const SubscriptionNotification& a, const SubscriptionNotification& b) {
-  return a.type == b.type && same(a.state, b.state) && same(a.full_membership, b.full_membership) &&
-         same(a.changing_membership, b.changing_membership) && a.leave_codes == b.leave_codes &&
-         a.seqnum == b.seqnum;
-}
-inline bool same(const DelayedErrorNotification& a, const DelayedErrorNotification& b) {
-  return a.protocol == b.protocol && a.rc == b.rc && a.failing_request == b.failing_request &&
-         same(a.group_attributes, b.group_attributes);
-}
-
-template <typename... Ts>
-bool same(const std::variant<Ts...>& a, const std::variant<Ts...>& b);
+using gs::same;
 
 inline bool same(const Hello& a, const Hello& b) {
   return a.protocol_version == b.protocol_version && a.api_version == b.api_version &&
@@ -63,12 +32,5 @@ inline bool same(const NodeInfo& a, const NodeInfo& b) {
 inline bool same(const Notify& a, const Notify& b) { return a.token == b.token && same(*a.what, *b.what); }
 inline bool same(const Ping& a, const Ping& b) { return a.number == b.number; }
 inline bool same(const Farewell&, const Farewell&) { return true; }
-
-template <typename... Ts>
-bool same(const std::variant<Ts...>& a, const std::variant<Ts...>& b) {
-  if (a.index() != b.index()) return false;
-  return std::visit([&b](const auto& value) { return same(value, std::get<std::decay_t<decltype(value)>>(b)); },
-                    a);
-}
 
 }  // namespace gs::wire
