@@ -6,14 +6,6 @@ namespace {
 
 class EngineMembership : public Script {};
 
-TEST_F(EngineMembership, Join_in_one_phase_reaches_members_and_joiner_in_one_event) {
-  EXPECT_EQ(join(1), WYX_OK);
-  EXPECT_EQ(join(2, 7), WYX_OK);
-  EXPECT_EQ(seen(),
-            "1: approved join by 1 <approve> {updated-members}, members 1, changing 1, #1\n"
-            "1 2: approved join by 2@7 <approve> {updated-members}, members 1 2@7, changing 2@7, #2\n");
-}
-
 TEST_F(EngineMembership, Join_in_phases_asks_members_and_joiner_also_the_first_one_about_itself) {
   attributes.num_phases = WYX_N_PHASE;
   attributes.time_limit = 9;
@@ -30,22 +22,6 @@ TEST_F(EngineMembership, Join_in_phases_asks_members_and_joiner_also_the_first_o
             "1 2: phase 1 join by 2 {proposed-members}, members 1, changing 2, limit 9, #3\n"
             "1 2: phase 2 join by 2 {ongoing-members}, members 1, changing 2, limit 9, #4\n"
             "1 2: approved join by 2 <approve> {updated-members}, members 1 2, changing 2, #5\n");
-}
-
-TEST_F(EngineMembership, Join_rejected_leaves_the_group_as_it_was_and_its_first_one_makes_none) {
-  attributes.num_phases = WYX_N_PHASE;
-  join(1);
-  vote_all({1}, WYX_VOTE_REJECT);
-  EXPECT_TRUE(engine.status().empty());
-  join(1);
-  vote_all({1}, WYX_VOTE_APPROVE);
-  seen();
-  join(2);
-  vote_all({2, 1}, WYX_VOTE_REJECT);
-  EXPECT_EQ(seen(),
-            "1 2: phase 1 join by 2 {proposed-members}, members 1, changing 2, #3\n"
-            "1 2: rejected join by 2 <reject> {rejected-members}, members 1, changing 2, #4\n");
-  EXPECT_EQ(join(2), WYX_OK) << "the token is free again";
 }
 
 TEST_F(EngineMembership, Join_queued_behind_a_protocol_runs_after_it_one_by_one_or_as_a_batch) {
@@ -124,17 +100,6 @@ TEST_F(EngineMembership, Leaves_batch_only_with_the_same_terms_and_each_leaver_r
             "1: phase 1 leave by 3 {proposed-members}, members 1 3, changing 3(voluntary=30), #8\n");
 }
 
-TEST_F(EngineMembership, Group_ends_with_its_last_provider_and_begins_anew) {
-  group_of({1});
-  change_state(1, "x");
-  leave(1);
-  EXPECT_TRUE(engine.status().empty());
-  attributes.client_version = 8;
-  seen();
-  join(1);
-  EXPECT_EQ(seen(), "1: approved join by 1 <approve> {updated-members}, members 1, changing 1, #1\n");
-}
-
 TEST_F(EngineMembership, Failures_come_before_queued_leaves_and_joins_and_say_how_each_was_lost) {
   group_of({1, 2, 3, 4});
   change_state(1, "x", kPhases);
@@ -183,20 +148,6 @@ TEST_F(EngineMembership, Failure_leave_in_phases_is_voted_on_by_survivors_and_ca
             "2 3: approved failure by 1 <reject> {updated-members}, members 2 3, changing 1(died), #7\n");
 }
 
-TEST_F(EngineMembership, Joiner_that_dies_while_its_join_runs_is_joined_by_its_default_vote_and_fails_next) {
-  attributes.num_phases = WYX_N_PHASE;
-  group_of({1});
-  join(2);
-  dies(2);
-  seen();
-  vote_all({1}, WYX_VOTE_APPROVE);
-  EXPECT_EQ(outcomes(),
-            "1: approved join by 2 <default-approve|failed> {updated-members}\n"
-            "1: phase 1 failure by 2 {proposed-members}\n");
-  vote_all({1}, WYX_VOTE_APPROVE);
-  EXPECT_EQ(engine.status()[0].members, Membership{id(1)});
-}
-
 TEST_F(EngineMembership, All_members_dead_while_joins_wait_begins_the_group_anew_with_the_first_of_them) {
   group_of({1, 2});
   change_state(1, "x", kPhases);
@@ -237,24 +188,6 @@ TEST_F(EngineMembership, Expel_asks_the_unlisted_and_dismisses_the_listed_with_t
             "4: error 6 for leave\n"
             "4: announcement <dissolved>\n");
   EXPECT_EQ(change_state(2, "x"), WYX_BAD_MEMBER_TOKEN);
-}
-
-TEST_F(EngineMembership, Expel_rejected_is_told_to_the_listed_too_who_stay) {
-  group_of({1, 2});
-  expel(1, {id(2)}, kPhases);
-  seen();
-  vote_all({1}, WYX_VOTE_REJECT);
-  EXPECT_EQ(outcomes(), "1 2: rejected expel by 1 <reject> {rejected-members|expel}\n");
-  EXPECT_EQ(change_state(2, "x"), WYX_OK);
-}
-
-TEST_F(EngineMembership, Expelled_member_that_dies_meanwhile_is_out_once) {
-  group_of({1, 2});
-  expel(1, {id(2)}, kPhases);
-  dies(2);
-  seen();
-  vote_all({1}, WYX_VOTE_APPROVE);
-  EXPECT_EQ(outcomes(), "1: approved expel by 1 <approve> {updated-members|expel}\n");
 }
 
 TEST_F(EngineMembership, Responsiveness_is_announced_to_every_group_of_the_client_and_to_no_other) {

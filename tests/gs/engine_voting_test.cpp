@@ -6,32 +6,6 @@ namespace {
 
 class EngineVoting : public Script {};
 
-TEST_F(EngineVoting, One_phase_protocols_are_one_event_for_all_members) {
-  group_of({1, 2});
-  change_state(2, "x");
-  send(1, "hello");
-  GroupAttributes changed = attributes;
-  changed.client_version = 3;
-  change_attributes(1, changed);
-  EXPECT_EQ(
-      seen(),
-      "1 2: approved state by 2 <approve> {updated-state}, members 1 2, state 'x', #3\n"
-      "1 2: approved message by 1 <approve> {message}, members 1 2, state 'x', msg 'hello', #4\n"
-      "1 2: approved attributes by 1 <approve> {updated-attributes}, members 1 2, state 'x', version 3, #5\n");
-}
-
-TEST_F(EngineVoting, State_change_goes_through_phases_until_nobody_says_continue) {
-  group_of({1, 2});
-  change_state(1, "x", {WYX_N_PHASE, 7});
-  vote_all({1}, WYX_VOTE_CONTINUE);
-  vote_all({2}, WYX_VOTE_APPROVE);
-  vote_all({2, 1}, WYX_VOTE_APPROVE);
-  EXPECT_EQ(seen(),
-            "1 2: phase 1 state by 1 {proposed-state}, members 1 2, proposed 'x', limit 7, #3\n"
-            "1 2: phase 2 state by 1 {ongoing-state}, members 1 2, proposed 'x', limit 7, #4\n"
-            "1 2: approved state by 1 <approve> {updated-state}, members 1 2, state 'x', #5\n");
-}
-
 TEST_F(EngineVoting, Reject_wins_over_continue_once_all_have_voted_and_nothing_changes) {
   group_of({1, 2, 3});
   change_state(1, "x", kPhases);
@@ -133,79 +107,6 @@ TEST_F(EngineVoting, Default_given_with_an_earlier_vote_holds_for_this_protocol_
     expire(timers[1]);
     EXPECT_EQ(outcomes(), closing);
   }
-}
-
-TEST_F(EngineVoting, Expiry_of_a_phase_or_group_that_is_over_changes_nothing) {
-  group_of({1, 2});
-  change_state(1, "x", {WYX_N_PHASE, 5});
-  vote_all({1, 2}, WYX_VOTE_CONTINUE);
-  seen();
-  const std::uint64_t before = engine.digest();
-  expire(timers[0]);
-  EXPECT_EQ(engine.digest(), before);
-  vote_all({1, 2}, WYX_VOTE_APPROVE);
-  change_state(1, "y", {WYX_N_PHASE, 5});
-  expire(timers[0]);
-  EXPECT_EQ(last.deliveries.size(), 0u) << "the first phase of another protocol";
-  dies(1);
-  dies(2);
-  expire(timers[2]);
-  EXPECT_EQ(last.deliveries.size(), 0u);
-}
-
-TEST_F(EngineVoting, Voter_that_dies_in_any_phase_is_counted_by_default_and_asked_no_more) {
-  for (int phase = 1; phase <= 3; ++phase) {
-    attributes.group_name = "g" + std::to_string(phase);
-    const int a = 10 * phase;
-    group_of({a, a + 1, a + 2});
-    change_state(a, "x", kPhases);
-    for (int p = 1; p < 3; ++p) {
-      if (p == phase) dies(a + 2);
-      vote_all({a, a + 1}, WYX_VOTE_CONTINUE);
-      if (p < phase) vote_all({a + 2}, WYX_VOTE_CONTINUE);
-    }
-    if (phase == 3) dies(a + 2);
-    vote_all({a}, WYX_VOTE_APPROVE);
-    seen();
-    vote_all({a + 1}, WYX_VOTE_APPROVE);
-    const std::string all = std::to_string(a) + " " + std::to_string(a + 1), dead = std::to_string(a + 2);
-    EXPECT_EQ(outcomes(), all + ": approved state by " + std::to_string(a) +
-                              " <default-approve|failed> {updated-state}\n" + all + ": approved failure by " +
-                              dead + " <approve> {updated-members}\n");
-  }
-}
-
-TEST_F(EngineVoting, Vote_of_one_who_dies_after_voting_stands) {
-  group_of({1, 2});
-  change_state(1, "x", kPhases);
-  vote_all({2}, WYX_VOTE_REJECT);
-  dies(2);
-  seen();
-  vote_all({1}, WYX_VOTE_APPROVE);
-  EXPECT_EQ(outcomes(),
-            "1: rejected state by 1 <reject>\n"
-            "1: approved failure by 2 <approve> {updated-members}\n");
-}
-
-TEST_F(EngineVoting, Proposer_that_dies_does_not_stop_its_protocol) {
-  group_of({1, 2});
-  change_state(1, "x", kPhases);
-  dies(1);
-  seen();
-  vote_all({2}, WYX_VOTE_APPROVE);
-  EXPECT_EQ(seen(),
-            "2: approved state by 1 <default-approve|failed> {updated-state}, members 1 2, state 'x', #4\n"
-            "2: approved failure by 1 <approve> {updated-members}, members 2, changing 1(died), state 'x', #5\n");
-}
-
-TEST_F(EngineVoting, Last_voter_that_dies_after_continue_leaves_nobody_to_ask_and_it_is_approved) {
-  group_of({1, 2});
-  leave(2, 0, kPhases);
-  vote_all({1}, WYX_VOTE_CONTINUE);
-  seen();
-  dies(1);
-  EXPECT_EQ(outcomes(), "2: approved leave by 2 <default-approve|failed> {updated-members}\n");
-  EXPECT_TRUE(engine.status().empty());
 }
 
 TEST_F(EngineVoting, Results_are_collected_as_the_batch_control_says) {
