@@ -299,16 +299,5 @@ TEST(ClientWithoutSession, LimitsAndVersions) {
   EXPECT_EQ(wyx_get_zelt_active_version(nullptr), WYX_BAD_PARAMETER);
 }
 
-TEST(ClientWithoutSession, WhatIsNotSupportedSaysSo) {
-  EXPECT_EQ(wyx_dissolve_domain(nullptr), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_dissolve_site(nullptr, WYX_SITE_DISSOLVE_AND_HALT), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_dissolve_subcluster(nullptr), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_migrate_to_pell_prep(), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_migrate_to_pell_commit(), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_migrate_to_pell_abort(), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_migrate_vote(WYX_MIGRATION_VOTE_YES), WYX_NOT_SUPPORTED);
-  EXPECT_EQ(wyx_internal_send_domain_msg_to_gsd(WYX_PRIV_MSG_NONE, nullptr, 0), WYX_NOT_SUPPORTED);
-}
-
 }  // namespace
 }  // namespace test_support

@@ -47,17 +47,6 @@ TEST_P(ClientFlow, Join_approvedSaysWhoIsThere) {
   }
 }
 
-TEST_P(ClientFlow, Join_refused_leavesNothingBehind) {
-  join_two();
-  wyx_token_t token = -7;
-  EXPECT_EQ(join(group, 2, &token), WYX_DUPLICATE_INSTANCE_NUMBER);
-  Group other = group;
-  other.attributes.gs_time_limit = 9;
-  EXPECT_EQ(join(other, 3, &token), WYX_BAD_GROUP_ATTRIBUTES);
-  EXPECT_EQ(token, -7);
-  EXPECT_FALSE(readable(fd()));
-}
-
 TEST_P(ClientFlow, Join_rejectedByAVote_endsTheJoinersToken) {
   Group voted("voted");
   voted.attributes.gs_num_phases = WYX_N_PHASE;
@@ -103,28 +92,6 @@ TEST_P(ClientFlow, StateChange_votedThroughTwoPhases) {
   EXPECT_TRUE(seen[2].whats_changed & WYX_UPDATED_STATE_VALUE);
   EXPECT_EQ(seen[2].state, "better");
   EXPECT_EQ(seen[2].summary, static_cast<unsigned>(WYX_EXPLICIT_APPROVE));
-}
-
-TEST_P(ClientFlow, StateChange_rejected_keepsTheOldState) {
-  join_two();
-  ASSERT_EQ(change_state(first, "old"), WYX_OK);
-  ASSERT_TRUE(both_see(WYX_APPROVED_NOTIFICATION));
-  recorder().set_hook([](const Seen& seen) {
-    if (seen.type == WYX_N_PHASE_NOTIFICATION) vote(seen.token, WYX_VOTE_REJECT);
-  });
-  ASSERT_EQ(change_state(second, "new", WYX_N_PHASE), WYX_OK);
-  ASSERT_TRUE(both_see(WYX_REJECTED_NOTIFICATION));
-  const Seen last = recorder().of(first).back();
-  EXPECT_EQ(last.summary, static_cast<unsigned>(WYX_EXPLICIT_REJECT));
-  EXPECT_EQ(last.state, "old");
-  EXPECT_EQ(vote(first, WYX_VOTE_APPROVE), WYX_VOTE_NOT_EXPECTED);
-}
-
-TEST_P(ClientFlow, StateChange_whileOneRuns_collides) {
-  join_two();
-  ASSERT_EQ(change_state(first, "one", WYX_N_PHASE), WYX_OK);
-  EXPECT_EQ(change_state(second, "two", WYX_N_PHASE), WYX_COLLIDE);
-  ASSERT_TRUE(both_see(WYX_N_PHASE_NOTIFICATION));
 }
 
 TEST_P(ClientFlow, TimeLimit_runsOut_countsTheDefaultVote) {

@@ -1,6 +1,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <functional>
+
 #include "common/access.h"
 #include "daemon/session_layer.h"
 #include "gs/daemon_memory.h"
@@ -26,18 +28,6 @@ class DaemonSession : public testing::Test {
 };
 
 // ------------------------------------------------------------------------------------------------ the handshake
-
-TEST_F(DaemonSession, HelloAttachCall_AreAnsweredAndNotificationsFollowOnTheEventChannel) {
-  MemoryClient client(daemon_);
-  EXPECT_EQ(client.welcome.node_number, 1u);
-  EXPECT_EQ(client.join(7, 3), WYX_OK);
-  const auto events = client.events();
-  ASSERT_EQ(events.size(), 1u);
-  const auto& notify = std::get<wire::Notify>(events[0]);
-  EXPECT_EQ(notify.token, 7);
-  const auto& joined = std::get<ProtocolNotification>(*notify.what);
-  EXPECT_EQ(joined.proposal.proposed_by, (ProviderId{3, 1}));
-}
 
 TEST_F(DaemonSession, HelloOfAnotherProtocolVersion_IsToldSoAndClosed) {
   const ConnectionId id = daemon_.open();
@@ -80,13 +70,6 @@ TEST_F(DaemonSession, ConnectionsThatDoNotFinishTheHandshake_AreClosedAfterItsLi
   EXPECT_FALSE(complete.closed());
 }
 
-TEST_F(DaemonSession, NodeQuery_NeedsNoSession) {
-  const ConnectionId id = daemon_.open();
-  daemon_.say(id, wire::QueryNode{});
-  EXPECT_EQ(std::get<wire::NodeInfo>(daemon_.transport.take(id).at(0)).node_number, 1u);
-  EXPECT_FALSE(daemon_.closed(id));
-}
-
 // ------------------------------------------------------------------------------------------------- bad messages
 
 TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
@@ -113,71 +96,44 @@ TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
     daemon_.say(client.event, message);
     EXPECT_TRUE(client.closed()) << "kind " << message.index();
   }
+  const ConnectionId unattached = daemon_.open();
+  daemon_.say(unattached, wire::Hello{wire::kProtocolVersion, 0, 0, "a"});
+  daemon_.say(unattached, wire::Call{SubscribeRequest{1, WYX_SUBSCRIBE_STATE, "group"}});
+  EXPECT_TRUE(daemon_.closed(unattached)) << "a request before its event channel";
   EXPECT_TRUE(daemon_.logged("closed: out of order"));
   EXPECT_FALSE(bystander.closed());
   EXPECT_EQ(daemon_.layer.sessions(), 1u);
-}
-
-TEST_F(DaemonSession, RequestBeforeItsEventChannel_IsClosed) {
-  const ConnectionId id = daemon_.open();
-  daemon_.say(id, wire::Hello{wire::kProtocolVersion, 0, 0, "a"});
-  daemon_.say(id, wire::Call{SubscribeRequest{1, WYX_SUBSCRIBE_STATE, "group"}});
-  EXPECT_TRUE(daemon_.closed(id));
-}
-
-TEST_F(DaemonSession, MalformedPacketOfAMember_FailsItForTheSurvivorsOnly) {
-  MemoryClient survivor(daemon_);
-  MemoryClient broken(daemon_);
-  ASSERT_EQ(survivor.join(1, 1), WYX_OK);
-  ASSERT_EQ(broken.join(1, 2), WYX_OK);
-  daemon_.layer.received(broken.request, wire::Packet(100, std::byte{0x55}));
-  EXPECT_TRUE(broken.closed());
-  EXPECT_TRUE(daemon_.logged("(\"client\", pid 4711, uid 1000): closed: malformed: "));
-  expect_failure_leave(survivor, {2, 1});
-  EXPECT_EQ(survivor.call(MessageRequest{1, {}, "still here"}), WYX_OK);
 }
 
 TEST_F(DaemonSession, ProgramNameWithControlCharacters_CannotForgeLogLines) {
   const ConnectionId id = daemon_.open();
   daemon_.say(id, wire::Hello{wire::kProtocolVersion, 0, 0, "x\n2026 info forged"});
   daemon_.layer.lost(id, "gone");
-  EXPECT_TRUE(daemon_.logged("x?2026 info forged"));
+  EXPECT_TRUE(daemon_.logged("(\"x?2026 info forged\", pid 4711, uid 1000)"));
 }
 
 // -------------------------------------------------------------------------------------------------- how it ends
 
-TEST_F(DaemonSession, LossOfEitherChannel_FailsItsProviders) {
+TEST_F(DaemonSession, EveryEnd_FailsItsProvidersForTheSurvivors) {
   MemoryClient survivor(daemon_);
   ASSERT_EQ(survivor.join(1, 1), WYX_OK);
+  const std::vector<std::function<void(MemoryClient&)>> ends = {
+      [&](MemoryClient& c) { daemon_.layer.lost(c.request, "end of file"); },
+      [&](MemoryClient& c) { daemon_.layer.lost(c.event, "end of file"); },
+      [&](MemoryClient& c) { EXPECT_EQ(c.ask(wire::Quit{}), WYX_OK); },
+      [&](MemoryClient& c) { daemon_.layer.received(c.request, wire::Packet(100, std::byte{0x55})); },
+      [&](MemoryClient& c) {  // found gone while a notification is sent
+        c.event_wire().gone = true;
+        EXPECT_EQ(survivor.call(MessageRequest{1, {}, "to all"}), WYX_OK);
+      }};
   std::int16_t instance = 2;
-  for (const auto channel : {&MemoryClient::request, &MemoryClient::event}) {
+  for (const auto& end : ends) {
     MemoryClient dying(daemon_);
     ASSERT_EQ(dying.join(1, instance), WYX_OK);
-    daemon_.layer.lost(dying.*channel, "end of file");
-    EXPECT_TRUE(dying.closed());
+    end(dying);
+    EXPECT_TRUE(dying.closed()) << instance;
     expect_failure_leave(survivor, {instance++, 1});
   }
-}
-
-TEST_F(DaemonSession, PeerFoundGoneWhileANotificationIsSent_FailsItsProviders) {
-  MemoryClient survivor(daemon_);
-  MemoryClient dying(daemon_);
-  ASSERT_EQ(survivor.join(1, 1), WYX_OK);
-  ASSERT_EQ(dying.join(1, 2), WYX_OK);
-  dying.event_wire().gone = true;
-  EXPECT_EQ(survivor.call(MessageRequest{1, {}, "to all"}), WYX_OK);
-  EXPECT_TRUE(dying.closed());
-  expect_failure_leave(survivor, {2, 1});
-}
-
-TEST_F(DaemonSession, Quit_IsAnsweredAndEndsTheSession) {
-  MemoryClient survivor(daemon_);
-  MemoryClient leaving(daemon_);
-  ASSERT_EQ(survivor.join(1, 1), WYX_OK);
-  ASSERT_EQ(leaving.join(1, 2), WYX_OK);
-  EXPECT_EQ(leaving.ask(wire::Quit{}), WYX_OK);
-  EXPECT_TRUE(leaving.closed());
-  expect_failure_leave(survivor, {2, 1});
 }
 
 TEST_F(DaemonSession, Farewell_IsTheLastThingAClientIsSent) {
@@ -296,16 +252,6 @@ TEST_F(DaemonPings, NoAnswerInTime_IsAnnouncedOnceAndAgainWhenTheAnswerComes) {
   EXPECT_FALSE(client_.closed());
 }
 
-TEST_F(DaemonPings, AnswerThatIsNotOk_CountsAsNone) {
-  ASSERT_EQ(client_.ask(kEveryTenLimitThree), WYX_OK);
-  daemon_.pass(10s);
-  daemon_.say(client_.event, wire::PingAnswer{1, false});
-  EXPECT_EQ(announced(), WYX_RESPONSIVENESS_NO_RESPONSE);
-  daemon_.pass(10s);
-  daemon_.say(client_.event, wire::PingAnswer{2, true});
-  EXPECT_EQ(announced(), WYX_RESPONSIVENESS_RESPONSE);
-}
-
 TEST_F(DaemonPings, ClientThatAskedToBeClosedWhenSlow_IsClosed) {
   ASSERT_EQ(client_.ask(wire::SetResponsiveness{WYX_PING_RESPONSIVENESS | WYX_CLOSE_CLIENT_SOCKET, 1, 1}), WYX_OK);
   daemon_.pass(2s);
@@ -334,24 +280,6 @@ TEST_F(DaemonPings, SwitchedOff_StopsPingsAndTakesBackTheAnnouncement) {
 }
 
 // ------------------------------------------------------------------------------------------------- engine timers
-
-TEST_F(DaemonSession, VoteThatDoesNotCome_IsDecidedByTheGroupsDefaultAfterTheTimeLimit) {
-  MemoryClient voter(daemon_);
-  MemoryClient proposer(daemon_);
-  ASSERT_EQ(voter.join(1, 1), WYX_OK);
-  ASSERT_EQ(proposer.join(1, 2), WYX_OK);
-  ASSERT_EQ(proposer.call(StateChangeRequest{1, {WYX_N_PHASE, 5}, "new"}), WYX_OK);
-  ASSERT_EQ(proposer.call(VoteRequest{1, WYX_VOTE_APPROVE, {}, {}, WYX_NULL_VOTE}), WYX_OK);
-  proposer.events();
-  daemon_.pass(4'999ms);
-  EXPECT_FALSE(proposer.last_of<ProtocolNotification>());
-  daemon_.pass(1ms);
-  const auto last = proposer.last_of<ProtocolNotification>();
-  ASSERT_TRUE(last);
-  const auto& n = std::get<ProtocolNotification>(*last);
-  EXPECT_EQ(n.type, WYX_APPROVED_NOTIFICATION);
-  EXPECT_TRUE(n.summary & WYX_TIME_LIMIT_EXCEEDED);
-}
 
 // ------------------------------------------------------------------------------------------------------- access
 
