@@ -203,11 +203,4 @@ TEST_F(CuStackDump, childOfAFork_dumpsOnlyItsOwnThreads) {
       }));
 }
 
-TEST_F(CuStackDump, registration_countsOnce) {
-  EXPECT_EQ(cu_stackdump_thread_enable_1(), 0);
-  EXPECT_EQ(cu_stackdump_thread_enable_1(), 0);
-  EXPECT_EQ(cu_stackdump_thread_disable_1(pthread_self()), 0);
-  EXPECT_EQ(cu_stackdump_thread_disable_1(pthread_self()), ESRCH);
-}
-
 }  // namespace

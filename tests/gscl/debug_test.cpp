@@ -118,17 +118,6 @@ TEST(Debug, levelZeroOrNullRoutine_leaveTheEnvironmentUnread) {
   EXPECT_EQ(file.text(), "kept");
 }
 
-TEST(Debug, fileInTheEnvironment_isTruncatedAndTakesAllLines) {
-  const TempFile file("old contents");
-  const FreshOutput seen = in_fresh_process([&] {
-    environment("0x20000000", file.path());
-    GStracef(GSCL_TRC_API, "one\n");
-    GSdebugf(GSCL_TRC_API, "two\n");
-  });
-  EXPECT_EQ(seen.err, "");
-  EXPECT_THAT(file.text(), MatchesRegex(TRACE_PREFIX "TRC_GSCL one\n" TRACE_PREFIX "two\n"));
-}
-
 TEST(Debug, firstLineOfTheLibraryItself_readsTheEnvironment) {
   const FreshOutput seen = in_fresh_process([] {
     environment("0x10000000", nullptr);
@@ -300,15 +289,19 @@ std::vector<std::string> lines_of(const std::string& text) {
   return lines;
 }
 
-TEST(Debug, firstUseInManyThreads_losesNoLine) {
-  const TempFile file("");
+TEST(Debug, firstUseInManyThreads_truncatesTheFileAndLosesNoLine) {
+  const TempFile file("old contents");
   const FreshOutput seen = in_fresh_process([&] {
     environment("0x20000000", file.path());
-    in_threads([](int i) { GStracef(GSCL_TRC_API, "thread %d\n", i); });
+    in_threads([](int i) {
+      GStracef(GSCL_TRC_API, "thread %d\n", i);
+      GSdebugf(GSCL_TRC_API, "debug\n");
+    });
   });
   EXPECT_EQ(seen.status, 0) << seen.err;
   EXPECT_EQ(seen.err, "");
-  EXPECT_EQ(lines_of(file.text()).size(), static_cast<size_t>(kThreads));
+  EXPECT_EQ(lines_of(file.text()).size(), 2u * kThreads);
+  EXPECT_THAT(lines_of(file.text()), testing::Each(MatchesRegex(TRACE_PREFIX "(TRC_GSCL thread [0-9]|debug)")));
 }
 
 TEST(Debug, manyWritersWhileFileAndLevelChange_everyLineIsWhole) {

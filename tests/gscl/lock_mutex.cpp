@@ -71,22 +71,6 @@ TEST(MutexLock, nestedUnlockByAnotherThread_endsTheProcess) {
                             "asserted: rc=-1 in gscl/GSLockPrim \\(line=[0-9]+\\)\n(.|\n)*"));
 }
 
-TEST(MutexLock, cancelledContender_leavesTheLockToTheOthers) {
-  GSMutexLock lock;
-  ASSERT_EQ(lock.lock(nullptr), 0);
-  CancellableThread stays([&] {
-    lock.lock(nullptr);
-    lock.unlock();
-  });
-  CancellableThread cancelled([&] { lock.lock(nullptr); });
-  ASSERT_TRUE(eventually([&] { return waiters(lock) == 2; }));
-  cancelled.cancel();
-  EXPECT_TRUE(cancelled.join());
-  EXPECT_EQ(waiters(lock), 1);
-  EXPECT_EQ(lock.unlock(), 0);
-  EXPECT_FALSE(stays.join());
-}
-
 // Deadlines and cancellations race with releases; a lost wake-up would hang the rest.
 TEST(MutexLock, storm_keepsExclusionAndLosesNobody) {
   GSMutexLock lock;
@@ -139,16 +123,6 @@ TEST(Condition, broadcast_wakesAllAndSignalAtLeastOne) {
   EXPECT_EQ(condition.broadcast(), 0);
   for (std::thread& t : threads) t.join();
   EXPECT_EQ(waiters(condition), 0);
-}
-
-TEST(Condition, cancelledWait_restoresCountAndMutex) {
-  GSCondition condition;
-  CancellableThread cancelled([&] { condition.wait(nullptr); });
-  ASSERT_TRUE(eventually([&] { return waiters(condition) == 1; }));
-  cancelled.cancel();
-  EXPECT_TRUE(cancelled.join());
-  EXPECT_EQ(waiters(condition), 0);
-  EXPECT_EQ(condition.broadcast(), 0);
 }
 
 }  // namespace

@@ -142,23 +142,6 @@ TEST_P(WriterGivesUp, readersBehindIt_proceed) {
 INSTANTIATE_TEST_SUITE_P(RWLock, WriterGivesUp, testing::Bool(),
                          [](const auto& param) { return param.param ? "cancelled" : "timedOut"; });
 
-TEST(RWLock, cancelledReader_leavesCountersAndLockRight) {
-  GSRWLockImpl lock;
-  ASSERT_EQ(lock.WriteLock(nullptr), 0);
-  CancellableThread stays([&] {
-    lock.ReadLock(nullptr);
-    lock.ReadUnlock();
-  });
-  CancellableThread cancelled([&] { lock.ReadLock(nullptr); });
-  ASSERT_TRUE(eventually([&] { return readersWaiting(lock) == 2; }));
-  cancelled.cancel();
-  EXPECT_TRUE(cancelled.join());
-  EXPECT_EQ(readersWaiting(lock), 1);
-  lock.WriteUnlock();
-  EXPECT_FALSE(stays.join());
-  expectFree(lock);
-}
-
 TEST(RWLock, copies_areFreeAndIndependent) {
   GSRWLockImpl lock;
   ASSERT_EQ(lock.WriteLock(nullptr), 0);

@@ -94,16 +94,6 @@ TEST_F(Market, consumerThatWaited_returnsNothingWhenStoppedEvenIfObjectsCame) {
   EXPECT_EQ(market.consume(nullptr), &first);
 }
 
-TEST_F(Market, cancelledConsumer_takesNothing) {
-  lock_peek::CancellableThread consumer([&] { market.consume(nullptr); });
-  ASSERT_TRUE(waiting(1));
-  consumer.cancel();
-  EXPECT_TRUE(consumer.join());
-  EXPECT_EQ(thread_peek::waiters(market), 0);
-  market.produce(&first);
-  EXPECT_EQ(market.consume(nullptr), &first);
-}
-
 std::string debugLines;
 
 TEST_F(Market, stopAndResume_sayItOnTheDebugChannel) {

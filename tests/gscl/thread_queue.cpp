@@ -156,17 +156,6 @@ TEST(EventQueue, push_wakesNobodyAndPostWakesForBoth) {
   EXPECT_EQ(got[0].get() + got[1].get(), 3);
 }
 
-TEST(EventQueue, cancelledWaiter_takesNothingAndLeavesTheQueueUsable) {
-  GSIntegerEventQueue queue;
-  CancellableThread waiter([&] { queue.wait_event(nullptr, -1, 0); });
-  ASSERT_TRUE(eventually([&] { return waiters(queue) == 1; }));
-  waiter.cancel();
-  EXPECT_TRUE(waiter.join());
-  EXPECT_EQ(waiters(queue), 0);
-  EXPECT_EQ(queue.post_event(1), 0);
-  EXPECT_EQ(queue.count(), 1);
-}
-
 // The other wait inside wait_event: for the queue's lock, while the condition's mutex is held.
 TEST(EventQueue, waiterCancelledAtTheQueuesLock_releasesTheCondition) {
   GSIntegerEventQueue queue;
