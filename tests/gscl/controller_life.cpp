@@ -2,6 +2,7 @@
 #include <stdint.h>
 #include <string.h>
 
+#include <functional>
 #include <thread>
 
 #include "lock_peek.h"
@@ -208,27 +209,24 @@ TEST(Controller, ChangeResponsiveness_acceptedIsKept_refusedIsNot) {
                    "wyx_change_responsiveness", "A GSCntl::changeResponsiveness issued. RC=WYX_OK."}));
 }
 
-// The arguments that an entry point was given, as bytes, and its name.
-template <class... Arguments>
-std::string seen(const char* name, Arguments... arguments) {
-  std::string text(name);
-  ((text += " " + std::to_string((uintptr_t)arguments)), ...);
-  return text;
+std::vector<uintptr_t> given;  // the arguments of the last entry point
+
+/// `call` reaches `entry`, the only one that is there, with the same arguments, and gives back its result.
+template <class... Parameters, class Call, class... Arguments>
+void expectPassed(wyx_rc_t (*&entry)(Parameters...), Call call, Arguments... arguments) {
+  entry = [](Parameters... parameters) {
+    given = {(uintptr_t)parameters...};
+    return static_cast<wyx_rc_t>(30);
+  };
+  given.clear();
+  EXPECT_EQ(std::invoke(call, arguments...), static_cast<wyx_rc_t>(30));
+  EXPECT_EQ(given, (std::vector<uintptr_t>{(uintptr_t)arguments...}));
+  entry = nullptr;
 }
-
-std::string last_call;
-
-#define RECORD_ENTRY(entry, parameters, ...) \
-  api.table.entry = [] parameters {          \
-    last_call = seen(#entry, __VA_ARGS__);   \
-    return static_cast<wyx_rc_t>(30);        \
-  }
-#define EXPECT_PASSED(call, entry, ...)       \
-  EXPECT_EQ(call, static_cast<wyx_rc_t>(30)); \
-  EXPECT_EQ(last_call, seen(#entry, __VA_ARGS__))
 
 TEST(Controller, Queries_passArgumentsAndResultThrough) {
   RecordingApi api(0);
+  GSAPIRtnCollection_t& t = api.table;
   int node = 0;
   char id[64];
   wyx_limits limits;
@@ -236,43 +234,27 @@ TEST(Controller, Queries_passArgumentsAndResultThrough) {
   wyx_ip_addr address;
   wyx_provider_t provider = ownId();
   wyx_zelt_version_t version;
-  RECORD_ENTRY(wyx_get_limits, (wyx_limits * a), a);
-  EXPECT_PASSED(GSController::getLimits(&limits), wyx_get_limits, &limits);
-  EXPECT_PASSED(GSController::getLimits(nullptr), wyx_get_limits, (void*)nullptr);
-  RECORD_ENTRY(wyx_get_node_number, (int* a), a);
-  EXPECT_PASSED(GSController::get_node_number(&node), wyx_get_node_number, &node);
-  RECORD_ENTRY(wyx_get_domain_master_node_number, (int* a), a);
-  EXPECT_PASSED(GSController::get_domain_master_node_number(&node), wyx_get_domain_master_node_number, &node);
-  RECORD_ENTRY(wyx_get_adapter_info, (wyx_adapter_info * a), a);
-  EXPECT_PASSED(GSController::get_adapter_info(&adapter), wyx_get_adapter_info, &adapter);
-  RECORD_ENTRY(wyx_get_adapter_info_by_addr, (const wyx_ip_addr* a, wyx_adapter_info* b), a, b);
-  EXPECT_PASSED(GSController::get_adapter_info_by_addr(&address, &adapter), wyx_get_adapter_info_by_addr, &address,
-                &adapter);
-  RECORD_ENTRY(wyx_get_adapter_info_by_id, (wyx_token_t a, const wyx_provider_t* b, wyx_adapter_info* c), a, b, c);
-  EXPECT_PASSED(GSController::get_adapter_info_by_id(12, &provider, &adapter), wyx_get_adapter_info_by_id, 12,
-                &provider, &adapter);
-  RECORD_ENTRY(wyx_get_ipaddr_by_id, (wyx_token_t a, const wyx_provider_t* b, wyx_ip_addr* c), a, b, c);
-  EXPECT_PASSED(GSController::get_ipaddr_by_id(12, &provider, &address), wyx_get_ipaddr_by_id, 12, &provider,
-                &address);
-  RECORD_ENTRY(wyx_get_ffdc_id, (char* a), a);
-  EXPECT_PASSED(GSController::get_ffdc_id(id), wyx_get_ffdc_id, &id[0]);
-  RECORD_ENTRY(wyx_get_zelt_active_version, (wyx_zelt_version_t * a), a);
-  EXPECT_PASSED(GSController::get_zelt_active_version(&version), wyx_get_zelt_active_version, &version);
-  RECORD_ENTRY(wyx_get_zelt_installed_version, (wyx_zelt_version_t * a), a);
-  EXPECT_PASSED(GSController::get_zelt_installed_version(&version), wyx_get_zelt_installed_version, &version);
-  RECORD_ENTRY(wyx_migrate_to_pell_prep, (), 0);
-  EXPECT_PASSED(GSController::pell_migrate_prep(), wyx_migrate_to_pell_prep, 0);
-  RECORD_ENTRY(wyx_migrate_to_pell_commit, (), 0);
-  EXPECT_PASSED(GSController::pell_migrate_commit(), wyx_migrate_to_pell_commit, 0);
-  RECORD_ENTRY(wyx_migrate_to_pell_abort, (), 0);
-  EXPECT_PASSED(GSController::pell_migrate_abort(), wyx_migrate_to_pell_abort, 0);
-  RECORD_ENTRY(wyx_migrate_vote, (wyx_migration_vote_t a), a);
-  EXPECT_PASSED(GSController::pell_migrate_vote(WYX_MIGRATION_VOTE_NO), wyx_migrate_vote, WYX_MIGRATION_VOTE_NO);
-  RECORD_ENTRY(wyx_dispatch, (wyx_dispatch_flag_t a), a);
+  using C = GSController;
+  expectPassed(t.wyx_get_limits, C::getLimits, &limits);
+  expectPassed(t.wyx_get_node_number, C::get_node_number, &node);
+  expectPassed(t.wyx_get_domain_master_node_number, C::get_domain_master_node_number, &node);
+  expectPassed(t.wyx_get_adapter_info, C::get_adapter_info, &adapter);
+  expectPassed(t.wyx_get_adapter_info_by_addr, C::get_adapter_info_by_addr, &address, &adapter);
+  expectPassed(t.wyx_get_adapter_info_by_id, C::get_adapter_info_by_id, 12, &provider, &adapter);
+  expectPassed(t.wyx_get_ipaddr_by_id, C::get_ipaddr_by_id, 12, &provider, &address);
+  expectPassed(t.wyx_get_ffdc_id, C::get_ffdc_id, &id[0]);
+  expectPassed(t.wyx_get_zelt_active_version, C::get_zelt_active_version, &version);
+  expectPassed(t.wyx_get_zelt_installed_version, C::get_zelt_installed_version, &version);
+  expectPassed(t.wyx_migrate_to_pell_prep, C::pell_migrate_prep);
+  expectPassed(t.wyx_migrate_to_pell_commit, C::pell_migrate_commit);
+  expectPassed(t.wyx_migrate_to_pell_abort, C::pell_migrate_abort);
+  expectPassed(t.wyx_migrate_vote, C::pell_migrate_vote, WYX_MIGRATION_VOTE_NO);
   zelt_gscl_V1::GSDispatcher dispatcher;
-  EXPECT_PASSED(dispatcher.dispatch(WYX_BLOCKING), wyx_dispatch, WYX_BLOCKING);
+  expectPassed(
+      t.wyx_dispatch, [&](auto flag) { return dispatcher.dispatch(flag); }, WYX_BLOCKING);
   GSController controller;
-  EXPECT_PASSED(controller.dispatch(WYX_NON_BLOCKING), wyx_dispatch, WYX_NON_BLOCKING);
+  expectPassed(
+      t.wyx_dispatch, [&](auto flag) { return controller.dispatch(flag); }, WYX_NON_BLOCKING);
 }
 
 TEST(Controller, DomainOperations_traceAndPassThrough) {
@@ -289,16 +271,13 @@ TEST(Controller, DomainOperations_traceAndPassThrough) {
   remote.action = WYX_SUBCLUSTER_DISSOLVE_AND_HALT;
   remote.info.site_spec.site_number = 9;
   char data[4] = {};
-  RECORD_ENTRY(wyx_dissolve_domain, (const wyx_domain_spec_t* a), a);
-  EXPECT_PASSED(controller.dissolveDomain(&domain), wyx_dissolve_domain, &domain);
-  RECORD_ENTRY(wyx_dissolve_site, (const wyx_site_spec_t* a, wyx_site_dissolve_action_t b), a, b);
-  EXPECT_PASSED(controller.dissolveSite(&site, WYX_SITE_DISSOLVE_AND_REBOOT), wyx_dissolve_site, &site, 1);
-  RECORD_ENTRY(wyx_dissolve_subcluster, (const wyx_subcluster_dissolution_info_t* a), a);
-  EXPECT_PASSED(controller.dissolveSubcluster(&local), wyx_dissolve_subcluster, &local);
-  EXPECT_PASSED(controller.dissolveSubcluster(&remote), wyx_dissolve_subcluster, &remote);
-  RECORD_ENTRY(wyx_internal_send_domain_msg_to_gsd, (wyx_priv_channel_msg_type_t a, void* b, uint64_t c), a, b, c);
-  EXPECT_PASSED(controller.sendDomainMsgToGSD(WYX_PRIV_MSG_OPQUORUM, data, 4), wyx_internal_send_domain_msg_to_gsd,
-                1, &data[0], 4);
+  const auto on = [&](auto function) { return std::bind_front(function, &controller); };
+  expectPassed(api.table.wyx_dissolve_domain, on(&V3::dissolveDomain), &domain);
+  expectPassed(api.table.wyx_dissolve_site, on(&V3::dissolveSite), &site, WYX_SITE_DISSOLVE_AND_REBOOT);
+  expectPassed(api.table.wyx_dissolve_subcluster, on(&V3::dissolveSubcluster), &local);
+  expectPassed(api.table.wyx_dissolve_subcluster, on(&V3::dissolveSubcluster), &remote);
+  expectPassed(api.table.wyx_internal_send_domain_msg_to_gsd, on(&V3::sendDomainMsgToGSD), WYX_PRIV_MSG_OPQUORUM,
+               &data[0], 4);
   EXPECT_EQ(api.take(), (Lines{"A stub_dissolve_domain node=5", "A stub_dissolve_site site=6, action=1",
                                "A stub_dissolve_subcluster node=8", "A stub_dissolve_subcluster site=9, action=2",
                                "A stub_send_domain_msg_to_gsd msg_code=1"}));
@@ -310,12 +289,6 @@ TEST(Controller, DomainOperations_traceAndPassThrough) {
 class Registry : public testing::Test {
  protected:
   GSClient* find(wyx_token_t token) { return (controller.*reveal(private_access::FindClient{}))(token); }
-  GSProvider* findProvider(wyx_token_t token) {
-    return (controller.*reveal(private_access::FindProvider{}))(token);
-  }
-  GSSubscriber* findSubscriber(wyx_token_t token) {
-    return (controller.*reveal(private_access::FindSubscriber{}))(token);
-  }
   int add(GSClient* client) { return (controller.*reveal(private_access::AddClient{}))(client); }
   int remove(GSClient* client) { return (controller.*reveal(private_access::RemoveClient{}))(client); }
 
@@ -332,18 +305,6 @@ TEST_F(Registry, Find_skipsIdleClientsAndTakesTheEarliestRegistered) {
   first.joinGroup();
   EXPECT_EQ(find(kToken), &first);
   EXPECT_EQ(find(kToken + 1), nullptr);
-}
-
-TEST_F(Registry, Find_byKind) {
-  GSProvider provider("a", 1, nullptr);
-  GSSubscriber subscriber("a", WYX_SUBSCRIBE_STATE);
-  provider.joinGroup();
-  api.token = 13;
-  subscriber.subscribeGroup();
-  EXPECT_EQ(findProvider(12), &provider);
-  EXPECT_EQ(findProvider(13), nullptr);
-  EXPECT_EQ(findSubscriber(13), &subscriber);
-  EXPECT_EQ(findSubscriber(12), nullptr);
 }
 
 TEST_F(Registry, Remove_oneEntryAtATime) {
@@ -401,34 +362,25 @@ long slot(Function function) {
 }
 
 TEST(Layout, VirtualSlots_areInTheStatedOrder) {
-  EXPECT_EQ(slot(&GSController::initialize), 2);
-  EXPECT_EQ(slot(&GSController::quit), 3);
-  EXPECT_EQ(slot(&GSController::responsivenessCb), 4);
-  EXPECT_EQ(slot(&GSController::queryCb), 5);
-  EXPECT_EQ(slot(&GSController::dispatch), 6);
-  EXPECT_EQ(slot(&V3::changeResponsiveness), 7);
-  EXPECT_EQ(slot(&V3::dissolveDomain), 8);
-  EXPECT_EQ(slot(&V3::domainControlCb), 9);
+  using Numbers = std::vector<long>;
+  EXPECT_EQ(
+      (Numbers{slot(&GSController::initialize), slot(&GSController::quit), slot(&GSController::responsivenessCb),
+               slot(&GSController::queryCb), slot(&GSController::dispatch), slot(&V3::changeResponsiveness),
+               slot(&V3::dissolveDomain), slot(&V3::domainControlCb)}),
+      (Numbers{2, 3, 4, 5, 6, 7, 8, 9}));
   EXPECT_EQ(slot(&zelt_gscl_V1::GSDispatcher::dispatch), 2);
-  EXPECT_EQ(slot(&GSClient::type), 2);
-  EXPECT_EQ(slot(&GSClient::delayedErrorCb), 3);
-  EXPECT_EQ(slot(&GSProvider::nPhaseCb), 4);
-  EXPECT_EQ(slot(&GSProvider::approvedCb), 5);
-  EXPECT_EQ(slot(&GSProvider::rejectedCb), 6);
-  EXPECT_EQ(slot(&GSProvider::announcementCb), 7);
-  EXPECT_EQ(slot(&GSProvider::mergeCb), 8);
-  EXPECT_EQ(slot(&GSProvider::joinGroup), 9);
-  EXPECT_EQ(slot(&GSProvider::goodbyeGroup), 10);
-  using Request = wyx_rc_t (GSProvider::*)(const wyx_proposal_info_t*);
-  EXPECT_EQ(slot<Request>(&GSProvider::changeStateValue), 11);
-  EXPECT_EQ(slot<Request>(&GSProvider::leaveGroup), 12);
-  EXPECT_EQ(slot<Request>(&GSProvider::expelMembers), 13);
-  EXPECT_EQ(slot<Request>(&GSProvider::send_message), 14);
-  EXPECT_EQ(slot(&GSProvider::vote), 15);
-  EXPECT_EQ(slot<Request>(&GSProvider::change_attributes), 16);
-  EXPECT_EQ(slot(&GSSubscriber::subscribeGroup), 4);
-  EXPECT_EQ(slot(&GSSubscriber::unsubscribeGroup), 5);
-  EXPECT_EQ(slot(&GSSubscriber::subscribeCb), 6);
+  EXPECT_EQ((Numbers{slot(&GSClient::type), slot(&GSClient::delayedErrorCb)}), (Numbers{2, 3}));
+  using P = GSProvider;
+  using Request = wyx_rc_t (P::*)(const wyx_proposal_info_t*);
+  EXPECT_EQ(
+      (Numbers{slot(&P::nPhaseCb), slot(&P::approvedCb), slot(&P::rejectedCb), slot(&P::announcementCb),
+               slot(&P::mergeCb), slot(&P::joinGroup), slot(&P::goodbyeGroup), slot<Request>(&P::changeStateValue),
+               slot<Request>(&P::leaveGroup), slot<Request>(&P::expelMembers), slot<Request>(&P::send_message),
+               slot(&P::vote), slot<Request>(&P::change_attributes)}),
+      (Numbers{4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16}));
+  using S = GSSubscriber;
+  EXPECT_EQ((Numbers{slot(&S::subscribeGroup), slot(&S::unsubscribeGroup), slot(&S::subscribeCb)}),
+            (Numbers{4, 5, 6}));
 }
 
 }  // namespace

@@ -20,8 +20,6 @@ struct Reveal {
 REVEAL(AddClient, &zelt_gscl_V1::GSController::addClient);
 REVEAL(RemoveClient, &zelt_gscl_V1::GSController::removeClient);
 REVEAL(FindClient, &zelt_gscl_V1::GSController::findClient);
-REVEAL(FindProvider, &zelt_gscl_V1::GSController::findProvider);
-REVEAL(FindSubscriber, &zelt_gscl_V1::GSController::findSubscriber);
 #undef REVEAL
 
 }  // namespace private_access

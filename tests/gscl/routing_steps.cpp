@@ -338,7 +338,9 @@ TEST_F(Routing, UnknownToken_tracedAndDropped) {
   joined(member);
   Proposal proposal(otherId());
   const auto approved = proposal.approved(WYX_JOIN, 99);
-  const auto rejected = proposal.rejected(WYX_JOIN, 99);
+  api.token = 13;
+  subscribed(watcher);
+  const auto rejected = proposal.rejected(WYX_JOIN, 13);  // a subscriber's
   const auto phase = proposal.phase(WYX_JOIN, 1, 2, 99);
   auto announced = announcement(WYX_GROUP_DISSOLVED);
   announced.gs_provider_token = 99;
@@ -353,7 +355,7 @@ TEST_F(Routing, UnknownToken_tracedAndDropped) {
   GSController::stub_subscribeCb(&of_a_provider);
   EXPECT_EQ(
       steps(),
-      (Lines{"W stub_approvedCb provider_token=99 not found", "W stub_rejectedCb provider_token=99 not found",
+      (Lines{"W stub_approvedCb provider_token=99 not found", "W stub_rejectedCb provider_token=13 not found",
              "W stub_nPhaseCb token 99 not found", "W stub_announcementCb provider_token=99 not found",
              "W GSController::stub_delayedErrCb - unable to find a client(token=99) for protocol=WYX_LEAVE",
              "W Subscriber 12 is not found...ERROR"}));
