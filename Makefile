@@ -23,6 +23,7 @@ install: all ## libraries, programs, headers, CMake package and .pc under PREFIX
 	@cmake --install $(release) --prefix '$(PREFIX)'
 
 package: all ## a .deb in build/release
+	@scripts/dependencies.sh package
 	@cd $(release) && cpack -G DEB
 
 help: ## this list
