@@ -57,6 +57,19 @@ TEST_F(EngineRequests, Join_must_have_the_groups_attributes_each_of_them) {
   differs([](GroupAttributes& a) { a.time_limit = 1; });
 }
 
+TEST_F(EngineRequests, Session_with_as_many_clients_as_may_be_gets_no_more_until_one_goes) {
+  group_of({1});
+  SubscribeRequest more{2, WYX_SUBSCRIBE_STATE, "g"};
+  for (; more.token <= static_cast<Token>(kMaxSessionClients); ++more.token) ASSERT_EQ(request(1, more), WYX_OK);
+  expect_refused(1, more, WYX_NO_MEMORY);
+  JoinRequest another = join_request(7);
+  another.token = more.token;
+  expect_refused(1, another, WYX_NO_MEMORY);
+  EXPECT_EQ(subscribe(2, WYX_SUBSCRIBE_STATE), WYX_OK);
+  ASSERT_EQ(request(1, UnsubscribeRequest{2}), WYX_OK);
+  EXPECT_EQ(request(1, another), WYX_OK);
+}
+
 TEST_F(EngineRequests, Instance_is_unique_per_node_against_members_and_queued_joins) {
   group_of({1});
   expect_refused(2, join_request(1), WYX_DUPLICATE_INSTANCE_NUMBER);

@@ -47,6 +47,7 @@ struct Engine::State {
   wyx_rc_t check(SessionId session, const SubscribeRequest& request) const;
   wyx_rc_t check(SessionId session, const UnsubscribeRequest& request) const;
   wyx_rc_t check_new_token(SessionId session, Token token) const;
+  wyx_rc_t check_room(SessionId session) const;
 
   void perform(SessionId session, const JoinRequest& request, Outcome& out);
   void perform(SessionId session, const LeaveRequest& request, Outcome& out);
@@ -79,12 +80,21 @@ wyx_rc_t Engine::State::check_new_token(SessionId session, Token token) const {
   return token >= 0 && !find(session, token) ? WYX_OK : WYX_BAD_MEMBER_TOKEN;
 }
 
+/// No session makes the daemon's memory grow without bound.
+wyx_rc_t Engine::State::check_room(SessionId session) const {
+  std::size_t count = 0;
+  auto it = clients.lower_bound({session, 0});
+  for (; it != clients.end() && it->first.session == session && count < kMaxSessionClients; ++it) ++count;
+  return count < kMaxSessionClients ? WYX_OK : WYX_NO_MEMORY;
+}
+
 wyx_rc_t Engine::State::check(SessionId session, const JoinRequest& request) const {
   if (wyx_rc_t rc = check_new_token(session, request.token); rc != WYX_OK) return rc;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   const Group* group = find_group(request.attributes.group_name);
   const ProviderId id{request.instance, static_cast<std::int16_t>(session.node)};
-  return group ? group->check_join(request.attributes, id) : WYX_OK;
+  if (wyx_rc_t rc = group ? group->check_join(request.attributes, id) : WYX_OK; rc != WYX_OK) return rc;
+  return check_room(session);
 }
 
 wyx_rc_t Engine::State::check(SessionId session, const StateChangeRequest& request) const {
@@ -142,7 +152,8 @@ wyx_rc_t Engine::State::check(SessionId session, const SubscribeRequest& request
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   const Group* group = find_group(request.group_name);
   const bool waits = request.control & WYX_SUBSCRIBE_PERSISTENCE;
-  return waits || (group && group->born()) ? WYX_OK : WYX_UNKNOWN_GROUP;
+  if (!waits && !(group && group->born())) return WYX_UNKNOWN_GROUP;
+  return check_room(session);
 }
 
 wyx_rc_t Engine::State::check(SessionId session, const UnsubscribeRequest& request) const {

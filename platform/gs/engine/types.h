@@ -23,6 +23,7 @@ inline constexpr std::size_t kMaxProviderMessage = 64 * 1024;  // bytes
 inline constexpr std::size_t kMaxExpelFlag = 256;              // bytes
 inline constexpr std::size_t kMaxLocalName = 256;              // characters
 inline constexpr std::size_t kMaxExpelList = 4096;             // providers
+inline constexpr std::size_t kMaxSessionClients = 4096;        // providers and subscribers of one session
 inline constexpr std::size_t kMaxCollected = 4 * 1024 * 1024;  // bytes, of all values in one event's vote results
 
 /// Chosen by the client, unique among the live tokens of its session, never negative.
