@@ -299,6 +299,14 @@ TEST_F(ClientOfAFake, Quit_saysSo) {
   EXPECT_EQ(fcntl(fd, F_GETFD), -1);
 }
 
+TEST_F(ClientOfAFake, DaemonHangsOnARequest_quitComesBackAndSoDoesTheRequest) {
+  const wyx_token_t token = accepted_join("stuck");
+  auto sending = std::async(std::launch::async, [&] { return send_message(token, "x"); });
+  session.request.receive<wire::Call>();
+  EXPECT_EQ(wyx_quit(), WYX_OK);
+  EXPECT_EQ(sending.get(), WYX_NO_INIT);
+}
+
 class ClientOfADaemon : public testing::TestWithParam<int> {};
 
 TEST_P(ClientOfADaemon, DaemonGone_everyClientIsToldAndANewDaemonServes) {

@@ -4,6 +4,8 @@
 
 #include <pthread.h>
 
+#include <ctime>
+
 #if defined(__clang__)
 #define GS_ANNOTATION(x) __attribute__((x))
 #else
@@ -22,6 +24,13 @@ class GS_ANNOTATION(capability("mutex")) Mutex {
   Mutex& operator=(const Mutex&) = delete;
 
   void lock() GS_ANNOTATION(acquire_capability()) { pthread_mutex_lock(&mutex_); }
+  /// False: others had it for so long.
+  bool lock_within(int seconds) GS_ANNOTATION(try_acquire_capability(true)) {
+    timespec until{};
+    clock_gettime(CLOCK_REALTIME, &until);
+    until.tv_sec += seconds;
+    return pthread_mutex_timedlock(&mutex_, &until) == 0;
+  }
   void unlock() GS_ANNOTATION(release_capability()) { pthread_mutex_unlock(&mutex_); }
 
  private:

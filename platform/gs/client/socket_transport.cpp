@@ -80,6 +80,11 @@ SocketTransport::SocketTransport(std::unique_ptr<Channel> requests, std::unique_
 template <typename T>
 wyx_rc_t SocketTransport::exchange(const wire::ClientMessage& message, T* answer) {
   MutexLock lock(exchange_mutex_);
+  return exchange_locked(message, answer);
+}
+
+template <typename T>
+wyx_rc_t SocketTransport::exchange_locked(const wire::ClientMessage& message, T* answer) {
   if (gone_) return WYX_NO_INIT;
   std::optional<T> received;
   if (requests_->send(message)) received = requests_->receive_a<T>();
@@ -149,9 +154,13 @@ bool SocketTransport::gone() {
 }
 
 void SocketTransport::quit() {
-  wire::Answer answer;
-  requests_->limit_waits(Channel::kPatience);
-  exchange(wire::Quit{}, &answer);
+  // A daemon that hangs keeps a request waiting, but not the one who wants to leave: the request comes back too.
+  if (exchange_mutex_.lock_within(Channel::kPatience)) {
+    wire::Answer answer;
+    requests_->limit_waits(Channel::kPatience);
+    exchange_locked(wire::Quit{}, &answer);
+    exchange_mutex_.unlock();
+  }
   gone_ = true;
   requests_->shut_down();
   events_->shut_down();

@@ -35,6 +35,8 @@ class SocketTransport : public Transport {
  private:
   template <typename T>
   wyx_rc_t exchange(const wire::ClientMessage& message, T* answer);
+  template <typename T>
+  wyx_rc_t exchange_locked(const wire::ClientMessage& message, T* answer) GS_REQUIRES(exchange_mutex_);
   void lose(const char* what);
 
   const std::uint32_t node_number_;
