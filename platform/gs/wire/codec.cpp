@@ -138,7 +138,7 @@ std::string problem_with(const Request& request) {
 
 Encoded::Encoded(const std::uint8_t* payload, std::size_t length, std::size_t limit) {
   if (length > limit) return;
-  auto bytes = std::make_shared_for_overwrite<std::byte[]>(length);
+  std::shared_ptr<std::byte[]> bytes(new std::byte[length]);  // not cleared
   std::memcpy(bytes.get(), payload, length);
   payload_ = std::move(bytes);
   length_ = length;
