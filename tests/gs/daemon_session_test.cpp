@@ -252,11 +252,16 @@ TEST_F(DaemonPings, NoAnswerInTime_IsAnnouncedOnceAndAgainWhenTheAnswerComes) {
   EXPECT_FALSE(client_.closed());
 }
 
-TEST_F(DaemonPings, ClientThatAskedToBeClosedWhenSlow_IsClosed) {
+TEST_F(DaemonPings, ClientThatAskedToBeClosedWhenSlow_IsAnnouncedAndClosed) {
   ASSERT_EQ(client_.ask(wire::SetResponsiveness{WYX_PING_RESPONSIVENESS | WYX_CLOSE_CLIENT_SOCKET, 1, 1}), WYX_OK);
+  other_.events();
   daemon_.pass(2s);
   EXPECT_TRUE(client_.closed());
-  expect_failure_leave(other_, {1, 1});
+  const auto events = other_.events();
+  ASSERT_EQ(events.size(), 2u);
+  const auto first = std::get<wire::Notify>(events[0]).what, second = std::get<wire::Notify>(events[1]).what;
+  EXPECT_EQ(std::get<AnnouncementNotification>(*first).summary, WYX_RESPONSIVENESS_NO_RESPONSE);
+  EXPECT_EQ(std::get<ProtocolNotification>(*second).protocol, WYX_FAILURE_LEAVE);
 }
 
 TEST_F(DaemonPings, SettingsThatCannotBe_AreRefusedAndChangeNothing) {
@@ -280,6 +285,20 @@ TEST_F(DaemonPings, SwitchedOff_StopsPingsAndTakesBackTheAnnouncement) {
 }
 
 // ------------------------------------------------------------------------------------------------- engine timers
+
+TEST_F(DaemonSession, GroupsThatAreGoneLongBeforeTheirTimeLimit_LeaveNoTimersBehind) {
+  MemoryClient client(daemon_);
+  JoinRequest join;
+  join.token = 1;
+  join.attributes.num_phases = WYX_N_PHASE;
+  join.attributes.time_limit = 60000;
+  for (int i = 0; i < 1000; ++i) {
+    join.attributes.group_name = "group " + std::to_string(i);
+    ASSERT_EQ(client.call(join), WYX_OK);
+    ASSERT_EQ(client.call(GoodbyeRequest{1}), WYX_OK);
+  }
+  EXPECT_LT(daemon_.layer.phase_timers(), 100u);
+}
 
 // ------------------------------------------------------------------------------------------------------- access
 

@@ -50,11 +50,11 @@ void Pinger::overdue() {
 void Pinger::missed() {
   if (!responding_) return;
   responding_ = false;
-  if (close_when_slow_) {
-    sink_.too_slow(session_);
-  } else {
-    sink_.responding_changed(session_, false);
-  }
+  PingSink& sink = sink_;  // the announcement may end the session, and with it this pinger
+  const std::uint64_t session = session_;
+  const bool close = close_when_slow_;
+  sink.responding_changed(session, false);
+  if (close) sink.too_slow(session);
 }
 
 void Pinger::answered(const wire::PingAnswer& answer) {

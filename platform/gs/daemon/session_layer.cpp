@@ -220,12 +220,25 @@ void SessionLayer::deliver(const Delivery& delivery) {
 }
 
 void SessionLayer::arm(const TimerRequest& timer) {
-  Timers::Id& of_group = phase_timers_[timer.id.group];
-  timers_.cancel(of_group);
-  of_group = timers_.arm(env_.now() + std::chrono::seconds(timer.seconds), [this, id = timer.id] {
+  if (phase_timers_.size() >= sweep_timers_at_) drop_stale_timers();
+  PhaseTimer& of_group = phase_timers_[timer.id.group];
+  timers_.cancel(of_group.timer);
+  of_group.phase = timer.id;
+  of_group.timer = timers_.arm(env_.now() + std::chrono::seconds(timer.seconds), [this, id = timer.id] {
     phase_timers_.erase(id.group);
     env_.ordering.submit(TimerExpiredEvent{id});
   });
+}
+
+/// A phase may end hours before its limit: without this, groups that come and go would leave their timers behind.
+void SessionLayer::drop_stale_timers() {
+  std::erase_if(phase_timers_, [this](const auto& of_group) {
+    PhaseTimer ended = of_group.second;
+    if (engine_.awaits(ended.phase)) return false;
+    timers_.cancel(ended.timer);
+    return true;
+  });
+  sweep_timers_at_ = std::max(kFewTimers, 2 * phase_timers_.size());
 }
 
 // --------------------------------------------------------------------------------------------- sending, ending

@@ -72,6 +72,7 @@ class SessionLayer : private PingSink {
   bool drained() const;
 
   std::size_t sessions() const { return sessions_.size(); }
+  std::size_t phase_timers() const { return phase_timers_.size(); }
 
   /// For people: a session as it stands.
   struct SessionStatus {
@@ -111,6 +112,7 @@ class SessionLayer : private PingSink {
     Pinger pinger;
   };
   enum class End { kQuit, kGone, kFault };
+  static constexpr std::size_t kFewTimers = 64;
 
   // One message of a client; each may close the connection it came on.
   void on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
@@ -131,6 +133,7 @@ class SessionLayer : private PingSink {
   void answer_request(SessionId asker, wyx_rc_t rc);
   void deliver(const Delivery& delivery);
   void arm(const TimerRequest& timer);
+  void drop_stale_timers();
   SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
 
   void send(ConnectionId to, const wire::Encoded& message, Token token = -1);
@@ -151,7 +154,12 @@ class SessionLayer : private PingSink {
   Timers timers_;
   std::unordered_map<ConnectionId, Connection> connections_;
   std::unordered_map<std::uint64_t, Session> sessions_;
-  std::unordered_map<std::string, Timers::Id> phase_timers_;        // by group, which runs one protocol at a time
+  struct PhaseTimer {
+    TimerId phase;
+    Timers::Id timer;
+  };
+  std::unordered_map<std::string, PhaseTimer> phase_timers_;        // by group, which runs one protocol at a time
+  std::size_t sweep_timers_at_ = kFewTimers;                        // phase timers, those of ended phases included
   std::unordered_map<const Notification*, wire::Encoded> encoded_;  // of the outcome being delivered
   std::array<wire::Encoded, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
   std::uint64_t last_session_ = 0;
