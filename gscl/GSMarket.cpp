@@ -42,9 +42,11 @@ int GSMarket::produce(GSObject* obj) {
   return count;
 }
 
+// Drops nulls on the way: null says that the queue is empty, so that a consumer may wait.
 GSObject* GSMarket::take() {
   GSObject* obj = nullptr;
-  _queue.dequeue(&obj);
+  while (_queue.dequeue(&obj) != 0 && obj == nullptr) {
+  }
   return obj;
 }
 

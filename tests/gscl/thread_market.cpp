@@ -94,6 +94,18 @@ TEST_F(Market, consumerThatWaited_returnsNothingWhenStoppedEvenIfObjectsCame) {
   EXPECT_EQ(market.consume(nullptr), &first);
 }
 
+TEST_F(Market, nulls_areDroppedAndHideNoObject) {
+  for (GSObject* object : {static_cast<GSObject*>(nullptr), static_cast<GSObject*>(nullptr), &first}) {
+    market.produce(object);
+  }
+  EXPECT_EQ(market.QueueCount(), 3);
+  const timespec past = inMillis(-1000);
+  EXPECT_EQ(market.consume(&past), &first);
+  market.produce(nullptr);
+  EXPECT_EQ(market.consume(&past), nullptr);
+  EXPECT_EQ(market.QueueCount(), 0);
+}
+
 std::string debugLines;
 
 TEST_F(Market, stopAndResume_sayItOnTheDebugChannel) {
