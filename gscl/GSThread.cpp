@@ -236,14 +236,15 @@ int GSThread::launch(void* args, pthread_t* id) {
   ThreadControl& control = *data.control;
   std::unique_ptr<Launch> start(new Launch{data.control, this, overriderOfRun(this), args});
   ThreadAttributes attributes;
-  if (const int rc = attributes.set(data)) return rc;
+  int rc = attributes.set(data);
 
   // Until the phase is set the new thread waits at its first look at the control.
   std::lock_guard<std::mutex> lock(control.mutex);
   if (!hasNoThread(control)) return EBUSY;
   data.start_args = args;
   data.state = GS_THREAD_RUNNING;
-  if (const int rc = pthread_create(id, attributes.get(), stub_create_run_me, start.get())) {
+  if (rc == 0) rc = pthread_create(id, attributes.get(), stub_create_run_me, start.get());
+  if (rc != 0) {
     data.state = GS_THREAD_IDLE;
     *id = kNoThread;
     return rc;

@@ -373,8 +373,9 @@ TEST(ThreadTrace, startStopAndFailures_writeTheirLines) {
 
   thread.setDetachState(77);
   EXPECT_EQ(Lines::take(), "GSThread::setDetachState(this=" + hex(&thread) + ") state = 77|");
+  thread.setThreadState(GS_THREAD_RUNNING);
   EXPECT_EQ(thread.start(nullptr), kNone);
-  EXPECT_EQ(thread.getThreadState(), GS_THREAD_IDLE);
+  EXPECT_EQ(thread.getThreadState(), GS_THREAD_IDLE) << "whatever it was before";
   EXPECT_EQ(Lines::take(),
             "GSThread[ffffffff] starts\n|Error on pthread_create rc=" + std::to_string(EINVAL) + "\n|");
 
