@@ -36,7 +36,7 @@ typedef zelt_gscl::GSThreadState GSThreadState;
 ///
 /// Cancellation. `stop` and the destructor cancel the thread: `run` is left at its next cancellation point, such
 /// as any wait of this library, by unwinding, so its objects are destroyed; a catch (...) around such a point must
-/// throw on. `waitSyncEvent` and `join` are cancellation points for their callers.
+/// throw on. For their callers the event operations, `join` and a `start` that joins are cancellation points.
 ///
 /// Destruction, on another thread than the object's own, cancels the thread and waits until it has ended, without
 /// being a cancellation point itself; a thread that was stopped and never joined is joined. On its own thread
@@ -67,8 +67,9 @@ class ZN_GSCL_EXPORT GSThread {
   virtual int waitSyncEvent(int* e, int secs);
 
   /// Creates the thread, which calls run(args), with the detach state and the stack size recorded. Returns its id,
-  /// or all bits set when it could not be created or the object's thread is still running and not stopped. An
-  /// earlier thread that was not joined is joined first, and if it was stopped, waited for.
+  /// or all bits set when it could not be created or the object's thread has not ended and was not stopped, or is
+  /// detached. An earlier thread that was not joined is joined first, and if it was stopped, waited for. Throws
+  /// when there is no memory.
   /// The overrider of `run` is chosen now: do not start in the constructor of a class that others derive from.
   pthread_t start(void* args);
   /// Cancels the thread, without waiting for its end or releasing it: `join`, the next `start` and the destructor
