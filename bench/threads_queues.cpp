@@ -79,8 +79,7 @@ void wake_up(benchmark::State& state) {
   peer.join();
 }
 
-// ------------------------------------------------------------------------------------------------------
-// throughput
+// ------------------------------------------------------------------------------------------------ throughput
 
 constexpr int kBatch = 20000;  // objects of one iteration
 
@@ -156,8 +155,7 @@ BENCHMARK_TEMPLATE(wake_up, Events)->UseRealTime();
 BENCHMARK_TEMPLATE(throughput, PlainQueue)->Arg(1)->Arg(2)->Arg(4)->UseRealTime();
 BENCHMARK_TEMPLATE(throughput, Market)->Arg(1)->Arg(2)->Arg(4)->UseRealTime();
 
-// ------------------------------------------------------------------------------------------------------ the
-// figures
+// ----------------------------------------------------------------------------------------------- the figures
 
 /// Prints as usual and keeps the median real times, in nanoseconds.
 class Medians : public benchmark::ConsoleReporter {
