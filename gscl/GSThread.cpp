@@ -10,6 +10,7 @@
 #include <new>
 
 #include "gscl/GSThread_internal.h"
+#include "gscl/scopes_internal.h"
 #include "gscl/trace.h"
 #include "zn_cu.h"
 
@@ -76,17 +77,6 @@ class ThreadEnd {
 
  private:
   ThreadControl& _control;
-};
-
-class CancellationOff {
- public:
-  CancellationOff() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &_previous); }
-  ~CancellationOff() { pthread_setcancelstate(_previous, &_previous); }
-  CancellationOff(const CancellationOff&) = delete;
-  CancellationOff& operator=(const CancellationOff&) = delete;
-
- private:
-  int _previous = PTHREAD_CANCEL_ENABLE;
 };
 
 class ThreadAttributes {
@@ -165,7 +155,7 @@ GSThread::~GSThread() {
 // The work of the destructor. The first one of the library's classes does it, so that virtual functions of the
 // second version are still in place while `run` is on its way out.
 void GSThread::finish() {
-  const CancellationOff off;
+  const gscl_internal::CancellationHold hold;
   GSxThreadData& data = dataOf(innerData);
   pthread_t tid = data.tid;
   traceIfPossible([&] {
