@@ -6,13 +6,13 @@
 
 #include <chrono>
 #include <cstring>
-#include <map>
 #include <memory>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include "bench/figures.h"
+#include "bench/medians.h"
 #include "gscl/gscl.h"
 #include "gscl/gslib_dli.h"
 
@@ -199,25 +199,7 @@ BENCHMARK(write_lock);
 // ------------------------------------------------------------------------------------------------------- the
 // figures
 
-/// Prints as usual and keeps the medians, in nanoseconds.
-class Medians : public benchmark::ConsoleReporter {
- public:
-  Medians() : ConsoleReporter(OO_Tabular) {}
-  void ReportRuns(const std::vector<Run>& runs) override {
-    ConsoleReporter::ReportRuns(runs);
-    for (const Run& run : runs) {
-      const std::string name = run.run_name.function_name + run.run_name.args;
-      if (run.aggregate_name == "median") medians_[name] = run.GetAdjustedCPUTime();
-    }
-  }
-  double of(const std::string& name) const { return medians_.at(name); }
-  bool complete() const { return medians_.size() == 9; }
-
- private:
-  std::map<std::string, double> medians_;
-};
-
-zn::Figures judge(const Medians& m) {
+zn::Figures judge(const zn::Medians& m) {
   const double pair = m.of("mutex_pair");
   zn::Figures figures;
   figures.add("request, trace off", m.of("request") / pair, "mutex pairs", 8);
@@ -243,17 +225,9 @@ int main(int argc, char** argv) {
   std::thread another([] { std::this_thread::sleep_for(std::chrono::hours(1)); });
   another.detach();
 
-  // Interleaved repetitions: what disturbs the machine disturbs both sides of a ratio.
-  std::vector<char*> arguments(argv, argv + argc);
-  char repetitions[] = "--benchmark_repetitions=11", interleaved[] = "--benchmark_enable_random_interleaving=true";
-  char aggregates[] = "--benchmark_display_aggregates_only=true", brief[] = "--benchmark_min_time=0.05";
-  arguments.insert(arguments.begin() + 1, {repetitions, interleaved, aggregates, brief});
-  int count = static_cast<int>(arguments.size());
-  arguments.push_back(nullptr);
-  benchmark::Initialize(&count, arguments.data());
-  Medians medians;
-  benchmark::RunSpecifiedBenchmarks(&medians);
-  if (at_fault || !medians.complete()) return 1;
+  zn::Medians medians(&benchmark::BenchmarkReporter::Run::GetAdjustedCPUTime);
+  zn::run_interleaved(argc, argv, {"--benchmark_repetitions=11", "--benchmark_min_time=0.05"}, &medians);
+  if (at_fault || medians.count() != 9) return 1;
 
   const zn::Figures figures = judge(medians);
   figures.print();

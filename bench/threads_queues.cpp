@@ -5,7 +5,6 @@
 
 #include <atomic>
 #include <condition_variable>
-#include <map>
 #include <memory>
 #include <mutex>
 #include <queue>
@@ -15,6 +14,7 @@
 #include <vector>
 
 #include "bench/figures.h"
+#include "bench/medians.h"
 #include "gscl/gscl.h"
 
 namespace {
@@ -157,25 +157,7 @@ BENCHMARK_TEMPLATE(throughput, Market)->Arg(1)->Arg(2)->Arg(4)->UseRealTime();
 
 // ----------------------------------------------------------------------------------------------- the figures
 
-/// Prints as usual and keeps the median real times, in nanoseconds.
-class Medians : public benchmark::ConsoleReporter {
- public:
-  Medians() : ConsoleReporter(OO_Tabular) {}
-  void ReportRuns(const std::vector<Run>& runs) override {
-    ConsoleReporter::ReportRuns(runs);
-    for (const Run& run : runs) {
-      if (run.aggregate_name == "median")
-        medians_[run.run_name.function_name + run.run_name.args] = run.GetAdjustedRealTime();
-    }
-  }
-  double of(const std::string& name) const { return medians_.at(name); }
-  bool complete() const { return medians_.size() == 8; }
-
- private:
-  std::map<std::string, double> medians_;
-};
-
-zn::Figures judge(const Medians& m) {
+zn::Figures judge(const zn::Medians& m) {
   zn::Figures figures;
   figures.add("event queue, post to wake-up", m.of("wake_up<Events>") / m.of("wake_up<BareCondition>"),
               "x bare condition", 1.5);
@@ -196,17 +178,9 @@ int main(int argc, char** argv) {
   zn::print_host();
   const std::string json = zn::option(argc, argv, "benchmark_out");
 
-  // Interleaved repetitions: what disturbs the machine disturbs both sides of a ratio.
-  std::vector<char*> arguments(argv, argv + argc);
-  char repetitions[] = "--benchmark_repetitions=15", interleaved[] = "--benchmark_enable_random_interleaving=true";
-  char aggregates[] = "--benchmark_display_aggregates_only=true", brief[] = "--benchmark_min_time=0.1";
-  arguments.insert(arguments.begin() + 1, {repetitions, interleaved, aggregates, brief});
-  int count = static_cast<int>(arguments.size());
-  arguments.push_back(nullptr);
-  benchmark::Initialize(&count, arguments.data());
-  Medians medians;
-  benchmark::RunSpecifiedBenchmarks(&medians);
-  if (at_fault || !medians.complete()) return 1;
+  zn::Medians medians(&benchmark::BenchmarkReporter::Run::GetAdjustedRealTime);
+  zn::run_interleaved(argc, argv, {"--benchmark_repetitions=15", "--benchmark_min_time=0.1"}, &medians);
+  if (at_fault || medians.count() != 8) return 1;
 
   const zn::Figures figures = judge(medians);
   figures.print();

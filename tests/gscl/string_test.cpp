@@ -144,7 +144,7 @@ TEST(String, concatenated_hasExactlyTheRoomItNeeds) {
 }
 
 TEST(String, allocationFails_stringIsEmptyOrUnchanged) {
-  if (!allocations::kControlled) GTEST_SKIP();
+  if (!allocations::kControlled) GTEST_SKIP() << "allocations cannot be counted or refused in this build";
   GSString replaced("short");
   GSString appended("short");
   const std::string longer(100, 'x');
@@ -176,7 +176,7 @@ TEST(LocalVar, allocatedAnew_replacesItsBuffer) {
 }
 
 TEST(LocalVar, allocationFails_leavesNoBuffer) {
-  if (!allocations::kControlled) GTEST_SKIP();
+  if (!allocations::kControlled) GTEST_SKIP() << "allocations cannot be counted or refused in this build";
   GSLocalVar<char> buffer(8);
   {
     const allocations::Refuse refuse;

@@ -256,7 +256,7 @@ TEST(GroupAttributes, copied_ownTheirNamesAndKeepThreeFields) {
 }
 
 TEST(Values, updatedWithSizesThatFit_allocateNothing) {
-  if (!allocations::kControlled) GTEST_SKIP();
+  if (!allocations::kControlled) GTEST_SKIP() << "allocations cannot be counted or refused in this build";
   std::string sixty_four(64, 's');
   const wyx_state_value_t state = value_of(sixty_four);
   const Record members({1, 2, 3, 4, 5, 6, 7, 8});
@@ -276,7 +276,7 @@ TEST(Values, updatedWithSizesThatFit_allocateNothing) {
 }
 
 TEST(Values, allocationFails_objectsStayConsistent) {
-  if (!allocations::kControlled) GTEST_SKIP();
+  if (!allocations::kControlled) GTEST_SKIP() << "allocations cannot be counted or refused in this build";
   std::string longer(100, 'n');
   const wyx_state_value_t state = value_of(longer);
   std::string four = "abcd";
