@@ -112,8 +112,9 @@ void wait_for_orphanhood(int read_end, pid_t caller) {
 /// Goes on in a child of a process that ends.
 int migrate_daemon() {
   if (getppid() == 1) return DAE_OK;
-  int ends[2];
-  if (pipe(ends) != 0) return dae::fail_call(DAE_E_MIGRATE, "pipe");
+  int ends[2];  // not for programs that an exit handler of the caller starts: the child would wait for their end
+  if (pipe2(ends, O_CLOEXEC) != 0) return dae::fail_call(DAE_E_MIGRATE, "pipe");
+  fflush(nullptr);  // or the child would write it once more
   const pid_t caller = getpid();
   const pid_t child = fork();
   if (child == -1) {
@@ -191,7 +192,9 @@ int null_files() {
     if (errno != EBADF) return dae::fail_call(DAE_E_NULL, "fstat64");
     const int got = open("/dev/null", O_RDWR);
     if (got < 0) return dae::fail_call(DAE_E_NULL, "open");
-    if (got != fd) return dae::fail(DAE_E_NULL, "DAE_EM_DEVNULLFD");
+    if (got == fd) continue;
+    close(got);
+    return dae::fail(DAE_E_NULL, "DAE_EM_DEVNULLFD");
   }
   return DAE_OK;
 }
