@@ -137,7 +137,8 @@ ZN_GSCL_EXPORT void dae_init_psalloc(dae_parent_t parent, dae_psalloc_t ps_polic
 ZN_GSCL_EXPORT void dae_init_lowps(dae_parent_t parent, void (*lowps)(int), int restart);
 /// Reaps children as they end, whatever their status.
 ZN_GSCL_EXPORT void dae_init_prevent_zombies(dae_parent_t parent, int restart);
-/// Lets one instance run at a time: of all processes with the same existing file and the same id, not 0.
+/// Lets one instance run at a time: of all processes with the same existing file and the same id, not 0. The path
+/// is absolute: it is looked up when "/" is the working directory.
 ZN_GSCL_EXPORT void dae_init_exclusive(dae_parent_t parent, const char* excl_path, char excl_ID);
 /// Keeps inherited descriptors open.
 ZN_GSCL_EXPORT void dae_init_keep_files_open(dae_parent_t parent);
@@ -153,7 +154,8 @@ ZN_GSCL_EXPORT void dae_init_term_sig(void (*term_rtn)(int), int restart);
 ZN_GSCL_EXPORT void dae_init_KPL_msq(int* msqid, int msqkey, int msqtype, const dae_req_msq_t* KPL_rtns,
                                      int restart);
 /// Requests arrive on a socket. *KPL_sockd is the descriptor wanted for it, 3 or more, or negative for any from 3
-/// up; it becomes the descriptor in dae_init, -1 when there is no channel. `KPL_rtns` may be null.
+/// up; it becomes the descriptor in dae_init, -1 when there is no channel. `KPL_rtns` may be null, `KPL_sockd`
+/// not.
 ZN_GSCL_EXPORT void dae_init_KPL_sock(int* KPL_sockd, const dae_req_sock_t* KPL_rtns, int restart);
 /// Leaves the request socket in blocking mode, so that dae_KPL_req waits for a request.
 ZN_GSCL_EXPORT void dae_init_KPL_sock_block(void);
@@ -162,13 +164,15 @@ ZN_GSCL_EXPORT void dae_init_KPL_sock_block(void);
 
 /// Makes the process a daemon. On entry *parent holds the kinds of parent that are acceptable; once the parent is
 /// identified it holds the one bit of its kind, also when a later step fails, and 0 when it is not identified.
-/// `err_detail` may be null.
+/// Null accepts no parent. `err_detail` may be null; else it stays in use until the next dae_init or dae_KPL_req.
 ///
-/// Afterwards the process leads a session without terminal, ignores SIGHUP, SIGINT, SIGQUIT, SIGTSTP, SIGTTIN,
+/// Afterwards the process leads a session (or, where it led a process group before, still that) without terminal,
+/// ignores SIGHUP, SIGINT, SIGQUIT, SIGTSTP, SIGTTIN,
 /// SIGTTOU and SIGPIPE, has "/" as working directory and a umask of 0, descriptors 0 to 2 open and, unless they
-/// were to be kept, no inherited descriptor below 2000 (under KPL and inetd from 3 on). Started by anything else
-/// it is a child of the process that called, which has ended with exit(0): failures after that are reported in the
-/// child. That wait ends when the caller is no longer the parent, whether process 1 or a sub-reaper has adopted.
+/// were to be kept, no inherited descriptor below 2000 and the limit in force (under KPL and inetd from 3 on).
+/// Started by anything else than these two and process 1, it is a child of the process that called, which has
+/// ended with exit(0), its exit handlers included: failures after that are reported in the child. The child goes
+/// on when the caller is no longer its parent, whether process 1 or a sub-reaper has adopted it.
 ///
 /// Returns a DAE_ code. A second call returns DAE_E_NOTAGAIN and changes nothing, but stores -1 in the registered
 /// descriptor variable. `errno` stays as it was.
@@ -261,7 +265,7 @@ typedef struct dae_procsinfo_t {
 } dae_procsinfo_t;
 
 /// Fills *dae_pip for process `pid`. Returns 1, or -1 when there is no such process or /proc cannot be read; then
-/// the entry may be partly filled.
+/// the entry may be partly filled, and the reason goes to the error detail in use, if any (see dae_init).
 ZN_GSCL_EXPORT int dae_getprocs(pid_t pid, dae_procsinfo_t* dae_pip);
 
 #ifdef __cplusplus

@@ -38,10 +38,11 @@ class ZN_GSCL_EXPORT KPLDriver {
 
   /// Starts the daemon (see dae_init): under KPL, where inherited descriptors stay open, or under anything but
   /// inetd. Children are reaped. `syscall_restarts`: non-zero restarts system calls that SIGTERM or SIGCHLD
-  /// interrupt. With `excl_file` (null: not), an existing file, and the low 8 bits of `excl_id` (not 0) only one
-  /// instance runs at a time. `sigdanger_handler` (may be null) is recorded only. Returns 0, or 1000 plus the code
-  /// of dae_init, with the detail in err_detail: 1001 on a second call, 1003 under inetd, 1011 without a working
-  /// request channel, 1017 when another instance runs. Traces at GSCL_TRC_WARNING.
+  /// interrupt. With `excl_file` (null: not), an existing file by its absolute path, and the low 8 bits of
+  /// `excl_id` (not 0) only one instance runs at a time. `sigdanger_handler` (may be null) is recorded only.
+  /// Returns 0, or 1000 plus the code of dae_init, with the detail in err_detail: 1001 on a second call, 1003
+  /// under inetd, 1011 without a working request channel, 1017 when another instance runs. Traces at
+  /// GSCL_TRC_WARNING.
   virtual int InitKPL(int syscall_restarts, const char* excl_file, int excl_id, void (*sigdanger_handler)(int));
 
   /// The request socket, -1 before InitKPL and when KPL is not the parent.
