@@ -211,6 +211,16 @@ void add_segment(output_ctl_t* oc, const Segment& segment, bool doubles) {
   oc->pack_line(segment.text, segment.length, oc);
 }
 
+/// Length of the piece of text up to the next line end or, in text whose "%" is doubled, through the first "%". Not
+/// more than `most` is looked at, so that a long line costs no more than a short one at each of its breaks.
+int segment_length(const char* text, bool doubles, int most) {
+  int length = 0;
+  while (length < most && text[length] != '\0' && text[length] != '\n') {
+    if (text[length++] == '%' && doubles) break;
+  }
+  return length;
+}
+
 /// Breaks text into lines. False when a character cannot be written; what stood before its segment is taken.
 bool put_text(output_ctl_t* oc, const char* text, bool margin) {
   const bool doubles = oc->double_percent && !margin;
@@ -218,8 +228,7 @@ bool put_text(output_ctl_t* oc, const char* text, bool margin) {
   const int limit = margin ? oc->margin_width : oc->margin_width + oc->body_width;
   const int widest = std::min(static_cast<int>(MB_CUR_MAX), column);
   while (*text != '\0') {
-    Segment segment = {text, static_cast<int>(strcspn(text, doubles ? "\n%" : "\n")), false};
-    if (text[segment.length] == '%') ++segment.length;
+    Segment segment = {text, segment_length(text, doubles, limit + 1), false};
     segment.ends_line = text[segment.length] == '\n';
     if (!margin && segment.length > 0) pad_margin(oc);
     if (oc->line_length + segment.length > limit && !cut_segment(&segment, limit - oc->line_length, widest)) {
@@ -337,9 +346,9 @@ void dae_output_open__INTERNAL__(kplhdr* header, int status) {
   INFORM_reply_len = 0;
   ERROR_msgs_len = 0;
   KPL_kplhdr = header;
-  if (!status || STATUS_statrep == nullptr) return;
+  STATUS_kplhdr = status && STATUS_statrep != nullptr ? header : nullptr;
+  if (STATUS_kplhdr == nullptr) return;
   reset_channel(STATUS_CTL);
-  STATUS_kplhdr = header;
   change_cur_statcode(FIRST_STATCODE);
 }
 
