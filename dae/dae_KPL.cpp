@@ -112,17 +112,15 @@ int set_file_flags(int fd, int flag_set, int flag) {
   return DAE_OK;
 }
 
-/// Moves descriptor 0 to the lowest free place from 3 up, or to the one wanted. Returns a DAE_ code.
+/// Moves descriptor 0 to the lowest free place from 3 up, or to the one wanted. *moved becomes the copy, also when
+/// a later step fails. Returns a DAE_ code.
 int move_socket(int* moved) {
   const int wanted = profile.KPL_sockd;
   if (wanted >= 0 && wanted < 3) return dae::fail(DAE_E_KPL, "DAE_EM_KPL_SOCK_FD");
   const int copy = fcntl(0, F_DUPFD, wanted >= 0 ? wanted : 3);
   if (copy == -1) return dae::fail_call(DAE_E_KPL, "fcntl");
-  if (wanted >= 0 && copy != wanted) {
-    close(copy);
-    return dae::fail(DAE_E_KPL, "DAE_EM_KPL_SOCK_DUP");
-  }
   *moved = copy;
+  if (wanted >= 0 && copy != wanted) return dae::fail(DAE_E_KPL, "DAE_EM_KPL_SOCK_DUP");
   return close(0) == 0 ? DAE_OK : dae::fail_call(DAE_E_KPL, "close");
 }
 
@@ -138,7 +136,10 @@ int setup_socket() {
   int code = move_socket(&moved);
   if (code == DAE_OK && !profile.KPL_sockd_block) code = set_file_flags(moved, kFileFlags, O_NONBLOCK);
   if (code == DAE_OK) code = set_file_flags(moved, kDescriptorFlags, FD_CLOEXEC);
-  if (code != DAE_OK) return code;
+  if (code != DAE_OK) {
+    if (moved >= 0) close(moved);
+    return code;
+  }
   KPL_d = moved;
   return install_cancel();
 }
