@@ -165,10 +165,9 @@ KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int co
 /// one served. `subsystem` names a subsystem; when null or "", the one whose process is `pid`.
 ///
 /// A query is a run of calls: `*cont` is KPL_CONT_FIRST at its first, and each call fills `reply` (a `statrep` of
-/// at most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and
-/// sets
+/// at most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and sets
 /// `*cont` to KPL_CONT_END with the last records, to KPL_CONT_STATUS before. The first call asks and waits for the
-/// whole answer, at most 5 seconds; the others only hand out what came, and free it with the last.
+/// whole answer, 5 seconds in all; the others only hand out what came, and free it with the last.
 ///
 /// On the wire it is a request to the master's socket with KPL_ACTION_STATUS, `parm1` 0, `objname` the subsystem
 /// (at most 29 characters) and, as extra data, `pid` as a 32-bit integer; the answer is status packets and a last

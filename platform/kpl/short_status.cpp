@@ -44,8 +44,21 @@ struct Question {
 };
 static_assert(sizeof(Question) == 160);
 
-/// Opens a socket with an address that the kernel chooses, sends the question from it; returns an error number.
-int ask(const char* subsystem, pid_t pid, platform::Descriptor* socket) {
+/// Sends the question, which waits while the master's queue is full; returns an error number.
+int send_question(int fd, const Question& question, const sockaddr_un& master, Clock::time_point deadline) {
+  const auto* to = reinterpret_cast<const sockaddr*>(&master);
+  for (;;) {
+    const auto left = std::chrono::ceil<std::chrono::microseconds>(deadline - Clock::now()).count();
+    if (left <= 0) return ETIMEDOUT;
+    const timeval patience = {left / 1000000, left % 1000000};
+    if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience) != 0) return errno;
+    if (sendto(fd, &question, sizeof question, MSG_NOSIGNAL, to, kpl::address_length(master)) >= 0) return 0;
+    if (errno != EINTR && errno != EAGAIN) return errno;
+  }
+}
+
+/// Opens a socket with an address that the kernel chooses and asks from it; returns an error number.
+int ask(const char* subsystem, pid_t pid, Clock::time_point deadline, platform::Descriptor* socket) {
   sockaddr_un master;
   const char* place = getenv(KPL_MASTER_ENV);
   if (!kpl::address_from_text(place != nullptr ? place : KPL_MASTER_DEFAULT, &master)) return EINVAL;
@@ -53,9 +66,7 @@ int ask(const char* subsystem, pid_t pid, platform::Descriptor* socket) {
   if (!*socket) return errno;
 
   const int on = 1;
-  const timeval patience = {kPatience.count(), 0};
   if (setsockopt(socket->get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0) return errno;
-  if (setsockopt(socket->get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience) != 0) return errno;
   Question question = {};
   socklen_t own_length = sizeof question.header.retaddr;
   question.header.retaddr.sun_family = AF_UNIX;
@@ -68,13 +79,7 @@ int ask(const char* subsystem, pid_t pid, platform::Descriptor* socket) {
   question.request.action = KPL_ACTION_STATUS;
   strncpy(question.request.objname, subsystem, sizeof question.request.objname - 1);
   question.pid = pid;
-  const auto* to = reinterpret_cast<const sockaddr*>(&master);
-  ssize_t sent;
-  do {
-    sent = sendto(socket->get(), &question, sizeof question, MSG_NOSIGNAL, to, kpl::address_length(master));
-  } while (sent < 0 && errno == EINTR);
-  if (sent < 0) return errno == EAGAIN ? ETIMEDOUT : errno;
-  return 0;
+  return send_question(socket->get(), question, master, deadline);
 }
 
 /// Whether the datagram came from root or from this process's own user: anybody may write to the socket's address.
@@ -121,8 +126,7 @@ int add_lines(const char* packet, size_t length) {
 }
 
 /// Collects the answer. Returns an error number; *rtncode becomes the master's result.
-int collect(int fd, short* rtncode) {
-  const auto deadline = Clock::now() + kPatience;
+int collect(int fd, Clock::time_point deadline, short* rtncode) {
   char packet[kMaxPacket];
   for (;;) {
     const ssize_t got = receive(fd, deadline, packet);
@@ -166,8 +170,9 @@ int kplstat(char* host, char* subsystem, pid_t pid, short* reply_len, char* repl
     query.forget();
     platform::Descriptor socket;
     short rtncode = KPL_RC_OK;
-    int error = ask(subsystem != nullptr ? subsystem : "", pid, &socket);
-    if (error == 0) error = collect(socket.get(), &rtncode);
+    const auto deadline = Clock::now() + kPatience;
+    int error = ask(subsystem != nullptr ? subsystem : "", pid, deadline, &socket);
+    if (error == 0) error = collect(socket.get(), deadline, &rtncode);
     if (error != 0) return fail(error);
     if (rtncode != KPL_RC_OK) {
       query.forget();
