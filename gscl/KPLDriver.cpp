@@ -94,6 +94,8 @@ int KPLDriver::InitKPL(int syscall_restarts, const char* excl_file, int excl_id,
   return 0;
 }
 
+int KPLDriver::getKPLDescriptor() { return _kpl_fd; }
+
 int KPLDriver::doKPLreq() {
   dae_KPL_req();
   return 0;

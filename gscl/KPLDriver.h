@@ -46,7 +46,7 @@ class ZN_GSCL_EXPORT KPLDriver {
   virtual int InitKPL(int syscall_restarts, const char* excl_file, int excl_id, void (*sigdanger_handler)(int));
 
   /// The request socket, -1 before InitKPL and when KPL is not the parent.
-  int getKPLDescriptor() { return _kpl_fd; }
+  int getKPLDescriptor();
 
   /// Serves at most one request that waits; does not block. Returns 0.
   static int doKPLreq();
