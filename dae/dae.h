@@ -108,8 +108,9 @@ typedef struct dae_req_sig_t {
 
 /// Routines of a daemon whose requests are messages. A null routine means that the request is not supported, or,
 /// for the stop requests, that the process ends with exit(0). They run inside dae_KPL_req, on its thread, except
-/// dae_stop_cancel, which is the handler of SIGTERM. The output channels are open in all of them but the stop
-/// routines, whose reply has gone out before.
+/// dae_stop_cancel, which is the handler of SIGTERM; they return (no exception leaves them) or end the process, and
+/// do not call dae_KPL_req. The output channels are open in all of them but the stop routines, whose reply has gone
+/// out before.
 typedef struct dae_req_sock_t {
   void (*dae_stop_normal)(void);
   void (*dae_stop_forced)(void);
@@ -199,7 +200,8 @@ ZN_GSCL_EXPORT void dae_KPL_req(void);
 //
 // Status: lines of a margin column (at most 29 characters) and a body (at most 64), for long status only.
 // Inform: lines of at most 137 characters, sent to the requester while the request runs.
-// Error: at most 136 characters, which become the reply's message and make it a failure.
+// Error: at most 136 characters in all, which become the reply's message and make it a failure; more is dropped.
+// All these are counted in bytes.
 //
 // Lines end with "\n"; longer ones are broken between characters of the locale. What has no line end is kept until
 // more comes, a flush or the end of the request. In body and error text every "%" is sent as "%%".
@@ -235,7 +237,7 @@ ZN_GSCL_EXPORT int dae_inform_flush(void);
 ZN_GSCL_EXPORT int dae_status_short(void);
 
 /// The name under which the master knows this daemon, to be freed by the caller; null outside the daemon process
-/// and when the master does not tell. Needs no request. Asks kplstat. `errno` stays as it was.
+/// and when the master does not tell (it waits a few seconds for it). Needs no request. `errno` stays as it was.
 ZN_GSCL_EXPORT char* dae_subsysname(void);
 
 // ---- Process table ---------------------------------------------------------------------------------------------
