@@ -56,8 +56,9 @@ class MemoryTransport : public Transport {
 struct MemoryDaemon {
   explicit MemoryDaemon(std::size_t queue_bound = 1 << 20)
       : layer({1, queue_bound},
-              {transport, ordering, [this] { return time; }, [this] { return ++last_random; },
-               std::make_shared<spdlog::logger>("test", std::make_shared<spdlog::sinks::ostream_sink_st>(log))}) {}
+              {transport, ordering, [this] { return time; }, [this] { return ++last_random; }, logger}) {
+    logger->set_level(spdlog::level::trace);
+  }
 
   ConnectionId open(std::uint32_t uid = 1000) {
     const ConnectionId id = ++last_connection;
@@ -82,6 +83,8 @@ struct MemoryDaemon {
   MemoryTransport transport;
   LocalOrdering ordering;
   std::ostringstream log;
+  const std::shared_ptr<spdlog::logger> logger =
+      std::make_shared<spdlog::logger>("test", std::make_shared<spdlog::sinks::ostream_sink_st>(log));
   Time time{1'000'000};
   std::uint64_t last_random = 0;
   ConnectionId last_connection = 0;

@@ -105,7 +105,11 @@ TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
   EXPECT_EQ(daemon_.layer.sessions(), 1u);
 }
 
-TEST_F(DaemonSession, ProgramNameWithControlCharacters_CannotForgeLogLines) {
+TEST_F(DaemonSession, TextWithControlCharacters_CannotForgeLogLines) {
+  MemoryClient client(daemon_);
+  ASSERT_EQ(client.join(1, 1), WYX_OK);
+  ASSERT_EQ(client.ask(wire::Call{MessageRequest{1, {WYX_1_PHASE, 0}, "x\n2026 info forged"}}), WYX_OK);
+  EXPECT_TRUE(daemon_.logged("msg 'x?2026 info forged', #2"));
   const ConnectionId id = daemon_.open();
   daemon_.say(id, wire::Hello{wire::kProtocolVersion, 0, 0, "x\n2026 info forged"});
   daemon_.layer.lost(id, "gone");

@@ -11,8 +11,9 @@
 
 namespace gs::daemon {
 
-/// Serves the master's requests on the server's loop: long status, trace on and off (the log level), refresh (the
-/// configuration is read again) and stop. SIGTERM stops the server whoever started it.
+/// Serves the master's requests on the server's loop: long status, trace on and off (requests and their answers in
+/// the log, with the long trace the notifications as well), refresh (the configuration is read again) and stop.
+/// SIGTERM stops the server whoever started it.
 class Service : public zelt_gscl_V1::KPLDriver {
  public:
   /// `reread`: the options anew, as command line and configuration file have them now. It may throw OptionError.

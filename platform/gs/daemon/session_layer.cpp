@@ -2,19 +2,10 @@
 
 #include <algorithm>
 
+#include "engine/text.h"
+#include "gscl/GSUtils.h"
+
 namespace gs::daemon {
-namespace {
-
-/// A client's text as it may stand in a log line.
-std::string printable(std::string text) {
-  constexpr std::size_t kMaxLogged = 64;
-  if (text.size() > kMaxLogged) text.resize(kMaxLogged);
-  std::replace_if(
-      text.begin(), text.end(), [](unsigned char c) { return c < 0x20 || c > 0x7e || c == '"'; }, '?');
-  return text;
-}
-
-}  // namespace
 
 SessionLayer::SessionLayer(const Settings& settings, Environment environment)
     : settings_(settings), env_(std::move(environment)) {
@@ -189,6 +180,7 @@ void SessionLayer::too_slow(std::uint64_t session) {
 // its answer finds its notifications there and need not sleep again, and no answer waits for hundreds of sends.
 void SessionLayer::ordered(const Event& event) {
   const Outcome outcome = engine_.apply(event);
+  if (env_.log->should_log(spdlog::level::debug)) trace(event, outcome);
   const auto* request = std::get_if<RequestEvent>(&event);
   const SessionId asker = request != nullptr ? request->session : SessionId{};
   for (const Delivery& delivery : outcome.deliveries) {
@@ -200,6 +192,15 @@ void SessionLayer::ordered(const Event& event) {
   }
   encoded_.clear();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
+}
+
+void SessionLayer::trace(const Event& event, const Outcome& outcome) {
+  const bool is_request = std::holds_alternative<RequestEvent>(event);
+  env_.log->debug("{}{}", text(event), is_request ? std::string(": ") + zelt_gscl::gscl_rc_name(outcome.rc) : "");
+  for (const Delivery& delivery : outcome.deliveries) {
+    env_.log->trace("  to session {}, token {}: {}", delivery.to.session.number, delivery.to.token,
+                    text(*delivery.what));
+  }
 }
 
 void SessionLayer::answer_request(SessionId asker, wyx_rc_t rc) {

@@ -130,6 +130,7 @@ class SessionLayer : private PingSink {
 
   // The ordered side.
   void ordered(const Event& event);
+  void trace(const Event& event, const Outcome& outcome);
   void answer_request(SessionId asker, wyx_rc_t rc);
   void deliver(const Delivery& delivery);
   void arm(const TimerRequest& timer);

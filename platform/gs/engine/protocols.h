@@ -26,12 +26,12 @@ struct ProtocolTraits {
 
 inline constexpr ProtocolTraits kProtocols[] = {
     {WYX_JOIN, "join", ChangingRole::kVote, true, 0, false, true},
-    {WYX_FAILURE_LEAVE, "failure leave", ChangingRole::kHearEnd, false, 0, false, false},
+    {WYX_FAILURE_LEAVE, "failure", ChangingRole::kHearEnd, false, 0, false, false},
     {WYX_LEAVE, "leave", ChangingRole::kHearEnd, false, WYX_VOLUNTARY_LEAVE, false, true},
     {WYX_EXPEL, "expel", ChangingRole::kHearEnd, true, WYX_PROVIDER_EXPELLED, false, false},
-    {WYX_STATE_VALUE_CHANGE, "state value change", ChangingRole::kNone, true, 0, false, false},
-    {WYX_PROVIDER_MESSAGE, "provider message", ChangingRole::kNone, true, 0, true, false},
-    {WYX_GROUP_ATTRIBUTE_CHANGE, "attribute change", ChangingRole::kNone, true, 0, false, false},
+    {WYX_STATE_VALUE_CHANGE, "state", ChangingRole::kNone, true, 0, false, false},
+    {WYX_PROVIDER_MESSAGE, "message", ChangingRole::kNone, true, 0, true, false},
+    {WYX_GROUP_ATTRIBUTE_CHANGE, "attributes", ChangingRole::kNone, true, 0, false, false},
 };
 
 /// `type` is one of the table's.
