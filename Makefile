@@ -8,7 +8,7 @@ release := build/release
 all: ## build everything, optimised
 	@scripts/build.sh release
 
-demo: ## processes join a group, vote, talk, are watched and die; one timeline of what each of them saw
+demo: ## processes vote, talk and die, one timeline of what each saw; then daemons under their master
 	@scripts/build.sh release demo
 	@$(release)/bin/demo
 

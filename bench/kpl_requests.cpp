@@ -105,15 +105,14 @@ class Master {
   explicit Master(const std::string& folder) : socket_(folder + "/control"), client_(socket_) {
     std::ofstream(folder + "/bench.toml") << "name = \"bench\"\nprogram = \"" << self() << "\"\narguments = "
                                           << "[\"--role=subsystem\"]\n";
-    std::vector<std::string> command = {"/usr/bin/unshare", "--pid", "--fork", "--mount-proc", "--kill-child"};
-    if (geteuid() != 0) command.insert(command.end(), {"--user", "--map-root-user"});
-    command.insert(command.end(), {"sh", "-c", kInit, "sh", zn::program("kplmstr"), "--definitions", folder,
-                                   "--socket-path", socket_});
-    process_ = std::make_unique<zn::Process>(command, zn::Process::Environment{}, folder + "/log");
+    process_ =
+        std::make_unique<zn::Process>(zn::in_namespaces({"/bin/sh", "-c", kInit, "sh", zn::program("kplmstr"),
+                                                         "--definitions", folder, "--socket-path", socket_}),
+                                      zn::Process::Environment{}, folder + "/log");
     const auto give_up = Clock::now() + kLimit;
     while (access(socket_.c_str(), F_OK) != 0) {
       if (Clock::now() > give_up || !process_is_there())
-        throw Failure{"kplmstr did not come up:\n" + text(folder + "/log")};
+        throw Failure{"kplmstr did not come up:\n" + zn::content_of(folder + "/log")};
       usleep(2000);
     }
     ask({Action::kStart, "bench", {}, false, false, 0, 0, 0, {}});
@@ -142,10 +141,6 @@ class Master {
     std::array<char, 4096> path{};
     const ssize_t length = readlink("/proc/self/exe", path.data(), path.size() - 1);
     return {path.data(), static_cast<std::size_t>(length > 0 ? length : 0)};
-  }
-  static std::string text(const std::string& path) {
-    std::ifstream file(path);
-    return {std::istreambuf_iterator<char>(file), {}};
   }
 
  private:
@@ -196,7 +191,7 @@ void starts(zn::Figures& figures) {
     const std::string line = folder.path() + "/line";
     const auto start = Clock::now();
     zn::Process shell({"/bin/sh", "-c", "\"$0\" \"$@\"; exit $?", Master::self(), "--role=daemon", line}, {});
-    while (Master::text(line).empty()) {
+    while (zn::content_of(line).empty()) {
       if (Clock::now() > start + kLimit) throw Failure{"a daemon did not come to its work"};
       usleep(200);
     }
@@ -207,11 +202,6 @@ void starts(zn::Figures& figures) {
   }
   figures.add("start from a shell to the first line of work, p50", zn::percentile(samples, 0.5), "ms", 50);
   figures.add("  the detach step's own sleep, mean (not in it)", slept, "s");
-}
-
-bool has_namespaces() {
-  const std::string user = geteuid() == 0 ? "" : "--user --map-root-user ";
-  return std::system(("unshare " + user + "--pid --fork --mount-proc true 2>/dev/null").c_str()) == 0;
 }
 
 }  // namespace
@@ -227,10 +217,11 @@ int main(int argc, char** argv) {
               kStatusLines, kStarts);
   try {
     zn::Figures figures;
-    if (has_namespaces()) {
+    const std::string obstacle = zn::namespaces_obstacle();
+    if (obstacle.empty()) {
       requests(figures);
     } else {
-      std::printf("skipped: the master, which needs namespaces of its own\n");
+      std::printf("skipped: the master, which needs namespaces of its own: %s\n", obstacle.c_str());
     }
     starts(figures);
     figures.print();

@@ -12,7 +12,7 @@
 
 #include <filesystem>
 #include <fstream>
-#include <sstream>
+#include <iterator>
 
 namespace zn {
 namespace {
@@ -76,6 +76,29 @@ std::string program(const std::string& name) {
   const auto here = std::filesystem::read_symlink("/proc/self/exe").parent_path();
   if (std::filesystem::exists(here / name)) return (here / name).string();
   return (here.parent_path() / name).string();
+}
+
+std::vector<std::string> in_namespaces(std::vector<std::string> command) {
+  std::vector<std::string> whole = {"/usr/bin/unshare", "--pid", "--fork",
+                                    "--mount-proc",     "--ipc", "--kill-child"};
+  if (::geteuid() != 0) whole.insert(whole.end(), {"--user", "--map-root-user"});
+  whole.insert(whole.end(), command.begin(), command.end());
+  return whole;
+}
+
+std::string namespaces_obstacle() {
+  const TempFolder folder;
+  const std::string errors = folder.path() + "/errors";
+  Process tried(in_namespaces({"/bin/true"}), {}, errors);
+  if (tried.wait_end(Clock::now() + kStartLimit) == 0) return "";
+  std::string why = content_of(errors);
+  while (!why.empty() && why.back() == '\n') why.pop_back();
+  return why.empty() ? "unshare failed" : why;
+}
+
+std::string content_of(const std::string& path) {
+  std::ifstream file(path);
+  return {std::istreambuf_iterator<char>(file), {}};
 }
 
 Process::Process(const std::vector<std::string>& command, const Environment& environment,
@@ -186,11 +209,7 @@ PrivateDaemon::PrivateDaemon(const std::vector<std::string>& options) {
   }
 }
 
-std::string PrivateDaemon::log() const {
-  std::ostringstream text;
-  text << std::ifstream(folder_.path() + "/gsd.log").rdbuf();
-  return text.str();
-}
+std::string PrivateDaemon::log() const { return content_of(folder_.path() + "/gsd.log"); }
 
 bool PrivateDaemon::stop(Clock::time_point deadline) {
   process_->signal(SIGTERM);

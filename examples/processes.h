@@ -39,6 +39,16 @@ class TempFolder {
 /// The path of a program of this project: beside the running one, or one folder up.
 std::string program(const std::string& name);
 
+/// The command with PID, mount and IPC namespaces around it, in which it is process 1 and root. All of it ends
+/// when the caller's child does.
+std::vector<std::string> in_namespaces(std::vector<std::string> command);
+
+/// Why there can be no such namespaces here; empty: there can.
+std::string namespaces_obstacle();
+
+/// The content of a file; empty when it cannot be read.
+std::string content_of(const std::string& path);
+
 /// A child process: lines to its standard input, lines from its standard output. It is killed, if it still runs,
 /// and reaped with the object, and killed by the kernel should this process die.
 class Process {
