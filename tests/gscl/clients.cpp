@@ -1,146 +1,69 @@
-// What a client, a provider and a subscriber hold and say themselves: names, values, attributes, default
-// callbacks.
+// What clients hand to the base API, what notifications do to them and whom they are told to, how long a client
+// lives meanwhile; and requests that are cancelled, refused or thrown out of.
 #include <pthread.h>
-#include <string.h>
 
-#include "lock_peek.h"
+#include <atomic>
+#include <chrono>
+#include <memory>
+#include <new>
+#include <thread>
+
+#include "peek.h"
 #include "recording_api.h"
 
 namespace {
 
 using namespace recording;
-using Lines = std::vector<std::string>;
 
-const char kLongName[] = "0123456789012345678901234567890123456789";
+class Client : public ClientTest {};
 
-TEST(Client, New_isIdleWithoutTokenAndMembers) {
-  RecordingApi api(0);
-  GSController controller;
-  GSProvider provider("g", 3, nullptr);
-  GSMembershipList members;
-  members.append(otherId());
-  wyx_provider_t id = otherId();
-  EXPECT_EQ(provider.getClientState(), GS_IAM_IDLE);
-  EXPECT_EQ(provider.getOldClientState(), GS_IAM_IDLE);
-  EXPECT_EQ(provider.getToken(), -1);
-  EXPECT_EQ(provider.getMemberCount(), 0);
-  EXPECT_EQ(provider.getMembers(members), 0);
-  EXPECT_EQ(members.count(), 1) << "left alone";
-  EXPECT_EQ(provider.getMemberAt(0, &id), 0);
-  EXPECT_EQ(provider.getId().gs_provider_id, -1);
-  EXPECT_EQ(provider.type(), GS_PROVIDER);
-  EXPECT_EQ(GSSubscriber("g", WYX_SUBSCRIBE_STATE).type(), GS_SUBSCRIBER);
-}
-
-TEST(Client, GroupName_isCutAt32_andNullTakesItAway) {
-  RecordingApi api(GSCL_TRC_API);
-  GSController controller;
-  GSSubscriber subscriber(kLongName, WYX_SUBSCRIBE_STATE);
-  EXPECT_STREQ(subscriber.getGroupName(), std::string(kLongName, 32).c_str());
-  subscriber.subscribeGroup();
-  EXPECT_EQ(api.subscribed_group.size(), 32u);
-  subscriber.setGroupName(nullptr);
-  EXPECT_EQ(subscriber.getGroupName(), nullptr);
-  EXPECT_STREQ(zelt_gscl_V1::getTraceIdStr(&subscriber), "Subs[G=(null),T=12]");
-  subscriber.setGroupName(kLongName);
-  EXPECT_EQ(strlen(subscriber.getGroupName()), 32u);
-  subscriber.setGroupName("g");
-  EXPECT_STREQ(zelt_gscl_V1::getTraceIdStr(&subscriber), "Subs[G=g,T=12]");
-}
-
-TEST(Client, Getters_byStateAndIndex) {
-  RecordingApi api(0);
-  GSController controller;
-  GSProvider provider("g", 3, nullptr);
-  joined(provider);
-  Proposal proposal(otherId(), WYX_UPDATED_MEMBERSHIP);
-  proposal.members({ownId(), otherId()});
-  proposal.current("now");
-  proposal.proposed("next");
-  const auto n = proposal.approved(WYX_JOIN);
-  GSController::stub_approvedCb(&n);
-  wyx_provider_t id = {};
-  EXPECT_EQ(provider.getMemberAt(1, &id), 1);
-  EXPECT_EQ(id, otherId());
-  EXPECT_EQ(provider.getMemberAt(2, &id), 0);
-  EXPECT_EQ(provider.getMemberAt(-1, &id), 0);
-  EXPECT_EQ(provider.getMemberAt(0, nullptr), 0);
-  GSStateValue value;
-  EXPECT_EQ(provider.getProposedStateValue(value), 1);
-  EXPECT_EQ(textOf(value), "next");
-
-  const auto error = delayedError(WYX_JOIN, WYX_COLLIDE);
-  GSController::stub_delayedErrorCb(&error);
-  EXPECT_EQ(provider.getMemberCount(), 0) << "the list is still there, but the client is idle";
-  EXPECT_EQ(provider.getCurrentStateValue(value), 0);
-  EXPECT_EQ(textOf(value), "now");
-}
-
-TEST(Client, OldState_movesAlsoWithoutAChange) {
-  RecordingApi api(0);
-  GSController controller;
-  GSProvider provider("g", 3, nullptr);
-  provider.joinGroup();
-  provider.joinGroup();
-  EXPECT_EQ(provider.getOldClientState(), GS_IAM_JOINING);
-  joined(provider);
-  EXPECT_EQ(provider.getOldClientState(), GS_IAM_JOINING);
-  Proposal proposal(ownId());
-  const auto leave = proposal.phase(WYX_LEAVE, 1);
-  GSController::stub_nPhaseCb(&leave);
-  EXPECT_EQ(provider.getOldClientState(), GS_IAM_JOINED);
-}
-
-TEST(Provider, Names_givenOrFormed) {
-  RecordingApi api(0);
-  GSController controller;
+TEST_F(Client, Names_givenFormedCutOrTakenAway) {
   EXPECT_STREQ(GSProvider("grp", 3, nullptr).getLocalName(), "grp_3");
-  GSProvider named("grp", -2, "mine");
-  EXPECT_STREQ(named.getLocalName(), "mine");
-  EXPECT_EQ(named.getInstanceNumber(), -2);
+  EXPECT_STREQ(GSProvider("grp", -2, "mine").getLocalName(), "mine");
   const std::string huge(5000, 'x');
   EXPECT_EQ(GSProvider(huge.c_str(), -32768, nullptr).getLocalName(), huge + "_-32768");
   EXPECT_STREQ(GSProvider(nullptr, 1, nullptr).getLocalName(), "_1");
+
+  watcher.setGroupName(huge.c_str());
+  watcher.subscribeGroup();
+  EXPECT_EQ(api.entered, std::string(32, 'x'));
+  watcher.setGroupName(nullptr);
+  EXPECT_EQ(watcher.getGroupName(), nullptr);
+  EXPECT_STREQ(zelt_gscl_V1::getTraceIdStr(&watcher), "Subs[G=(null),T=12]");
 }
 
-TEST(Provider, Attributes_defaultsCopiesAndTheNameThatIsJoined) {
-  RecordingApi api(0);
-  GSController controller;
-  GSProvider provider("g", 3, "local");
-  wyx_group_attributes_t held = {};
-  provider.getGroupAttributes(&held);
-  EXPECT_EQ(held.gs_num_phases, WYX_1_PHASE);
-  EXPECT_EQ(held.gs_source_reflection_num_phases, WYX_1_PHASE);
-  EXPECT_EQ(held.gs_group_default_vote, WYX_VOTE_APPROVE);
-  EXPECT_EQ(held.gs_time_limit, 0);
-  EXPECT_EQ(held.gs_sizeof_group_attributes, 56);
-  EXPECT_STREQ(held.gs_group_name, "g");
-  EXPECT_EQ(held.gs_source_group_name, nullptr);
-
-  char other[] = "other", source[] = "source";
-  wyx_group_attributes_t wanted = held;
-  wanted.gs_version = 5;
-  wanted.gs_num_phases = WYX_N_PHASE;
-  wanted.gs_group_name = other;
-  wanted.gs_source_group_name = source;
-  provider.setGroupAttributes(&wanted);
-  provider.setGroupAttributes(nullptr);
-  provider.getGroupAttributes(nullptr);
-  provider.getGroupAttributes(&held);
-  EXPECT_EQ(held.gs_num_phases, WYX_N_PHASE);
-  EXPECT_EQ(held.gs_version, 0);
-  EXPECT_STREQ(held.gs_group_name, "other");
-  EXPECT_NE(held.gs_group_name, other);
-
-  provider.setInstanceNumber(9);
-  provider.joinGroup();
-  EXPECT_EQ(api.join_text, "g/9/local");
+TEST_F(Client, JoinAndSubscribe_handOverTheirCallbacksAndTheOwnGroup) {
+  char other[] = "other";
+  wyx_group_attributes_t attributes = {};
+  member.getGroupAttributes(&attributes);
+  EXPECT_STREQ(attributes.gs_group_name, "g");
+  EXPECT_EQ(attributes.gs_group_default_vote, WYX_VOTE_APPROVE);
+  attributes.gs_num_phases = WYX_N_PHASE;
+  attributes.gs_group_name = other;
+  member.setGroupAttributes(&attributes);
+  member.setGroupAttributes(nullptr);
+  member.getGroupAttributes(&attributes);
+  EXPECT_EQ(attributes.gs_num_phases, WYX_N_PHASE);
+  EXPECT_STREQ(attributes.gs_group_name, "other");
+  member.setInstanceNumber(9);
+  member.joinGroup();
+  EXPECT_EQ(api.entered, "g/9/g_3");
   const wyx_join_request_t& join = api.proposal._gs_protocol_info._gs_join_request;
   EXPECT_EQ(join.gs_n_phase_protocol_callback, &GSController::stub_nPhaseCb);
   EXPECT_EQ(join.gs_protocol_approved_callback, &GSController::stub_approvedCb);
   EXPECT_EQ(join.gs_protocol_rejected_callback, &GSController::stub_rejectedCb);
   EXPECT_EQ(join.gs_announcement_callback, &GSController::stub_announcementCb);
   EXPECT_EQ(join.gs_merge_callback, &GSController::stub_mergeCb);
+
+  const wyx_subscribe_request_t& subscribe = api.proposal._gs_protocol_info._gs_subscribe_request;
+  watcher.subscribeGroup();
+  EXPECT_EQ(subscribe.gs_subscription_control, WYX_SUBSCRIBE_STATE_AND_MEMBERSHIP);
+  EXPECT_EQ(subscribe.gs_subscription_callback, &GSController::stub_subscribeCb);
+  watcher.setSubscriptionCtrl(WYX_SUBSCRIBE_MEMBERSHIP);
+  api.answer = WYX_NO_INIT;
+  EXPECT_EQ(watcher.subscribeGroup(), WYX_NO_INIT);
+  EXPECT_EQ(subscribe.gs_subscription_control, WYX_SUBSCRIBE_MEMBERSHIP);
+  EXPECT_EQ(watcher.getToken(), -1);
 }
 
 // Notes which virtual form each request goes through.
@@ -153,142 +76,63 @@ class Overrider : public GSProvider {
   using GSProvider::leaveGroup;
   using GSProvider::send_message;
   using Info = const wyx_proposal_info_t*;
-  wyx_rc_t changeStateValue(Info p) override { return slot = 11, GSProvider::changeStateValue(p); }
-  wyx_rc_t leaveGroup(Info p) override { return slot = 12, GSProvider::leaveGroup(p); }
-  wyx_rc_t expelMembers(Info p) override { return slot = 13, GSProvider::expelMembers(p); }
-  wyx_rc_t send_message(Info p) override { return slot = 14, GSProvider::send_message(p); }
-  wyx_rc_t change_attributes(Info p) override { return slot = 16, GSProvider::change_attributes(p); }
-  int slot = 0;
+  wyx_rc_t changeStateValue(Info p) override { return ++virtuals, GSProvider::changeStateValue(p); }
+  wyx_rc_t leaveGroup(Info p) override { return ++virtuals, GSProvider::leaveGroup(p); }
+  wyx_rc_t expelMembers(Info p) override { return ++virtuals, GSProvider::expelMembers(p); }
+  wyx_rc_t send_message(Info p) override { return ++virtuals, GSProvider::send_message(p); }
+  wyx_rc_t change_attributes(Info p) override { return ++virtuals, GSProvider::change_attributes(p); }
+  int virtuals = 0;
 };
 
-TEST(Provider, ConvenienceForms_fillTheRequestAndCallTheVirtualForm) {
-  RecordingApi api(0);
-  GSController controller;
+TEST_F(Client, ConvenienceForms_fillTheRequestAndCallTheVirtualForm) {
   Overrider provider("g", 3, nullptr);
-  auto& last = api.proposal._gs_protocol_info;
-  api.answer = WYX_EXISTS;
   char text[] = "abc";
   const wyx_state_value_t value = {3, text};
-
-  EXPECT_EQ(provider.changeStateValue(value, WYX_N_PHASE, 30), WYX_EXISTS);
-  EXPECT_EQ(provider.slot, 11);
-  EXPECT_EQ(last._gs_state_change_request.gs_num_phases, WYX_N_PHASE);
-  EXPECT_EQ(last._gs_state_change_request.gs_time_limit, 30);
-  EXPECT_EQ(last._gs_state_change_request.gs_new_state.gs_state, text);
-  provider.changeStateValue(GSStateValue(&value), WYX_1_PHASE, 0);
-  EXPECT_EQ(last._gs_state_change_request.gs_new_state.gs_length, 3);
-  provider.changeStateValue(GSStateValue(), WYX_1_PHASE, 0);
-  EXPECT_EQ(last._gs_state_change_request.gs_new_state.gs_length, 0);
-  const wyx_state_change_request_t change = {WYX_N_PHASE, 7, value};
-  provider.changeStateValue(&change);
-  EXPECT_EQ(last._gs_state_change_request.gs_time_limit, 7);
-
-  provider.leaveGroup(0x1, WYX_N_PHASE, 30);
-  EXPECT_EQ(provider.slot, 12);
-  EXPECT_EQ(last._gs_leave_request.gs_leave_code, 1u);
-  const wyx_leave_request_t leave = {WYX_1_PHASE, 2, 9};
-  provider.leaveGroup(&leave);
-  EXPECT_EQ(last._gs_leave_request.gs_leave_code, 9u);
-
-  const wyx_expel_request_t expel = {WYX_1_PHASE, 2, {0, nullptr}, 4, text};
-  provider.expelMembers(&expel);
-  EXPECT_EQ(provider.slot, 13);
-  EXPECT_EQ(last._gs_expel_request.gs_deactivate_phase, 4);
-  EXPECT_EQ(last._gs_expel_request.gs_deactivate_flag, text);
-
-  provider.send_message({3, text}, WYX_N_PHASE, 5);
-  EXPECT_EQ(provider.slot, 14);
-  EXPECT_EQ(last._gs_message_request.gs_message.gs_message, text);
-  const wyx_message_request_t message = {WYX_1_PHASE, 6, {2, text}};
-  provider.send_message(&message);
-  EXPECT_EQ(last._gs_message_request.gs_message.gs_length, 2);
-
+  const wyx_provider_message_t message = {3, text};
   wyx_group_attributes_t attributes = {};
-  provider.change_attributes(attributes, WYX_N_PHASE, 8);
-  EXPECT_EQ(provider.slot, 16);
-  EXPECT_EQ(last._gs_attribute_change_request.gs_group_attributes, &attributes);
-  EXPECT_EQ(last._gs_attribute_change_request.gs_backlevel_providers, nullptr);
-  EXPECT_EQ(last._gs_attribute_change_request.gs_time_limit, 8);
-}
-
-TEST(Provider, DefaultCallbacks_onlyTrace) {
-  RecordingApi api(GSCL_TRC_API);
-  GSController controller;
-  GSProvider provider("g", 3, nullptr);
-  const auto after = [&](auto route, const auto& n) {
-    api.take();
-    route(&n);
-    return api.take();
+  const wyx_state_change_request_t change = {WYX_N_PHASE, 30, value};
+  const wyx_leave_request_t leave = {WYX_N_PHASE, 30, 7};
+  const wyx_message_request_t send = {WYX_N_PHASE, 30, message};
+  const wyx_attribute_change_request_t alter = {WYX_N_PHASE, 30, &attributes, nullptr};
+  const wyx_expel_request_t expel = {WYX_N_PHASE, 30, {0, nullptr}, 4, text};
+  const auto& last = api.proposal._gs_protocol_info;
+  int made = 0;
+  const auto expectCalled = [&](const auto& request) {
+    EXPECT_EQ(provider.virtuals, ++made);
+    EXPECT_EQ(request.gs_num_phases, WYX_N_PHASE) << made;
+    EXPECT_EQ(request.gs_time_limit, 30) << made;
+    api.proposal = {};
   };
-  const std::string id = "Prov[g,Id=3/7,T=12]";
-  Proposal proposal(ownId());
-  provider.joinGroup();
-  const auto join = proposal.approved(WYX_JOIN);
-  EXPECT_THAT(after(GSController::stub_approvedCb, join),
-              testing::IsSupersetOf(
-                  {"A approvedCb(" + id + ") for WYX_JOIN by [7.3]", "A My Join(" + id + ") is approved"}));
-  const auto failure = proposal.approved(WYX_FAILURE_LEAVE);
-  EXPECT_THAT(after(GSController::stub_approvedCb, failure), testing::Contains("A " + id + " Failure approved."));
-  const auto no_failure = proposal.rejected(WYX_FAILURE_LEAVE);
-  EXPECT_THAT(after(GSController::stub_rejectedCb, no_failure),
-              testing::Contains("A " + id + " Failure rejected."));
-  Proposal others(otherId());
-  const auto not_mine = others.rejected(WYX_JOIN);
-  EXPECT_THAT(after(GSController::stub_rejectedCb, not_mine),
-              testing::Not(testing::Contains(testing::HasSubstr("My"))));
-  const auto phase = others.phase(WYX_EXPEL, 1);
-  EXPECT_THAT(after(GSController::stub_nPhaseCb, phase),
-              testing::Contains("A nPhaseCb(" + id + ") for WYX_EXPEL"));
-  EXPECT_THAT(after(GSController::stub_announcementCb, announcement(WYX_RESPONSIVENESS_RESPONSE)),
-              testing::Contains("A announcementCb(" + id + ") WYX_RESPONSIVENESS_RESPONSE"));
-  wyx_merge_notification_t merge = {};
-  merge.gs_provider_token = kToken;
-  EXPECT_EQ(after(GSController::stub_mergeCb, merge), Lines{"A mergeCb(" + id + ")"});
-  provider.joinGroup();
-  const auto mine = proposal.rejected(WYX_JOIN);
-  EXPECT_THAT(after(GSController::stub_rejectedCb, mine), testing::Contains("A My join(" + id + ") is rejected."));
-}
-
-TEST(Provider, Destroyed_tellsOnlyTheTrace) {
-  RecordingApi api;
-  GSController controller;
-  {
-    GSProvider provider("g", 3, nullptr);
-    EXPECT_EQ(api.take().back(), "A Prov[g,Id=-1/-1,T=-1] created");
-    joined(provider);
+  const auto expectChange = [&](int length) {
+    EXPECT_EQ(last._gs_state_change_request.gs_new_state.gs_length, length);
+    expectCalled(last._gs_state_change_request);
+  };
+  provider.changeStateValue(value, WYX_N_PHASE, 30);
+  expectChange(3);
+  provider.changeStateValue(GSStateValue(&value), WYX_N_PHASE, 30);
+  expectChange(3);
+  provider.changeStateValue(GSStateValue(), WYX_N_PHASE, 30);
+  expectChange(0);
+  provider.changeStateValue(&change);
+  expectChange(3);
+  for (int form = 0; form < 2; ++form) {
+    form == 0 ? provider.leaveGroup(7, WYX_N_PHASE, 30) : provider.leaveGroup(&leave);
+    EXPECT_EQ(last._gs_leave_request.gs_leave_code, 7u);
+    expectCalled(last._gs_leave_request);
+    form == 0 ? provider.send_message(message, WYX_N_PHASE, 30) : provider.send_message(&send);
+    EXPECT_EQ(last._gs_message_request.gs_message.gs_message, text);
+    expectCalled(last._gs_message_request);
+    form == 0 ? provider.change_attributes(attributes, WYX_N_PHASE, 30) : provider.change_attributes(&alter);
+    EXPECT_EQ(last._gs_attribute_change_request.gs_group_attributes, &attributes);
+    EXPECT_EQ(last._gs_attribute_change_request.gs_backlevel_providers, nullptr);
+    expectCalled(last._gs_attribute_change_request);
   }
-  EXPECT_EQ(api.take(), (Lines{"A Prov[g,Id=3/7,T=12] destroyed",
-                               "W The provider(Prov[g,Id=3/7,T=12]) is being deleted before leaving the group."}));
+  provider.expelMembers(&expel);
+  EXPECT_EQ(last._gs_expel_request.gs_deactivate_phase, 4);
+  expectCalled(last._gs_expel_request);
 }
 
-TEST(Subscriber, Destroyed_unsubscribesBeforeItLeavesTheRegistry) {
-  RecordingApi api(GSCL_TRC_API);
-  GSController controller;
-  {
-    GSSubscriber subscriber("g", WYX_SUBSCRIBE_STATE);
-    EXPECT_EQ(api.take().back(), "A Subs[G=g,T=-1] created");
-    subscribed(subscriber);
-    api.during = [&] {
-      // Still found: a notification on the way reaches it.
-      const auto n = subscription(WYX_SUBSCRIPTION_SPECIAL_DATA);
-      api.take();
-      GSController::stub_subscribeCb(&n);
-      EXPECT_EQ(api.take().front(), "A WHATELSE=40");
-    };
-    const auto n = subscription(WYX_SUBSCRIPTION_STATE);
-    GSController::stub_subscribeCb(&n);
-    EXPECT_EQ(api.take().back(), "A subscribeCb(Subs[G=g,T=12]) WYX_SUBSCRIPTION_STATE");
-  }
-  api.during = nullptr;
-  EXPECT_EQ(api.take(), (Lines{"A stub_unsubscribe_group(Subs[G=g,T=-1]) returns sync_rc=WYX_OK",
-                               "A Subs[G=g,T=-1]: unsubscribe sync_rc=WYX_OK"}));
-}
-
-TEST(Client, CancelledRequest_isFinishedFirst) {
-  RecordingApi api;
-  GSController controller;
-  GSProvider provider("g", 3, nullptr);
-  GSSubscriber subscriber("g", WYX_SUBSCRIBE_STATE);
+TEST_F(Client, CancelledRequest_isFinishedFirst) {
   api.during = [] {
     pthread_cancel(pthread_self());
     pthread_testcancel();
@@ -297,21 +141,220 @@ TEST(Client, CancelledRequest_isFinishedFirst) {
   GSSetTraceRtn([](int, char*) { pthread_testcancel(); });
   const auto cancelled = [](const std::function<wyx_rc_t()>& request) {
     wyx_rc_t answer = WYX_NOT_OK;
-    lock_peek::CancellableThread thread([&] {
+    peek::CancellableThread thread([&] {
       answer = request();
       pthread_testcancel();
     });
     EXPECT_TRUE(thread.join());
     return answer;
   };
-  EXPECT_EQ(cancelled([&] { return provider.joinGroup(); }), WYX_OK);
-  EXPECT_EQ(provider.getClientState(), GS_IAM_JOINING);
-  EXPECT_EQ(provider.getToken(), kToken);
-  EXPECT_EQ(cancelled([&] { return provider.goodbyeGroup(); }), WYX_OK);
-  EXPECT_EQ(cancelled([&] { return subscriber.subscribeGroup(); }), WYX_OK);
-  EXPECT_EQ(cancelled([&] { return subscriber.unsubscribeGroup(); }), WYX_OK);
+  EXPECT_EQ(cancelled([&] { return member.joinGroup(); }), WYX_OK);
+  EXPECT_EQ(member.getClientState(), GS_IAM_JOINING);
+  EXPECT_EQ(member.getToken(), kToken);
+  EXPECT_EQ(cancelled([&] { return member.goodbyeGroup(); }), WYX_OK);
+  EXPECT_EQ(cancelled([&] { return watcher.subscribeGroup(); }), WYX_OK);
+  EXPECT_EQ(cancelled([&] { return watcher.unsubscribeGroup(); }), WYX_OK);
   api.during = nullptr;
-  EXPECT_EQ(provider.joinGroup(), WYX_OK) << "no lock was left behind";
+  EXPECT_EQ(member.joinGroup(), WYX_OK) << "no lock was left behind";
+}
+
+TEST_F(Client, TraceRoutineThatThrows_leavesNoLockHeld) {
+  const gscl_tracef_rtn before = GSSetTraceRtn([](int, char* text) {
+    if (std::string(text).starts_with("beginTransaction")) throw std::bad_alloc();
+  });
+  EXPECT_THROW(member.joinGroup(), std::bad_alloc);
+  GSSetTraceRtn(before);
+  // Another thread would wait for ever on a lock left behind.
+  std::thread([&] { EXPECT_EQ(member.joinGroup(), WYX_OK); }).join();
+}
+
+TEST_F(Client, MissingEntryPoint_notSupported) {
+  api.table.wyx_join = nullptr;
+  api.table.wyx_vote = nullptr;
+  EXPECT_EQ(member.joinGroup(), WYX_NOT_SUPPORTED);
+  EXPECT_EQ(member.getClientState(), GS_IAM_IDLE);
+  EXPECT_EQ(member.vote(WYX_VOTE_APPROVE, WYX_VOTE_APPROVE, nullptr, nullptr), WYX_NOT_SUPPORTED);
+}
+
+/// "<current>/<proposed>".
+std::string values(GSClient& client) {
+  GSStateValue current, proposed;
+  client.getCurrentStateValue(current);
+  client.getProposedStateValue(proposed);
+  const auto text = [](GSStateValue& value) {
+    const wyx_state_value_t* v = value.getValue();
+    return v == nullptr ? "" : std::string(v->gs_state, static_cast<size_t>(v->gs_length));
+  };
+  return text(current) + "/" + text(proposed);
+}
+
+class Routing : public ClientTest {
+ protected:
+  /// Whether `notify` reaches the waiters, seen at the line that only an own request writes.
+  template <class Notify>
+  bool told(Notify notify) {
+    api.take();
+    notify();
+    const Lines lines = api.take();
+    return std::any_of(lines.begin(), lines.end(), [](auto& l) { return l.find("IS_MYREQ=1") != l.npos; });
+  }
+
+  std::unique_ptr<Member> mortal = std::make_unique<Member>("g", short{3}, nullptr);
+};
+
+TEST_F(Routing, OwnRequest_byProtocolAndProposer) {
+  struct Case {
+    wyx_request_t protocol;
+    wyx_provider_t by;
+    bool told;
+    GSClientState after;
+  };
+  for (const Case& c :
+       {Case{WYX_STATE_VALUE_CHANGE, kOwn, true, GS_IAM_JOINED},
+        Case{WYX_STATE_VALUE_CHANGE, kOther, false, GS_IAM_JOINED}, Case{WYX_EXPEL, kOwn, true, GS_IAM_JOINED},
+        Case{WYX_LEAVE, kOther, false, GS_IAM_JOINED}, Case{WYX_LEAVE, kOwn, true, GS_IAM_IDLE},
+        Case{WYX_FAILURE_LEAVE, kOwn, false, GS_IAM_JOINED},
+        // The proposer says nothing about a join.
+        Case{WYX_JOIN, kOwn, false, GS_IAM_JOINED}}) {
+    for (auto notify : {approve, reject, phase}) {
+      joined(member);
+      EXPECT_EQ(told([&] { notify(c.protocol, {.by = c.by}); }), c.told) << c.protocol;
+      EXPECT_EQ(member.getClientState(), c.after) << c.protocol;
+    }
+  }
+}
+
+TEST_F(Routing, ValuesAndMembers_areThoseOfTheNotification) {
+  const auto expect = [&](GSClient& client, const char* expected, std::vector<wyx_provider_t> members) {
+    EXPECT_EQ(values(client), expected);
+    ASSERT_EQ(client.getMemberCount(), static_cast<int>(members.size())) << expected;
+    for (size_t i = 0; i < members.size(); ++i) {
+      wyx_provider_t id = {};
+      EXPECT_EQ(client.getMemberAt(static_cast<int>(i), &id), 1);
+      EXPECT_EQ(id, members[i]) << expected;
+    }
+  };
+  member.joinGroup();
+  phase(WYX_JOIN, {.changed = WYX_PROPOSED_STATE_VALUE, .current = "now", .proposed = "next"});
+  expect(member, "now/next", {});
+  approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .current = "state", .members = {kOther, kOwn}});
+  expect(member, "state/", {kOther, kOwn});
+  EXPECT_EQ(member.getId(), kOwn);
+  phase(WYX_STATE_VALUE_CHANGE,
+        {.by = kOther, .changed = WYX_PROPOSED_STATE_VALUE, .current = "ignored", .proposed = "next"});
+  expect(member, "state/next", {kOther, kOwn});
+  phase(WYX_STATE_VALUE_CHANGE, {.by = kOther, .phase = 2, .phases = 3});
+  expect(member, "state/next", {kOther, kOwn});
+  phase(WYX_STATE_VALUE_CHANGE, {.by = kOther, .phase = 2, .phases = 1});
+  expect(member, "state/", {kOther, kOwn});
+  approve(WYX_STATE_VALUE_CHANGE, {.by = kOther, .current = "one", .proposed = "two", .members = {kOwn}});
+  expect(member, "one/two", {kOther, kOwn});
+  approve(WYX_JOIN, {.by = kOther, .changed = WYX_UPDATED_MEMBERSHIP, .current = "left", .members = {kOwn}});
+  expect(member, "left/", {kOwn});
+  reject(WYX_STATE_VALUE_CHANGE, {.current = "back", .proposed = "two"});
+  delayedError(WYX_JOIN, WYX_COLLIDE);
+  expect(member, "back/two", {});
+  member.joinGroup();
+  expect(member, "/", {});
+  EXPECT_EQ(member.getOldClientState(), GS_IAM_IDLE);
+  member.joinGroup();
+  EXPECT_EQ(member.getOldClientState(), GS_IAM_JOINING) << "moves also without a change";
+
+  api.token = 13;
+  watcher.subscribeGroup();
+  subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_STATE,
+               {.current = "v", .members = {kOwn}, .changing = {kOther}, .to = 13});
+  expect(watcher, "v/", {kOwn});
+  subscription(WYX_SUBSCRIPTION_DELTA_JOIN, {.current = "w", .changing = {kOther}, .to = 13});
+  expect(watcher, "v/", {kOwn, kOther});
+  subscription(WYX_SUBSCRIPTION_DELTA_LEAVE, {.changing = {kOwn}, .to = 13});
+  expect(watcher, "v/", {kOther});
+  delayedError(WYX_SUBSCRIPTION, WYX_COLLIDE, 13);
+  EXPECT_EQ(watcher.getClientState(), GS_IAM_IDLE);
+}
+
+TEST_F(Routing, ClientOfAToken_isTheEarliestThatIsNotIdle) {
+  mortal->joinGroup();
+  approve(WYX_JOIN);
+  EXPECT_EQ(mortal->getClientState(), GS_IAM_JOINED);
+  member.joinGroup();  // with the same token
+  approve(WYX_JOIN);
+  EXPECT_EQ(member.getClientState(), GS_IAM_JOINED);
+  announce(WYX_GROUP_DISSOLVED);
+  EXPECT_EQ(member.getToken(), -1);
+  EXPECT_EQ(mortal->getToken(), kToken);
+}
+
+TEST_F(Routing, Callback_mayDestroyItsOwnClient) {
+  joined(*mortal);
+  mortal->action = [&] { mortal.reset(); };
+  api.take();
+  approve(WYX_STATE_VALUE_CHANGE, {.by = kOther});
+  const Lines lines = api.take();
+  // Nothing that needs the client follows its end.
+  ASSERT_GE(lines.size(), 3u);
+  EXPECT_EQ(lines[lines.size() - 3], "A P[3/7,T=12] destroyed");
+  EXPECT_EQ(lines[lines.size() - 2], "W The provider(P[3/7,T=12]) is being deleted before leaving the group.");
+  EXPECT_EQ(lines.back(), "D returned from approvedCb()");
+  approve(WYX_STATE_VALUE_CHANGE, {.by = kOther});
+  EXPECT_EQ(api.take(), Lines{"W stub_approvedCb provider_token=12 not found"});
+}
+
+TEST_F(Routing, NestedDispatch_thatDestroysTheOuterClient_isNoticedByBothDeliveries) {
+  joined(*mortal);
+  int depth = 0;
+  mortal->action = [&] {
+    if (++depth == 1) return announce(WYX_DEFAULT_APPROVE);
+    mortal.reset();
+    // Likely at the same address: it must not be taken for the old one.
+    mortal = std::make_unique<Member>("h", short{3}, nullptr);
+    mortal->joinGroup();
+  };
+  approve(WYX_STATE_VALUE_CHANGE, {.by = kOther});
+  EXPECT_EQ(depth, 2);
+  EXPECT_EQ(api.take().back(), "D returned from approvedCb()");
+  EXPECT_EQ(mortal->getClientState(), GS_IAM_JOINING);
+}
+
+TEST_F(Routing, Callback_mayRequestVoteAndConstructClients) {
+  joined(member);
+  member.action = [&] {
+    EXPECT_EQ(member.vote(WYX_VOTE_APPROVE, WYX_VOTE_REJECT, nullptr, nullptr), WYX_OK);
+    api.token = 13;
+    mortal = std::make_unique<Member>("h", short{1}, nullptr);
+    EXPECT_EQ(mortal->joinGroup(), WYX_OK);
+    EXPECT_EQ(controller.dispatch(WYX_NON_BLOCKING), WYX_OK);
+  };
+  phase(WYX_STATE_VALUE_CHANGE, {.by = kOther});
+  EXPECT_EQ(mortal->getToken(), 13);
+}
+
+// Of the trace routine below: what the two threads have come to.
+std::atomic<bool> in_callback, destroying, delivered;
+
+void holdCallbackUntilDestructionBegins(int, char* text) {
+  const std::string line(text);
+  if (line.starts_with("approvedCb(")) {
+    in_callback = true;
+    while (!destroying) std::this_thread::yield();
+    // Room for a destructor that does not wait to get done.
+    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+  }
+  if (line.find("destroyed") != line.npos) destroying = true;
+  if (line.find("stub_approvedCb") != line.npos && line.find("done") != line.npos) delivered = true;
+}
+
+TEST_F(Routing, Destructor_waitsForADeliveryOnAnotherThread) {
+  auto provider = std::make_unique<GSProvider>("g", short{3}, nullptr);
+  joined(*provider);
+  in_callback = destroying = delivered = false;
+  const gscl_tracef_rtn before = GSSetTraceRtn(holdCallbackUntilDestructionBegins);
+  std::thread deliverer([] { approve(WYX_STATE_VALUE_CHANGE, {.by = kOther}); });
+  while (!in_callback) std::this_thread::yield();
+  provider.reset();
+  EXPECT_TRUE(delivered);
+  deliverer.join();
+  GSSetTraceRtn(before);
 }
 
 }  // namespace

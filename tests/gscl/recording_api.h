@@ -1,9 +1,14 @@
-// A base API that records its calls between the trace lines, so that a test can hold the whole order of steps.
+// A base API that records its calls between the trace lines, so that a test can hold the whole order of steps; and
+// the notifications that a base API sends.
 #ifndef TESTS_GSCL_RECORDING_API_H
 #define TESTS_GSCL_RECORDING_API_H
 
+#include <pthread.h>
+#include <stdarg.h>
+
 #include <functional>
 #include <mutex>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -19,124 +24,292 @@ using zelt_gscl_V1::GSProvider;
 using zelt_gscl_V1::GSStateValue;
 using zelt_gscl_V1::GSSubscriber;
 using zelt_gscl_V1::wyx_notification_summary_t;
+using Lines = std::vector<std::string>;
 
 constexpr int kAllLevels = GSCL_TRC_API | GSCL_TRC_DETAIL | GSCL_TRC_WARNING;
 constexpr wyx_token_t kToken = 12;
+constexpr wyx_provider_t kOwn = {{3, 7}};  // instance 3 on node 7, which joined() gives
+constexpr wyx_provider_t kOther = {{4, 8}};
+constexpr wyx_state_value_t kNoValue = {0, nullptr};
+
+inline std::string lowHex(uintptr_t value) {
+  char text[16];
+  snprintf(text, sizeof text, "%x", static_cast<unsigned>(value));
+  return text;
+}
 
 /// One event reads "<state>/<token> <what>", state and token being the watched client's at that moment. <what> is
-/// a call of the base API, "wyx_leave(12)", a callback, "-> approvedCb", or a trace line with its channel bit, "A
-/// text" (D: detail, W: warning), without its line end. Addresses of the watched client read "@", the calling
-/// thread's id reads "#".
+/// a call of the base API, "wyx_leave(12)", a callback, "-> approvedCb", a result, "= WYX_OK", or a trace line
+/// with its channel, "A text" (D: detail, W: warning), without its line end. Addresses of the watched client read
+/// "@", the calling thread's id "#", numbers of requests "seq=S", and "Prov[g,Id=3/7,T=12]" reads "P[3/7,T=12]".
 class RecordingApi {
  public:
-  explicit RecordingApi(int level = kAllLevels);
-  ~RecordingApi();
+  explicit RecordingApi(int level = kAllLevels) : table_before_(GSAPIRtns) {
+    the_api = this;
+    fillTable();
+    GSAPIRtns = &table;
+    routine_before_ = GSSetTraceRtn([](int line_level, char* text) {
+      const char* channel = line_level == GSCL_TRC_API ? "A " : line_level == GSCL_TRC_DETAIL ? "D " : "W ";
+      std::string line = channel + std::string(text);
+      line.back() == '\n' ? line.pop_back() : (void)line.append("<no line end>");
+      the_api->record(line);
+    });
+    GSSetDebugLevel(level);
+  }
+  ~RecordingApi() {
+    GSSetDebugLevel(0);
+    GSSetTraceRtn(routine_before_);
+    GSAPIRtns = table_before_;
+  }
   RecordingApi(const RecordingApi&) = delete;
   RecordingApi& operator=(const RecordingApi&) = delete;
 
-  void watch(GSClient* client) { watched_ = client; }
-  void record(const std::string& what);
+  /// Drops what was recorded and names this client's state from here on.
+  void watch(GSClient* client) {
+    take();
+    watched_ = client;
+  }
+  void record(std::string what) {
+    const auto replace = [&](const char* pattern, const char* with) {
+      what = std::regex_replace(what, std::regex(pattern), with);
+    };
+    std::string state;
+    if (watched_ != nullptr) {
+      replace(lowHex(reinterpret_cast<uintptr_t>(watched_)).c_str(), "@");
+      state = std::string("[") + (gscl_GSClientStateName(watched_->getClientState()) + 7) + "/" +
+              std::to_string(watched_->getToken()) + "]";
+    }
+    replace(lowHex(pthread_self()).c_str(), "#");
+    replace("Prov\\[g,Id=", "P[");
+    replace("GSController::", "C::");
+    replace("seq=[0-9]+", "seq=S");
+    std::lock_guard<std::mutex> lock(mutex_);
+    if (std::exchange(state_, state) != state) events_.push_back(state);
+    events_.push_back(what);
+  }
   /// What was recorded since the last call.
-  std::vector<std::string> take();
-
-  static RecordingApi& current();
-  wyx_rc_t enter(const std::string& call);
+  Lines take() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return std::move(events_);
+  }
 
   wyx_rc_t answer = WYX_OK;
   wyx_token_t token = kToken;         // what join and subscribe give
   std::function<void()> during;       // runs inside every entry point
   wyx_proposal_info_t proposal = {};  // of the last request
-  std::string join_text;              // "<group>/<instance>/<local name>" of the last join
-  std::string subscribed_group;
-  wyx_responsiveness_t responsiveness = {};
+  std::string entered;  // "<group>/<instance>/<local name>" of the last join, the group of the last subscription
   struct Setup {
     int version, count;
     wyx_socket_ctrl_t socket;
     wyx_responsiveness_t responsiveness;
     const char* path;
-    wyx_responsiveness_cb_t* responsiveness_cb;
-    wyx_delayed_error_cb_t* error_cb;
-    wyx_query_cb_t* query_cb;
-    void (*domain_cb)(const wyx_domain_control_notification_t*);
+    std::vector<void*> callbacks;
   } setup = {};
-  wyx_descriptor_t descriptor = 7;
-
-  GSAPIRtnCollection_t table;
+  GSAPIRtnCollection_t table = {};
+  static inline RecordingApi* the_api = nullptr;
 
  private:
+  using Info = const wyx_proposal_info_t*;
+
+  template <class... Arguments>
+  wyx_rc_t enter(const char* name, Arguments... arguments) {
+    std::string list;
+    ((list += (list.empty() ? "" : ", ") + std::to_string(arguments)), ...);
+    record(std::string(name) + "(" + list + ")");
+    if (auto act = during) act();
+    return answer;
+  }
+  wyx_rc_t admit(const char* name, const std::string& whom, wyx_token_t* new_token, Info info) {
+    proposal = *info;
+    entered = whom;
+    const wyx_rc_t rc = enter(name, *new_token);
+    *new_token = token;
+    return rc;
+  }
+  static wyx_rc_t setUp(int version, int count, wyx_descriptor_t* fd, wyx_socket_ctrl_t socket,
+                        const wyx_responsiveness_t* responsiveness, const char* path,
+                        wyx_responsiveness_cb_t* alive, wyx_delayed_error_cb_t* error, wyx_query_cb_t* query,
+                        ...) {
+    the_api->setup = {version, count, socket, *responsiveness, path, {(void*)alive, (void*)error, (void*)query}};
+    va_list rest;
+    va_start(rest, query);
+    if (count == 8) the_api->setup.callbacks.push_back(va_arg(rest, void*));
+    va_end(rest);
+    *fd = 7;
+    return the_api->enter("wyx_setup");
+  }
+  void fillTable() {
+    table.wyx_setup = setUp;
+    table.wyx_join = [](wyx_token_t* t, Info info) {
+      const wyx_join_request_t& join = info->_gs_protocol_info._gs_join_request;
+      const std::string group = join.gs_group_attributes->gs_group_name, name = join.gs_provider_local_name;
+      const std::string instance = std::to_string(join.gs_provider_instance);
+      return the_api->admit("wyx_join", group + "/" + instance + "/" + name, t, info);
+    };
+    table.wyx_subscribe = [](wyx_token_t* t, Info info) {
+      const char* group = info->_gs_protocol_info._gs_subscribe_request.gs_subscription_group;
+      return the_api->admit("wyx_subscribe", group, t, info);
+    };
+    table.wyx_vote = [](wyx_token_t t, wyx_vote_value_t vote, const wyx_state_value_t* value,
+                        const wyx_provider_message_t* message, wyx_vote_value_t default_vote) {
+      const int lengths[] = {value == nullptr ? -1 : value->gs_length,
+                             message == nullptr ? -1 : message->gs_length};
+      return the_api->enter("wyx_vote", t, vote, lengths[0], lengths[1], default_vote);
+    };
+#define ENTRY(entry) table.entry = [](auto... number) { return the_api->enter(#entry, number...); }
+#define PROPOSAL(entry) \
+  table.entry = [](wyx_token_t t, Info info) { return the_api->proposal = *info, the_api->enter(#entry, t); }
+    ENTRY(wyx_quit);
+    ENTRY(wyx_dispatch);
+    ENTRY(wyx_goodbye);
+    ENTRY(wyx_unsubscribe);
+    PROPOSAL(wyx_change_state_value);
+    PROPOSAL(wyx_send_message);
+    PROPOSAL(wyx_leave);
+    PROPOSAL(wyx_expel);
+    PROPOSAL(wyx_change_attributes);
+#undef PROPOSAL
+#undef ENTRY
+    table.wyx_change_responsiveness = [](const wyx_responsiveness_t*) {
+      return the_api->enter("wyx_change_responsiveness");
+    };
+  }
+
   std::mutex mutex_;
-  std::vector<std::string> events_;
+  Lines events_;
+  std::string state_;  // at the last event
   GSClient* watched_ = nullptr;
   GSAPIRtnCollection_t* table_before_;
   gscl_tracef_rtn routine_before_;
 };
 
-/// A provider whose callbacks are recorded and then do what the test says.
+/// A provider whose callbacks are recorded, then do what the test says, else what the library's do.
 class Member : public GSProvider {
  public:
   using GSProvider::GSProvider;
-  void nPhaseCb(const wyx_n_phase_notification_t*) override { called("nPhaseCb"); }
-  void approvedCb(const wyx_approved_notification_t*) override { called("approvedCb"); }
-  void rejectedCb(const wyx_rejected_notification_t*) override { called("rejectedCb"); }
-  void announcementCb(const wyx_announcement_notification_t*) override { called("announcementCb"); }
-  void mergeCb(const wyx_merge_notification_t*) override { called("mergeCb"); }
-  void delayedErrorCb(const wyx_delayed_error_notification_t*) override { called("delayedErrorCb"); }
+#define CALLBACK(name, Base, type)                           \
+  void name(const wyx_##type##_notification_t* n) override { \
+    RecordingApi::the_api->record("-> " #name);              \
+    if (auto act = action) return act();                     \
+    Base::name(n);                                           \
+  }                                                          \
+  static_assert(true)
+  CALLBACK(nPhaseCb, GSProvider, n_phase);
+  CALLBACK(approvedCb, GSProvider, approved);
+  CALLBACK(rejectedCb, GSProvider, rejected);
+  CALLBACK(announcementCb, GSProvider, announcement);
+  CALLBACK(mergeCb, GSProvider, merge);
+  CALLBACK(delayedErrorCb, GSProvider, delayed_error);
   std::function<void()> action;
-
- private:
-  void called(const char* name) {
-    RecordingApi::current().record(std::string("-> ") + name);
-    if (auto act = action) act();
-  }
 };
 
 class Watcher : public GSSubscriber {
  public:
   using GSSubscriber::GSSubscriber;
-  void subscribeCb(const wyx_subscription_notification_t*) override {
-    RecordingApi::current().record("-> subscribeCb");
-    if (auto act = action) act();
-  }
+  CALLBACK(subscribeCb, GSSubscriber, subscription);
   std::function<void()> action;
 };
+#undef CALLBACK
 
-/// The id of instance 3 on node 7, which joined() gives.
-wyx_provider_t ownId();
-wyx_provider_t otherId();
-
-/// Records as the base API hands them out, with everything that they point at.
-struct Proposal {
-  explicit Proposal(wyx_provider_t by, int changed = 0);
-  Proposal(const Proposal&) = delete;
-  void current(std::string value);
-  void proposed(std::string value);
-  void members(std::vector<wyx_provider_t> ids);
-
-  wyx_approved_notification_t approved(wyx_request_t protocol, wyx_token_t to = kToken);
-  wyx_rejected_notification_t rejected(wyx_request_t protocol, wyx_token_t to = kToken);
-  wyx_n_phase_notification_t phase(wyx_request_t protocol, unsigned short number, unsigned short phases = 2,
-                                   wyx_token_t to = kToken);
-
-  wyx_proposal_t record = {};
-
- private:
-  std::string current_text_, proposed_text_;
-  wyx_state_value_t current_ = {}, proposed_ = {};
-  std::vector<wyx_provider_t> ids_;
-  wyx_membership_t members_ = {};
+/// What a notification says. An empty text is no state value at all, an empty list no membership.
+struct Says {
+  wyx_provider_t by = kOwn;
+  int changed = 0;
+  std::string current = {}, proposed = {};
+  std::vector<wyx_provider_t> members = {}, changing = {};
+  unsigned short phase = 1, phases = 2;
+  wyx_token_t to = kToken;
 };
 
-wyx_announcement_notification_t announcement(int summary);
-wyx_subscription_notification_t subscription(int type);
-wyx_delayed_error_notification_t delayedError(wyx_request_t protocol, wyx_rc_t rc);
+/// The same, as the base API hands it out.
+struct Records {
+  explicit Records(Says& says) {
+    proposal.gs_phase_info = {says.phases, says.phase};
+    proposal.gs_proposed_by = says.by;
+    proposal.gs_whats_changed = static_cast<wyx_whats_changed_t>(says.changed);
+    if (!says.members.empty()) proposal.gs_current_providers = &members;
+    if (!says.current.empty()) proposal.gs_current_state_value = &current;
+    if (!says.proposed.empty()) proposal.gs_proposed_state_value = &proposed;
+    members = {static_cast<unsigned>(says.members.size()), says.members.data()};
+    changing = {static_cast<unsigned>(says.changing.size()), says.changing.data()};
+    current = {static_cast<int>(says.current.size()), says.current.data()};
+    proposed = {static_cast<int>(says.proposed.size()), says.proposed.data()};
+  }
+  wyx_membership_t members, changing;
+  wyx_state_value_t current, proposed;
+  wyx_proposal_t proposal = {};
+};
 
-/// Brings a client where most notifications find it; what was recorded on the way is dropped.
-void joined(GSProvider& provider);
-void subscribed(GSSubscriber& subscriber);
+inline void approve(wyx_request_t protocol, Says s = {}) {
+  Records r(s);
+  const auto what = WYX_APPROVED_NOTIFICATION;
+  const wyx_approved_notification_t n = {what, s.to, protocol, WYX_EXPLICIT_APPROVE, &r.proposal, 1};
+  GSController::stub_approvedCb(&n);
+}
 
-std::string textOf(GSStateValue& value);
-std::string currentValue(GSClient& client);
-std::string proposedValue(GSClient& client);
+inline void reject(wyx_request_t protocol, Says s = {}) {
+  Records r(s);
+  const auto what = WYX_REJECTED_NOTIFICATION;
+  const wyx_rejected_notification_t n = {what, s.to, protocol, WYX_EXPLICIT_REJECT, &r.proposal, 1};
+  GSController::stub_rejectedCb(&n);
+}
+
+inline void phase(wyx_request_t protocol, Says s = {}) {
+  Records r(s);
+  const auto what = WYX_N_PHASE_NOTIFICATION;
+  const wyx_n_phase_notification_t n = {what, s.to, protocol, WYX_EXPLICIT_APPROVE, 30, &r.proposal, 1};
+  GSController::stub_nPhaseCb(&n);
+}
+
+inline void subscription(int type, Says s = {}) {
+  Records r(s);
+  wyx_subscription_notification_t n = {};
+  n.gs_notification_type = WYX_SUBSCRIPTION_NOTIFICATION;
+  n.gs_subscriber_token = s.to;
+  n.gs_subscription_type = static_cast<wyx_subscription_type_t>(type);
+  n.gs_state_value = r.proposal.gs_current_state_value;
+  n.gs_full_membership = &r.members;
+  n.gs_changing_membership = &r.changing;
+  GSController::stub_subscribeCb(&n);
+}
+
+inline void announce(int summary, wyx_token_t to = kToken) {
+  const auto code = static_cast<wyx_summary_code_t>(summary);
+  const wyx_announcement_notification_t n = {WYX_ANNOUNCEMENT_NOTIFICATION, to, code, nullptr};
+  GSController::stub_announcementCb(&n);
+}
+
+inline void merge(wyx_token_t to = kToken) {
+  wyx_merge_notification_t n = {};
+  n.gs_provider_token = to;
+  GSController::stub_mergeCb(&n);
+}
+
+inline void delayedError(wyx_request_t protocol, wyx_rc_t rc, wyx_token_t to = kToken) {
+  const wyx_delayed_error_notification_t n = {WYX_DELAYED_ERROR_NOTIFICATION, to, protocol, rc, nullptr, nullptr};
+  GSController::stub_delayedErrorCb(&n);
+}
+
+/// Bring a client where most notifications find it.
+inline void joined(GSProvider& provider) {
+  provider.joinGroup();
+  approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .members = {kOwn}, .to = provider.getToken()});
+}
+inline void subscribed(GSSubscriber& subscriber) {
+  subscriber.subscribeGroup();
+  subscription(WYX_SUBSCRIPTION_MEMBERSHIP, {.to = subscriber.getToken()});
+}
+
+/// A provider and a subscriber of the group "g".
+class ClientTest : public testing::Test {
+ public:
+  ~ClientTest() override { api.watch(nullptr); }
+
+  RecordingApi api;
+  GSController controller;
+  Member member{"g", 3, nullptr};
+  Watcher watcher{"g", WYX_SUBSCRIBE_STATE_AND_MEMBERSHIP};
+};
 
 }  // namespace recording
 
