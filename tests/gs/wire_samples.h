@@ -29,7 +29,7 @@ inline std::vector<Request> requests() {
           StateChangeRequest{4, terms, binary},
           MessageRequest{5, terms, binary},
           LeaveRequest{6, terms, 0xdeadbeef},
-          ExpelRequest{7, terms, {{1, 2}, {-3, 4}}, -9, binary},
+          ExpelRequest{7, terms, {{1, 2}, {-3, 4}}, -9, "\xff\x80 flag"},
           AttributeChangeRequest{8, terms, attributes()},
           GoodbyeRequest{9},
           VoteRequest{10, WYX_VOTE_CONTINUE, binary, Bytes(), WYX_VOTE_APPROVE},
@@ -82,6 +82,15 @@ inline ProtocolNotification full_protocol(std::size_t state_size = 5) {
   return n;
 }
 
+/// Of a request that failed; WYX_INTERNAL_REQUEST for those that are no protocol.
+inline wyx_request_t protocol_of(const Request& request) {
+  static constexpr wyx_request_t kTypes[] = {
+      WYX_JOIN,         WYX_STATE_VALUE_CHANGE,     WYX_PROVIDER_MESSAGE, WYX_LEAVE,
+      WYX_EXPEL,        WYX_GROUP_ATTRIBUTE_CHANGE, WYX_INTERNAL_REQUEST, WYX_INTERNAL_REQUEST,
+      WYX_SUBSCRIPTION, WYX_INTERNAL_REQUEST};
+  return kTypes[request.index()];
+}
+
 inline std::vector<Notification> notifications() {
   std::vector<Notification> all = {
       full_protocol(),
@@ -95,8 +104,8 @@ inline std::vector<Notification> notifications() {
                                {{WYX_PROVIDER_FAILURE, 3}},
                                44},
       SubscriptionNotification{WYX_SUBSCRIPTION_MEMBERSHIP, bytes(""), members({}), nullptr, {}, 45}};
-  for (Request& request : requests()) {
-    all.push_back(DelayedErrorNotification{WYX_STATE_VALUE_CHANGE, WYX_COLLIDE, std::move(request),
+  for (const Request& request : requests()) {
+    all.push_back(DelayedErrorNotification{protocol_of(request), WYX_COLLIDE, request,
                                            std::make_shared<const GroupAttributes>(attributes())});
   }
   return all;

@@ -19,7 +19,10 @@ constexpr bool known(wyx_vote_value_t*, int value) {
   return (value >= WYX_NULL_VOTE && value <= WYX_VOTE_REJECT) ||
          value == WYX_VOTE_APPROVE_AND_SWITCH_ALPHA_OMEGA || value == WYX_VOTE_CONTINUE_AND_SWITCH_ALPHA_OMEGA;
 }
-constexpr bool known(wyx_request_t*, int value) { return value >= WYX_RESPONSIVENESS && value <= MAX_REQUEST; }
+/// WYX_INTERNAL_REQUEST stands in the delayed error of a vote or a goodbye.
+constexpr bool known(wyx_request_t*, int value) {
+  return (value >= WYX_RESPONSIVENESS && value <= MAX_REQUEST) || value == WYX_INTERNAL_REQUEST;
+}
 constexpr bool known(wyx_rc_t*, int value) { return value >= WYX_OK && value <= WYX_UNEXPECTED_QUORUM_RESP; }
 
 /// Of a ProtocolNotification; the other notifications are types of their own.
