@@ -6,6 +6,7 @@
 #include <cstdlib>
 
 #include "gs/daemon_memory.h"
+#include "gs/made_up_request.h"
 #include "gs/wire_samples.h"
 
 namespace gs::daemon {
@@ -153,56 +154,11 @@ class Run {
 
   void request() {
     const ConnectionId to = some();
-    daemon_.say(to, wire::Call{made_up_request()});
-  }
-
-  GroupAttributes attributes() {
-    GroupAttributes a;
-    a.group_name = "g" + std::to_string(input_.byte() % 3);
-    const std::uint8_t bits = input_.byte();
-    if (bits & 1) a.num_phases = WYX_N_PHASE;
-    if (bits & 2) a.batch_control = WYX_BATCH_BOTH;
-    if (bits & 4) a.time_limit = 5;
-    if (bits & 8) a.default_vote = WYX_VOTE_REJECT;
-    if (bits & 16) a.group_name.assign(input_.word() % (wire::kMaxWireName + 1), 'n');
-    return a;
-  }
-  ProtocolTerms terms() {
-    const std::uint8_t bits = input_.byte();
-    return {(bits & 1) ? WYX_N_PHASE : WYX_1_PHASE, static_cast<std::uint16_t>(bits >> 4)};
-  }
-  Bytes content() { return Bytes(std::size_t{input_.byte()} * input_.byte(), 'c'); }
-  wyx_vote_value_t vote() { return static_cast<wyx_vote_value_t>(input_.byte() % 4); }
-  ProviderId provider() { return {static_cast<std::int16_t>(input_.byte() % 4), 1}; }
-
-  Request made_up_request() {
-    const std::uint8_t kind = input_.byte() % 10;
-    const Token token = input_.byte() % 4 - 1;
-    switch (kind) {
-      case 0:
-        return JoinRequest{token, attributes(), static_cast<std::int16_t>(input_.byte() % 4), "name"};
-      case 1:
-        return StateChangeRequest{token, terms(), content()};
-      case 2:
-        return MessageRequest{token, terms(), content()};
-      case 3:
-        return LeaveRequest{token, terms(), input_.byte()};
-      case 4:
-        return ExpelRequest{token, terms(), {provider(), provider()}, 0, "flag"};
-      case 5:
-        return AttributeChangeRequest{token, terms(), attributes()};
-      case 6:
-        return GoodbyeRequest{token};
-      case 7:
-        return VoteRequest{token, vote(), content(), std::nullopt, vote()};
-      case 8:
-        return SubscribeRequest{token, input_.word(), "g" + std::to_string(input_.byte() % 3)};
-      default:
-        return UnsubscribeRequest{token};
-    }
+    daemon_.say(to, wire::Call{made_up_.request()});
   }
 
   Input input_;
+  test::MadeUp<Input> made_up_{input_};
   MemoryDaemon daemon_{kQueueBound};
   MemoryClient good_{daemon_};
   std::vector<ConnectionId> open_;

@@ -1,0 +1,175 @@
+// Protocols as those who take part see them, where the simulator's model leaves room: who is asked first, what the
+// queue holds together and in which order, what notifications carry for people and tools.
+#include "gs/engine_script.h"
+
+namespace gs::test {
+namespace {
+
+class EngineProtocols : public Script {};
+
+TEST_F(EngineProtocols, Join_asks_members_and_joiner_also_the_first_one_about_itself) {
+  attributes.num_phases = WYX_N_PHASE;
+  attributes.time_limit = 9;
+  join(1);
+  EXPECT_TRUE(engine.status()[0].members.empty());
+  approve({1});
+  join(2);
+  vote(2, WYX_VOTE_CONTINUE, "new", "why");
+  apply(TimerExpiredEvent{timers.back().id});
+  approve({1, 2});
+  EXPECT_EQ(seen(),
+            "1: phase 1 join by 1, members -, changing 1, limit 9\n"
+            "1: approved join by 1 <approve>, members 1, changing 1\n"
+            "1 2: phase 1 join by 2, members 1, changing 2, limit 9\n"
+            "1 2: phase 2 join by 2 <default-approve|time>, members 1, changing 2, proposed 'new', msg 'why', "
+            "limit 9\n"
+            "1 2: approved join by 2 <default-approve|time>, members 1 2, changing 2, state 'new'\n");
+}
+
+TEST_F(EngineProtocols, Queue_runs_failures_first_then_one_by_one) {
+  group_of({1, 2, 3, 4});
+  change_state(1, "x", kPhases);
+  join(5);
+  leave(4, 42, kPhases);
+  dies(2);
+  goodbye(3);
+  approve({1, 4});
+  vote(1, WYX_VOTE_CONTINUE);
+  EXPECT_EQ(leave(4), WYX_COLLIDE);
+  approve({5});
+  vote(1, WYX_VOTE_APPROVE, "dropped");
+  vote(5, WYX_VOTE_REJECT);
+  EXPECT_EQ(seen(),
+            "1 2 3 4: phase 1 state by 1, members 1 2 3 4, proposed 'x'\n"
+            "1 4: approved state by 1 <default-approve|failed>, members 1 2 3 4, state 'x'\n"
+            "1 4: approved failure by 2 <approve>, members 1 3 4, changing 2(died), state 'x'\n"
+            "1 4: approved failure by 3 <approve>, members 1 4, changing 3(goodbye), state 'x'\n"
+            "1 4 5: approved join by 5 <approve>, members 1 4 5, changing 5, state 'x'\n"
+            "1 5: phase 1 leave by 4, members 1 4 5, changing 4(voluntary=42), state 'x'\n"
+            "1 5: phase 2 leave by 4, members 1 4 5, changing 4(voluntary=42), state 'x'\n"
+            "1 4 5: approved leave by 4 <reject>, members 1 5, changing 4(voluntary=42), state 'x'\n");
+  EXPECT_EQ(leave(4), WYX_BAD_MEMBER_TOKEN);
+}
+
+TEST_F(EngineProtocols, Queue_runs_batches_where_the_group_says_so_and_leaves_of_the_same_terms_only) {
+  attributes.batch_control = WYX_BATCH_BOTH;
+  group_of({1, 2, 3, 4});
+  change_state(1, "x", kPhases);
+  leave(2, 20);
+  leave(3, 30, kPhases);
+  leave(4, 40);
+  join(5, 7);
+  join(6, 7);
+  seen();
+  approve({1, 2, 3, 4});
+  approve({1});
+  apply(HostGoneEvent{7});
+  EXPECT_EQ(seen(),
+            "1 2 3 4: approved state by 1 <approve>, members 1 2 3 4, state 'x'\n"
+            "1 2 3: approved leave by 2 <approve>, members 1 3, changing 2 4(voluntary=20 voluntary=40), "
+            "state 'x'\n"
+            "4: approved leave by 4 <approve>, members 1 3, changing 2 4(voluntary=20 voluntary=40), state 'x'\n"
+            "1: phase 1 leave by 3, members 1 3, changing 3(voluntary=30), state 'x'\n"
+            "1 3: approved leave by 3 <approve>, members 1, changing 3(voluntary=30), state 'x'\n"
+            "1 5: approved join by 5@7 <approve>, members 1 5@7 6@7, changing 5@7 6@7, state 'x'\n"
+            "6: approved join by 6@7 <approve>, members 1 5@7 6@7, changing 5@7 6@7, state 'x'\n"
+            "1: approved failure by 5@7 <approve>, members 1, changing 5@7 6@7(host host), state 'x'\n");
+  EXPECT_EQ(join(8, 7), WYX_NO_INIT);
+  apply(HostCameEvent{7});
+  EXPECT_EQ(join(8, 7), WYX_OK);
+}
+
+TEST_F(EngineProtocols, Join_queued_that_no_longer_fits_gets_a_delayed_error_with_the_reason) {
+  group_of({1});
+  GroupAttributes changed = attributes;
+  changed.client_version = 5;
+  request(1, AttributeChangeRequest{1, kPhases, changed});
+  EXPECT_EQ(join(2), WYX_OK);
+  seen();
+  approve({1});
+  EXPECT_EQ(seen(),
+            "1: approved attributes by 1 <approve>, members 1, version 5\n"
+            "2: error 13 for join, group has version 5\n");
+  EXPECT_EQ(join(2), WYX_BAD_GROUP_ATTRIBUTES);
+  attributes = changed;
+  EXPECT_EQ(join(2), WYX_OK);
+}
+
+TEST_F(EngineProtocols, Goodbye_frees_token_and_id_at_once_also_of_a_joiner) {
+  attributes.num_phases = WYX_N_PHASE;
+  group_of({1, 2});
+  join(3);
+  EXPECT_EQ(goodbye(3), WYX_OK);
+  EXPECT_EQ(join(3), WYX_OK) << "the same token again, behind the old join";
+  approve({1, 2});
+  EXPECT_EQ(goodbye(3), WYX_OK);
+  EXPECT_EQ(goodbye(3), WYX_BAD_MEMBER_TOKEN);
+}
+
+TEST_F(EngineProtocols, Expel_dismisses_the_listed_with_their_waiting_leave) {
+  group_of({1, 2, 3, 4});
+  request(1, ExpelRequest{1, kPhases, {id(2), id(4)}, 3, "flag"});
+  leave(4);
+  approve({1, 3});
+  EXPECT_EQ(seen(),
+            "1 3: phase 1 expel by 1, members 1 2 3 4, changing 2 4(expelled expelled), deactivate 3 'flag'\n"
+            "1 2 3 4: approved expel by 1 <approve>, members 1 3, changing 2 4(expelled expelled), "
+            "deactivate 3 'flag'\n"
+            "2: announcement <dissolved>\n"
+            "4: error 6 for leave\n"
+            "4: announcement <dissolved>\n");
+}
+
+TEST_F(EngineProtocols, Vote_results_are_collected_as_the_batch_control_says) {
+  attributes.batch_control = WYX_COLLECT_ALL_RESULT;
+  attributes.num_phases = WYX_N_PHASE;
+  attributes.time_limit = 5;
+  group_of({1, 2, 3});
+  join(4);
+  vote(4, WYX_VOTE_CONTINUE, "s", "m");
+  dies(3);
+  approve({1});
+  seen();
+  apply(TimerExpiredEvent{timers.back().id});
+  approve({1, 2});
+  vote(4, WYX_VOTE_REJECT);
+  EXPECT_EQ(seen(),
+            "1 2 4: phase 2 join by 4 <default-approve|time|failed>, members 1 2 3, changing 4, proposed 's', "
+            "msg 'm', votes[1 yes approve; 2 yes default-approve|time; 3 yes default-approve|failed (died)], "
+            "changing votes[4 continue none 's' msg 'm'], limit 5\n"
+            "1 2 4: rejected join by 4 <reject>, members 1 2 3, changing 4, "
+            "votes[1 yes approve; 2 yes approve], changing votes[4 no reject]\n"
+            "1 2: phase 1 failure by 3, members 1 2 3, changing 3(died), limit 5\n");
+
+  const std::pair<wyx_batch_ctrl_t, std::string> parts[] = {{WYX_COLLECT_VOTE_RESULT, "yes approve]"},
+                                                            {WYX_COLLECT_MSG_RESULT, "null approve msg 'm']"},
+                                                            {WYX_COLLECT_STATEVALUE_RESULT, "null approve 's']"}};
+  int who = 10;
+  for (const auto& [control, votes] : parts) {
+    attributes.batch_control = control;
+    attributes.group_name = votes;
+    group_of({++who});
+    request(who, MessageRequest{1, kPhases, "p"});
+    vote(who, WYX_VOTE_APPROVE, "s", "m");
+    EXPECT_NE(seen().find("votes[" + std::to_string(who) + " " + votes), std::string::npos) << votes;
+  }
+}
+
+TEST_F(EngineProtocols, Vote_results_of_many_large_values_are_bounded_and_hold_every_vote) {
+  attributes.batch_control = WYX_COLLECT_ALL_RESULT;
+  constexpr std::size_t kVoters = 40;
+  for (std::size_t who = 1; who <= kVoters; ++who) join(static_cast<int>(who));
+  request(1, MessageRequest{1, kPhases, "m"});
+  const Bytes value(kMaxStateValue, 'v');
+  for (std::size_t who = 1; who <= kVoters; ++who) vote(static_cast<int>(who), WYX_VOTE_APPROVE, value, value);
+  const auto& approved = std::get<ProtocolNotification>(*last.deliveries.at(0).what);
+  const std::vector<VoteResult>& results = approved.proposal.current_vote_results;
+  EXPECT_EQ(results.size(), kVoters);
+  std::size_t bytes = 0;
+  for (const VoteResult& r : results)
+    bytes += r.proposed_state.value_or("").size() + r.message.value_or("").size();
+  EXPECT_EQ(bytes, kMaxCollected);
+}
+
+}  // namespace
+}  // namespace gs::test
