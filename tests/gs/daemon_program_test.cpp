@@ -15,99 +15,76 @@
 namespace gs::daemon {
 namespace {
 
-using test_support::GsdProcess;
-using test_support::GsdRun;
-using test_support::RawConnection;
-using test_support::RawSession;
-using test_support::run_gsd;
-using test_support::TempDir;
+using namespace test_support;
 using testing::HasSubstr;
-using testing::MatchesRegex;
 
-constexpr Token kToken = 1;
-
-JoinRequest join_as(std::int16_t instance) {
+JoinRequest join_as(std::size_t instance) {
   JoinRequest join;
-  join.token = kToken;
-  join.instance = instance;
+  join.token = 1;
+  join.instance = static_cast<std::int16_t>(instance);
   join.attributes.group_name = "group";
   return join;
 }
 
-/// Reads events until `instance` has failed.
-void expect_failure_of(RawSession& survivor, std::int16_t instance) {
-  for (;;) {
-    const auto notify = survivor.event.receive<wire::Notify>();
-    const auto* n = std::get_if<ProtocolNotification>(&*notify.what);
-    if (n == nullptr || n->protocol != WYX_FAILURE_LEAVE) continue;
-    EXPECT_EQ(n->proposal.changing_providers->at(0).instance, instance);
-    return;
+/// A session with a provider.
+struct Member : RawSession {
+  Member(const GsdProcess& gsd, std::size_t instance) : RawSession(gsd.socket_path()) {
+    if (request.call(join_as(instance)) != WYX_OK) throw std::runtime_error("join");
   }
-}
+  wyx_rc_t send(const Bytes& message) { return request.call(MessageRequest{1, {}, message}); }
+  /// Reads events until one of this protocol has come; a failure on the way: its id.
+  std::optional<ProviderId> read_until(wyx_request_t protocol) {
+    std::optional<ProviderId> failed;
+    for (wyx_request_t seen = WYX_MERGE; seen != protocol;) {
+      const auto notify = event.receive<wire::Notify>();
+      const auto& n = std::get<ProtocolNotification>(*notify.what);
+      if (n.protocol == WYX_FAILURE_LEAVE) failed = n.proposal.changing_providers->at(0);
+      seen = n.protocol;
+    }
+    return failed;
+  }
+  void expect_failure_of(std::int16_t instance) {
+    EXPECT_EQ(read_until(WYX_FAILURE_LEAVE), (ProviderId{instance, 1}));
+  }
+};
 
-// ---------------------------------------------------------------------------------------------- clients, good and
-// bad
+bool exists(const std::string& path) { return access(path.c_str(), F_OK) == 0; }
 
-TEST(DaemonProgram, HostileConnections_AreClosedWithAReasonAndMembersGoOn) {
+// ----------------------------------------------------------------------------------------- clients, good and bad
+
+TEST(DaemonProgram, HostileAndDyingClients_AreClosedWithAReasonAndMembersGoOn) {
   GsdProcess gsd;
-  RawSession member(gsd.socket_path());
-  ASSERT_EQ(member.request.call(join_as(1)), WYX_OK);
-
-  RawConnection truncated(gsd.socket_path());
-  truncated.send_bytes("GSDP", 4);
-  truncated.wait_for_close();
-  EXPECT_TRUE(gsd.wait_for_log("closed: malformed: a packet that is cut off"));
-
-  RawConnection oversized(gsd.socket_path());
-  const std::string large(wire::kMaxPacket + 1, 'x');
-  oversized.send_bytes(large.data(), large.size());
-  oversized.wait_for_close();
-  EXPECT_TRUE(gsd.wait_for_log("closed: malformed: a packet over the limit"));
-
-  RawConnection out_of_order(gsd.socket_path());
-  out_of_order.send(wire::ClientMessage(wire::Quit{}));
-  out_of_order.wait_for_close();
-  EXPECT_TRUE(gsd.wait_for_log("closed: out of order"));
-
-  RawSession broken(gsd.socket_path());
-  ASSERT_EQ(broken.request.call(join_as(2)), WYX_OK);
-  broken.event.send_bytes("rubbish", 7);
+  Member member(gsd, 1);
+  const std::pair<std::string, const char*> first_packets[] = {
+      {"GSDP", "closed: malformed: a packet that is cut off"},
+      {std::string(wire::kMaxPacket + 1, 'x'), "closed: malformed: a packet over the limit"}};
+  for (const auto& [bytes, reason] : first_packets) {
+    RawConnection hostile(gsd.socket_path());
+    hostile.send_bytes(bytes);
+    hostile.wait_for_close();
+    EXPECT_TRUE(gsd.wait_for_log(reason));
+  }
+  Member broken(gsd, 2);
+  broken.event.send_bytes("rubbish");
   broken.request.wait_for_close();
-  expect_failure_of(member, 2);
-  EXPECT_EQ(member.request.call(MessageRequest{kToken, {}, "still here"}), WYX_OK);
-}
-
-TEST(DaemonProgram, ClientThatDies_IsSeenOnEitherChannel) {
-  GsdProcess gsd;
-  RawSession survivor(gsd.socket_path());
-  ASSERT_EQ(survivor.request.call(join_as(1)), WYX_OK);
-  RawSession a(gsd.socket_path());
-  ASSERT_EQ(a.request.call(join_as(2)), WYX_OK);
-  a.event.close();
-  expect_failure_of(survivor, 2);
-  RawSession b(gsd.socket_path());
-  ASSERT_EQ(b.request.call(join_as(3)), WYX_OK);
-  b.request.close();
-  expect_failure_of(survivor, 3);
+  member.expect_failure_of(2);
+  for (const auto channel : {&RawSession::event, &RawSession::request}) {
+    Member dying(gsd, 3);
+    (dying.*channel).close();
+    member.expect_failure_of(3);
+  }
+  EXPECT_EQ(member.send("still here"), WYX_OK);
 }
 
 TEST(DaemonProgram, FloodThatIsNotDrained_ClosesTheSlowClientAndHoldsUpNobody) {
   GsdProcess gsd({"--queue-bound", "1000000"});
-  RawSession sender(gsd.socket_path());
-  RawSession slow(gsd.socket_path());
-  ASSERT_EQ(sender.request.call(join_as(1)), WYX_OK);
-  ASSERT_EQ(slow.request.call(join_as(2)), WYX_OK);
-  bool failed = false;
+  Member sender(gsd, 1), slow(gsd, 2);
+  std::optional<ProviderId> failed;
   for (int i = 0; i < 1000 && !failed; ++i) {
-    ASSERT_EQ(sender.request.call(MessageRequest{kToken, {}, Bytes(kMaxProviderMessage, 'm')}), WYX_OK);
-    for (bool own = false; !own;) {
-      const auto notify = sender.event.receive<wire::Notify>();
-      const auto& n = std::get<ProtocolNotification>(*notify.what);
-      own = n.protocol == WYX_PROVIDER_MESSAGE;
-      failed = failed || n.protocol == WYX_FAILURE_LEAVE;
-    }
+    ASSERT_EQ(sender.send(Bytes(kMaxProviderMessage, 'm')), WYX_OK);
+    failed = sender.read_until(WYX_PROVIDER_MESSAGE);
   }
-  if (!failed) expect_failure_of(sender, 2);
+  if (!failed) sender.expect_failure_of(2);
   EXPECT_TRUE(gsd.wait_for_log("does not drain its notifications"));
   slow.event.wait_for_close();
 }
@@ -123,108 +100,82 @@ TEST(DaemonProgram, IdleClients_CostAtMost64KiBEach) {
   GsdProcess gsd;
   const auto resident = [&gsd] {
     std::ifstream statm("/proc/" + std::to_string(gsd.pid()) + "/statm");
-    std::size_t size = 0;
-    std::size_t pages = 0;
+    std::size_t size = 0, pages = 0;
     statm >> size >> pages;
     return pages * static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
   };
-  RawSession first(gsd.socket_path());
+  const RawSession first(gsd.socket_path());
   const std::size_t before = resident();
-  constexpr std::size_t kClients = 200;
-  std::vector<RawSession> clients;
-  clients.reserve(kClients);
-  for (std::size_t i = 0; i < kClients; ++i) {
-    clients.emplace_back(gsd.socket_path());
-    ASSERT_EQ(clients.back().request.call(join_as(static_cast<std::int16_t>(i))), WYX_OK);
-    ASSERT_EQ(clients.back().request.call(StateChangeRequest{kToken, {}, Bytes(1000, 's')}), WYX_OK);
+  std::vector<Member> clients;
+  for (std::size_t i = 0; i < 200; ++i) {
+    clients.emplace_back(gsd, i);
+    ASSERT_EQ(clients.back().request.call(StateChangeRequest{1, {}, Bytes(1000, 's')}), WYX_OK);
   }
-  EXPECT_LE(resident() - before, kClients * 64 * 1024);
+  EXPECT_LE(resident() - before, clients.size() * 64 * 1024);
 }
 
 TEST(DaemonProgram, DescriptorsThatRunOut_DelayNewClientsAndHurtNoOldOnes) {
   GsdProcess gsd;
   RawSession old_client(gsd.socket_path());
-  {
-    // The undefined-behaviour sanitizer needs descriptors of its own when it first sees a class: let it see them
-    // now.
-    RawSession first(gsd.socket_path());
-    EXPECT_EQ(first.request.call(join_as(0)), WYX_OK);
-  }
+  // The undefined-behaviour sanitizer needs descriptors of its own when it first sees a class: let it see them
+  // now.
+  { Member first(gsd, 0); }
   ASSERT_TRUE(gsd.wait_for_log("closed: the peer is gone"));
-  struct rlimit few {
-    64, 64
-  };
+  const rlimit few = {64, 64};
   ASSERT_EQ(prlimit(gsd.pid(), RLIMIT_NOFILE, &few, nullptr), 0);
   std::vector<RawConnection> crowd;
   for (int i = 0; i < 80; ++i) crowd.emplace_back(gsd.socket_path());
   ASSERT_TRUE(gsd.wait_for_log("cannot accept more connections for now"));
   EXPECT_EQ(old_client.request.call(join_as(1)), WYX_OK);
   crowd.clear();
-  RawSession late(gsd.socket_path());
-  EXPECT_EQ(late.request.call(join_as(2)), WYX_OK);
+  Member late(gsd, 2);
 }
 
-// ---------------------------------------------------------------------------------------------------- start and
-// stop
+// ------------------------------------------------------------------------------------------------ start and stop
 
-TEST(DaemonProgram, Sigterm_TellsClientsRemovesTheSocketAndExitsWithZero) {
-  GsdProcess gsd;
-  RawSession client(gsd.socket_path());
-  ASSERT_EQ(client.request.call(join_as(1)), WYX_OK);
-  client.event.receive<wire::Notify>();
-  gsd.kill(SIGTERM);
-  client.event.receive<wire::Farewell>();
-  client.event.wait_for_close();
-  client.request.wait_for_close();
-  EXPECT_EQ(gsd.wait(), 0);
-  struct stat found {};
-  EXPECT_NE(stat(gsd.socket_path().c_str(), &found), 0);
-}
-
-TEST(DaemonProgram, SigtermWithAClientThatTakesNothing_StillEnds) {
-  GsdProcess gsd;
-  RawSession sender(gsd.socket_path());
-  RawSession slow(gsd.socket_path());
-  ASSERT_EQ(sender.request.call(join_as(1)), WYX_OK);
-  ASSERT_EQ(slow.request.call(join_as(2)), WYX_OK);
-  for (int i = 0; i < 100; ++i) {
-    ASSERT_EQ(sender.request.call(MessageRequest{kToken, {}, Bytes(kMaxProviderMessage, 'm')}), WYX_OK);
-    while (std::get<ProtocolNotification>(*sender.event.receive<wire::Notify>().what).protocol !=
-           WYX_PROVIDER_MESSAGE) {
+TEST(DaemonProgram, Sigterm_TellsClientsRemovesTheSocketAndExitsWithZero_ThoughOneTakesNothing) {
+  for (const bool stalled : {false, true}) {
+    GsdProcess gsd;
+    Member client(gsd, 1);
+    client.read_until(WYX_JOIN);
+    std::optional<Member> slow;
+    if (stalled) slow.emplace(gsd, 2);
+    for (int i = 0; stalled && i < 100; ++i) {
+      ASSERT_EQ(client.send(Bytes(kMaxProviderMessage, 'm')), WYX_OK);
+      client.read_until(WYX_PROVIDER_MESSAGE);
     }
+    gsd.kill(SIGTERM);
+    client.event.receive<wire::Farewell>();
+    client.event.wait_for_close();
+    client.request.wait_for_close();
+    EXPECT_EQ(gsd.wait(), 0);
+    EXPECT_FALSE(exists(gsd.socket_path()));
   }
-  gsd.kill(SIGTERM);
-  EXPECT_EQ(gsd.wait(), 0);
 }
 
-TEST(DaemonProgram, SecondInstance_IsRefusedWithAClearLineAndTheFirstServesOn) {
+TEST(DaemonProgram, SecondInstanceOrPathOfSomethingElse_IsRefusedWithAClearLineAndAllIsLeftAsItWas) {
   GsdProcess gsd;
-  const GsdRun second = run_gsd({"--socket-path", gsd.socket_path()});
-  EXPECT_EQ(second.status, 1);
-  EXPECT_EQ(second.err,
-            "gsd: another gsd (pid " + std::to_string(gsd.pid()) + ") already serves " + gsd.socket_path() + "\n");
-  RawSession client(gsd.socket_path());
-  EXPECT_EQ(client.request.call(join_as(1)), WYX_OK);
+  const std::string socket = gsd.socket_path(), file = socket + ".precious";
+  std::ofstream(file) << "data";
+  const std::pair<std::string, std::string> cases[] = {
+      {socket, "gsd: another gsd (pid " + std::to_string(gsd.pid()) + ") already serves " + socket + "\n"},
+      {file, "gsd: " + file + " exists and is not a socket\n"}};
+  for (const auto& [path, line] : cases) {
+    const GsdRun second = run_gsd({"--socket-path", path});
+    EXPECT_EQ(second.status, 1);
+    EXPECT_EQ(second.err, line);
+  }
+  EXPECT_TRUE(std::ifstream(file).good());
+  Member client(gsd, 1);
 }
 
 TEST(DaemonProgram, SocketOfAKilledDaemon_IsReplaced) {
   GsdProcess gsd;
   gsd.kill(SIGKILL);
   EXPECT_EQ(gsd.wait(), -1);
-  struct stat found {};
-  ASSERT_EQ(stat(gsd.socket_path().c_str(), &found), 0) << "a stale socket is what this test is about";
+  ASSERT_TRUE(exists(gsd.socket_path())) << "a stale socket is what this test is about";
   gsd.restart();
-  RawSession client(gsd.socket_path());
-  EXPECT_EQ(client.request.call(join_as(1)), WYX_OK);
-}
-
-TEST(DaemonProgram, PathOfSomethingElse_IsLeftAlone) {
-  TempDir dir;
-  std::ofstream(dir / "precious") << "data";
-  const GsdRun run = run_gsd({"--socket-path", dir / "precious"});
-  EXPECT_EQ(run.status, 1);
-  EXPECT_EQ(run.err, "gsd: " + (dir / "precious") + " exists and is not a socket\n");
-  EXPECT_TRUE(std::ifstream(dir / "precious").good());
+  Member client(gsd, 1);
 }
 
 TEST(DaemonProgram, Socket_IsForItsOwnerAndTheAccessGroupOnly) {
@@ -237,38 +188,16 @@ TEST(DaemonProgram, Socket_IsForItsOwnerAndTheAccessGroupOnly) {
   EXPECT_EQ(mode_of(GsdProcess({"--access-group", std::to_string(getgid())})), 0660u);
 }
 
-// -------------------------------------------------------------------------------------------------- configuration
+// ------------------------------------------------------------------------------------------------- configuration
 
 TEST(DaemonOptions, HelpAndVersion_AreAnsweredOnStandardOutput) {
-  const GsdRun version = run_gsd({"--version"});
+  const GsdRun version = run_gsd({"--version"}), help = run_gsd({"--help"});
   EXPECT_EQ(version.status, 0);
-  EXPECT_THAT(version.out, MatchesRegex("gsd [0-9]+\\.[0-9]+\\.[0-9]+\n"));
-  const GsdRun help = run_gsd({"--help"});
+  EXPECT_THAT(version.out, testing::MatchesRegex("gsd [0-9]+\\.[0-9]+\\.[0-9]+\n"));
   EXPECT_EQ(help.status, 0);
-  for (const char* option :
-       {"--config", "--socket-path", "--access-group", "--node-number", "--queue-bound", "--log-level", "--log-file", "--daemon"}) {
+  for (const char* option : {"--config", "--socket-path", "--access-group", "--node-number", "--queue-bound",
+                             "--log-level", "--log-file", "--daemon"})
     EXPECT_THAT(help.out, HasSubstr(option));
-  }
-}
-
-TEST(DaemonOptions, WrongOption_IsOneLineAndStatusTwo) {
-  const std::pair<std::vector<std::string>, std::string> cases[] = {
-      {{"--colour"}, "--colour"},
-      {{"--config"}, "--config"},
-      {{"--node-number", "32768"}, "--node-number: must be a whole number from 0 to 32767, not '32768'"},
-      {{"--queue-bound", "1k"}, "--queue-bound: must be"},
-      {{"--log-level", "loud"}, "--log-level: must be error, warning, info or debug"},
-      {{"--access-group", "no such group"}, "--access-group: there is no group 'no such group'"},
-      {{"--socket-path", std::string(108, 's')}, "--socket-path: must be a path of 1 to 107 characters"},
-      {{"--config", "/nonexistent/gsd.toml"}, "/nonexistent/gsd.toml: cannot be read: No such file or directory"},
-  };
-  for (const auto& [arguments, what] : cases) {
-    const GsdRun run = run_gsd(arguments);
-    EXPECT_EQ(run.status, 2) << run.err;
-    EXPECT_THAT(run.err, testing::StartsWith("gsd: "));
-    EXPECT_THAT(run.err, HasSubstr(what));
-    EXPECT_EQ(run.err.find('\n'), run.err.size() - 1) << run.err;
-  }
 }
 
 class DaemonConfig : public testing::Test {
@@ -277,80 +206,79 @@ class DaemonConfig : public testing::Test {
     std::ofstream(path_) << content;
     return path_;
   }
-  std::string error_of(const std::string& content) {
-    try {
-      read_config(write(content), Options());
-    } catch (const OptionError& error) {
-      return std::string(error.what()).substr(path_.size());
-    }
-    return "accepted";
+  static auto values(const Options& o) {
+    return std::tuple(o.socket_path, o.access_group, o.node_number, o.queue_bound, o.log_level, o.log_file);
   }
 
   TempDir dir_;
   const std::string path_ = dir_ / "gsd.toml";
 };
 
+TEST_F(DaemonConfig, WrongOptionOrFile_IsOneLineAndStatusTwo) {
+  const std::string range = "node-number: must be a whole number from 0 to 32767, not ";
+  const std::pair<std::vector<std::string>, std::string> options[] = {
+      {{"--colour"}, "--colour"},
+      {{"--config"}, "--config"},
+      {{"--node-number", "32768"}, "--" + range + "'32768'"},
+      {{"--queue-bound", "1k"}, "--queue-bound: must be"},
+      {{"--log-level", "loud"}, "--log-level: must be error, warning, info or debug"},
+      {{"--access-group", "no such group"}, "--access-group: there is no group 'no such group'"},
+      {{"--socket-path", std::string(108, 's')}, "--socket-path: must be a path of 1 to 107 characters"},
+      {{"--config", "/nonexistent/gsd.toml"}, "/nonexistent/gsd.toml: cannot be read: No such file or directory"}};
+  const std::pair<std::string, std::string> files[] = {
+      {"\nsocket-path = 3\n", ":2: socket-path: must be a text in quotes"},
+      {"node-number = \"3\"\n", ":1: node-number: must be a whole number"},
+      {"\n\nnode-number = -1\n", ":3: " + range + "'-1'"},
+      {"colour = 3\n", ":1: unknown setting 'colour'"},
+      {"socket-path = \"/x\"\nsocket-path = \"/y\"\n", ":2: "},
+      {"log-level = \"info\"\nnode-number = = 3\n", ":2: "}};
+  const auto expect_refused = [](const std::vector<std::string>& arguments, const std::string& what) {
+    const GsdRun run = run_gsd(arguments);
+    EXPECT_EQ(run.status, 2) << run.err;
+    EXPECT_THAT(run.err, testing::StartsWith("gsd: "));
+    EXPECT_THAT(run.err, HasSubstr(what));
+    EXPECT_EQ(run.err.find('\n'), run.err.size() - 1) << run.err;
+  };
+  for (const auto& [arguments, what] : options) expect_refused(arguments, what);
+  for (const auto& [content, what] : files) expect_refused({"--config", write(content)}, path_ + what);
+}
+
 TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const std::string path = write(
-      "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\nlog-level = "
-      "\"debug\"\nlog-file = \"/tmp/log\"\n");
+      "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\n"
+      "log-level = \"debug\"\nlog-file = \"/tmp/log\"\n");
   const char* argv[] = {"gsd", "--config", path.c_str(), "--node-number", "13"};
   const auto options = parse_options(5, argv);
   ASSERT_TRUE(options);
-  EXPECT_EQ(options->socket_path, "/tmp/x");
-  EXPECT_EQ(options->access_group, "0");
-  EXPECT_EQ(options->node_number, 13u);
-  EXPECT_EQ(options->queue_bound, 100'000u);
-  EXPECT_EQ(options->log_level, spdlog::level::debug);
-  EXPECT_EQ(options->log_file, "/tmp/log");
+  EXPECT_EQ(values(*options), std::tuple("/tmp/x", "0", 13u, 100'000u, spdlog::level::debug, "/tmp/log"));
 }
 
-TEST_F(DaemonConfig, WrongFile_IsNamedWithItsLine) {
-  EXPECT_EQ(error_of("\nsocket-path = 3\n"), ":2: socket-path: must be a text in quotes");
-  EXPECT_EQ(error_of("node-number = \"3\"\n"), ":1: node-number: must be a whole number");
-  EXPECT_EQ(error_of("\n\nnode-number = -1\n"),
-            ":3: node-number: must be a whole number from 0 to 32767, not '-1'");
-  EXPECT_EQ(error_of("colour = 3\n"), ":1: unknown setting 'colour'");
-  EXPECT_THAT(error_of("socket-path = \"/x\"\nsocket-path = \"/y\"\n"), HasSubstr(":2: "));
-  EXPECT_THAT(error_of("log-level = \"info\"\nnode-number = = 3\n"), HasSubstr(":2: "));
-  EXPECT_EQ(run_gsd({"--config", write("node-number = 99999\n")}).status, 2);
-}
-
-TEST_F(DaemonConfig, Sample_SaysTheDefaults) {
+TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
   Options changed;
-  changed.socket_path.clear();
-  changed.access_group = "changed";
+  changed.socket_path = changed.access_group = changed.log_file = "changed";
   changed.node_number = 99;
   changed.queue_bound = 0;
   changed.log_level = spdlog::level::off;
-  changed.log_file = "changed";
-  const Options sample = read_config(SAMPLE_CONFIG, changed);
   const Options defaults;
-  EXPECT_EQ(sample.socket_path, defaults.socket_path);
-  EXPECT_EQ(sample.access_group, defaults.access_group);
-  EXPECT_EQ(sample.node_number, defaults.node_number);
-  EXPECT_EQ(sample.queue_bound, defaults.queue_bound);
-  EXPECT_EQ(sample.log_level, defaults.log_level);
-  EXPECT_EQ(sample.log_file, defaults.log_file);
-}
+  EXPECT_EQ(values(read_config(SAMPLE_CONFIG, changed)), values(defaults));
 
-TEST(DaemonManPage, EveryOption_IsThereWithItsDefault) {
   std::ifstream file(MAN_PAGE);
   const std::string page{std::istreambuf_iterator<char>(file), {}};
-  const auto entry_of = [&page](const std::string& option) {
-    const auto start = page.find(".BI \\-\\-" + option + " ");
-    return start == std::string::npos ? "" : page.substr(start, page.find(".TP", start) - start);
-  };
-  const Options defaults;
-  EXPECT_THAT(entry_of("config"), HasSubstr("TOML"));
-  EXPECT_THAT(entry_of("ready\\-fd"), HasSubstr("ready"));
-  EXPECT_THAT(entry_of("socket\\-path"), HasSubstr("Default:\n.IR " + defaults.socket_path + " "));
-  EXPECT_THAT(entry_of("access\\-group"), HasSubstr("Default: none"));
-  EXPECT_THAT(entry_of("node\\-number"), HasSubstr("Default: " + std::to_string(defaults.node_number) + "."));
-  EXPECT_THAT(entry_of("queue\\-bound"), HasSubstr("Default: " + std::to_string(defaults.queue_bound) + "."));
-  EXPECT_THAT(entry_of("log\\-file"), HasSubstr("Default: none"));
-  EXPECT_THAT(entry_of("log\\-level"), HasSubstr(std::string("Default: ") +
-                                                 spdlog::level::to_string_view(defaults.log_level).data() + "."));
+  const std::string level = spdlog::level::to_string_view(defaults.log_level).data();
+  const std::pair<const char*, std::string> entries[] = {
+      {"config", "TOML"},
+      {"ready\\-fd", "ready"},
+      {"socket\\-path", "Default:\n.IR " + defaults.socket_path + " "},
+      {"access\\-group", "Default: none"},
+      {"node\\-number", "Default: " + std::to_string(defaults.node_number) + "."},
+      {"queue\\-bound", "Default: " + std::to_string(defaults.queue_bound) + "."},
+      {"log\\-file", "Default: none"},
+      {"log\\-level", "Default: " + level + "."}};
+  for (const auto& [option, text] : entries) {
+    const auto start = page.find(std::string(".BI \\-\\-") + option + " ");
+    ASSERT_NE(start, std::string::npos) << option;
+    EXPECT_THAT(page.substr(start, page.find(".TP", start) - start), HasSubstr(text));
+  }
 }
 
 }  // namespace
