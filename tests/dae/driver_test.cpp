@@ -1,22 +1,23 @@
-// KPLDriver: the stop code under signals and threads, and drivers that were really started.
+// KPLDriver: the stop code under signals and threads, and drivers that start as daemons. Under a master it is the
+// example daemon that is tested.
 #include <errno.h>
+#include <fcntl.h>
 #include <signal.h>
-#include <stdlib.h>
 #include <sys/ipc.h>
+#include <sys/prctl.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <atomic>
+#include <fstream>
 #include <thread>
 
+#include "dae/dae_internal.h"
+#include "gscl/GSDebug.h"
 #include "gscl/KPLDriver.h"
-#include "started.h"
 
 namespace {
-
-using testing::ElementsAre;
-using testing::Pair;
-
-const std::string kProbe = "driver_probe";
 
 class Driver : public zelt_gscl_V1::KPLDriver {
  public:
@@ -28,22 +29,21 @@ class Driver : public zelt_gscl_V1::KPLDriver {
   ~Driver() override { sigaction(SIGTERM, &before_, nullptr); }
 
   void stopCancel(int) override {
-    if (cancel_code != 0) setStopCode(cancel_code, cancel_text.c_str());
+    if (*cancel_text != '\0') setStopCode(7, cancel_text);
   }
 
-  std::string msg() {
+  /// Code and text.
+  std::string stop() {
     const char* text = getStopMsg();
-    return text != nullptr ? text : "(null)";
+    return std::to_string(getStopCode()) + " " + (text != nullptr ? text : "(null)");
   }
 
   using KPLDriver::_stopLocker;
-  using KPLDriver::stub_longStatus;
-  using KPLDriver::stub_otherReq;
+  using KPLDriver::err_detail;
   using KPLDriver::stub_stopForced;
   using KPLDriver::stub_stopNormal;
 
-  int cancel_code = 0;
-  std::string cancel_text;
+  const char* cancel_text = "";
 
  private:
   struct sigaction before_;
@@ -53,37 +53,22 @@ TEST(DriverStopCode, The_first_one_stays_until_it_is_cleared) {
   Driver driver;
   EXPECT_EQ(zelt_gscl_V1::KPLDriver::theKPLDriver(), &driver);
   EXPECT_EQ(driver.getKPLDescriptor(), -1);
-  EXPECT_EQ(driver.getStopCode(), 0);
-  EXPECT_EQ(driver.msg(), "");
+  EXPECT_EQ(driver.stop(), "0 ");
   driver.setStopCode(0, "zero");
-  EXPECT_EQ(driver.getStopCode(), 1);
   driver.setStopCode(5, "later");
-  EXPECT_EQ(driver.getStopCode(), 1);
-  EXPECT_EQ(driver.msg(), "zero");
+  EXPECT_EQ(driver.stop(), "1 zero");
   driver.clearStopCode();
-  EXPECT_EQ(driver.getStopCode(), 0);
-  EXPECT_EQ(driver.msg(), "(null)");
-  driver.setStopCode(5, nullptr);
-  EXPECT_EQ(driver.getStopCode(), 5);
-  EXPECT_EQ(driver.msg(), "(null)");
-}
-
-TEST(DriverStopCode, Stop_requests_record_their_kind_unless_the_handler_did) {
-  Driver driver;
+  EXPECT_EQ(driver.stop(), "0 (null)");
   Driver::stub_stopNormal();
-  EXPECT_EQ(driver.getStopCode(), -1);
-  EXPECT_EQ(driver.msg(), "stopNormal");
+  EXPECT_EQ(driver.stop(), "-1 stopNormal");
   driver.clearStopCode();
   Driver::stub_stopForced();
-  EXPECT_EQ(driver.getStopCode(), -2);
-  EXPECT_EQ(driver.msg(), "stopForced");
+  EXPECT_EQ(driver.stop(), "-2 stopForced");
   driver.clearStopCode();
-  driver.cancel_code = 7;
-  driver.cancel_text = std::string(300, 't');
+  const std::string text(300, 't');
+  driver.cancel_text = text.c_str();
   raise(SIGTERM);
-  EXPECT_EQ(driver.getStopCode(), 7);
-  EXPECT_EQ(driver.msg(), std::string(127, 't'));
-  EXPECT_EQ(Driver::stub_otherReq(300, 0, 0, nullptr, 0), 0);
+  EXPECT_EQ(driver.stop(), "7 " + std::string(127, 't'));
 }
 
 TEST(DriverStopCode, A_SIGTERM_under_the_stop_lock_is_neither_stuck_nor_lost) {
@@ -94,17 +79,15 @@ TEST(DriverStopCode, A_SIGTERM_under_the_stop_lock_is_neither_stuck_nor_lost) {
   EXPECT_EQ(errno, EDOM);
   EXPECT_EQ(driver.getStopCode(), -3);  // at once
   driver._stopLocker.WriteUnlock();
-  EXPECT_EQ(driver.msg(), "stopCancel");
-  EXPECT_EQ(driver.msg(), "stopCancel");
+  for (int i = 0; i < 2; ++i) EXPECT_EQ(driver.stop(), "-3 stopCancel");
   driver.clearStopCode();
 
   raise(SIGTERM);
   driver.clearStopCode();  // before anybody read the text
-  EXPECT_EQ(driver.getStopCode(), 0);
-  EXPECT_EQ(driver.msg(), "(null)");
+  EXPECT_EQ(driver.stop(), "0 (null)");
   driver.setStopCode(5, "five");
   raise(SIGTERM);
-  EXPECT_EQ(driver.msg(), "five");
+  EXPECT_EQ(driver.stop(), "5 five");
 }
 
 TEST(DriverStopCode, Code_and_text_belong_together_whatever_the_threads_do) {
@@ -124,105 +107,66 @@ TEST(DriverStopCode, Code_and_text_belong_together_whatever_the_threads_do) {
       driver.clearStopCode();
     });
     for (std::thread* thread : {&setter, &cancelled, &cleaner}) thread->join();
-    const int code = driver.getStopCode();
-    ASSERT_EQ(driver.msg(), code == 5 ? "five" : code == -3 ? "stopCancel" : "(null)") << "code " << code;
+    ASSERT_THAT(driver.stop(), testing::AnyOf("5 five", "-3 stopCancel", "0 (null)"));
     driver.clearStopCode();
-    ASSERT_EQ(driver.msg(), "(null)");
+    ASSERT_EQ(driver.stop(), "0 (null)");
   }
+}
+
+std::string traced;
+
+/// Starts the driver in this process; the result, what it traced, and the error.
+std::string start(Driver* driver, const char* excl_file) {
+  traced.clear();
+  const int code = driver->InitKPL(1, excl_file, 'd', nullptr);
+  return std::to_string(code) + " " + traced + driver->err_detail.dae_error_string + "\n";
+}
+
+/// What `routine` reports, which runs in a process of its own, and perhaps becomes a daemon.
+template <class Routine>
+std::string reports_of(Routine routine) {
+  char path[] = "/tmp/driver_XXXXXX";
+  close(mkstemp(path));
+  prctl(PR_SET_CHILD_SUBREAPER, 1);  // so that the daemon can be waited for
+  if (fork() == 0) {
+    GSSetDebugLevel(GSCL_TRC_WARNING);
+    GSSetTraceRtn([](int, char* text) { traced = text; });
+    Driver driver;
+    routine(&driver, [path](const std::string& text) { std::ofstream(path, std::ios::app) << text; });
+    _exit(0);
+  }
+  while (waitpid(-1, nullptr, 0) > 0) {
+  }
+  std::ifstream file(path);
+  unlink(path);
+  return {std::istreambuf_iterator<char>(file), {}};
 }
 
 TEST(DriverFromShell, Has_no_channel_and_stops_by_SIGTERM) {
-  Started daemon;
-  EXPECT_EQ(daemon.from_shell(program(kProbe), {"plain"}), 0);
-  EXPECT_EQ(daemon.start["code"], "0") << daemon.start["error"];
-  EXPECT_EQ(daemon.start["fd"], "-1");
-  EXPECT_EQ(daemon.start["error"], "dae_init inited fd=-1, sema_key=ffffffff\n");
-  EXPECT_FALSE(daemon.descriptors().contains(50));
-  kill(daemon.pid(), SIGTERM);
-  EXPECT_EQ(daemon.report(), "stop -3 stopCancel");
-  daemon.command("again");
-  const auto again = daemon.report_fields();
-  EXPECT_EQ(again.at("code"), "1001");
-  EXPECT_EQ(again.at("error"), "dae_init failed with sema_key=ffffffff\nDAE_EM_NOTAGAIN");
+  EXPECT_EQ(
+      reports_of([](Driver* driver, auto report) {
+        dup2(2, 50);
+        report(start(driver, nullptr));
+        report(fcntl(50, F_GETFD) == -1 ? "closed\n" : "inherited\n");
+        raise(SIGTERM);
+        report(driver->stop() + "\n");
+        report(start(driver, nullptr));
+        report(dae_prof__INTERNAL__.per_parent[DAE_I_KPL].keep_open_call == 1 ? "kept under KPL" : "not kept");
+      }),
+      "0 dae_init inited fd=-1, sema_key=ffffffff\n\nclosed\n-3 stopCancel\n"
+      "1001 dae_init failed with sema_key=ffffffff\nDAE_EM_NOTAGAIN\nkept under KPL");
 }
 
-TEST(DriverFromInetd, Is_refused) {
-  Started daemon;
-  EXPECT_EQ(WEXITSTATUS(daemon.from_inetd(program(kProbe), {"plain"})), 3);
-  EXPECT_EQ(daemon.start["code"], "1003");
-}
-
-class DriverUnderMaster : public testing::Test {
- protected:
-  bool begin(const Started::Arguments& arguments) {
-    if (!daemon.from_master("master", program(kProbe), arguments)) return false;
-    EXPECT_EQ(daemon.start["code"], "0") << daemon.start["error"];
-    return true;
-  }
-
-  Requester::Answer ask(const std::string& request) {
-    EXPECT_EQ(send(daemon.channel(), request.data(), request.size(), 0), static_cast<ssize_t>(request.size()));
-    return requester.answer();
-  }
-
-  Started daemon;
-  Requester requester;
-};
-
-TEST_F(DriverUnderMaster, Without_overrides_everything_succeeds_and_stops_are_recorded) {
-  if (!begin({"plain"})) GTEST_SKIP() << "needs root and PID namespaces";
-  const auto descriptors = daemon.descriptors();
-  EXPECT_TRUE(descriptors.at(std::stoi(daemon.start["fd"])).starts_with("socket:"));
-  EXPECT_EQ(descriptors.at(50), "/dev/zero");  // under KPL, what is inherited stays
-  for (const auto& request : {requester.request(2, 1), requester.request(4, 0, 1), requester.request(4, 0, 0),
-                              requester.request(5), requester.request(256, 1, 1, "data")}) {
-    EXPECT_EQ(ask(request).code, 0);
-  }
-  EXPECT_EQ(ask(requester.request(1, 0)).code, 0);
-  EXPECT_EQ(daemon.report(), "stop -1 stopNormal");
-  EXPECT_EQ(ask(requester.request(1, 1)).code, 0);
-  EXPECT_EQ(daemon.report(), "stop -2 stopForced");
-  kill(daemon.pid(), SIGTERM);
-  EXPECT_EQ(daemon.report(), "stop -3 stopCancel");
-  EXPECT_TRUE(daemon.is_alive());
-}
-
-TEST_F(DriverUnderMaster, Overrides_get_their_requests) {
-  if (!begin({"own"})) GTEST_SKIP() << "needs root and PID namespaces";
-  Requester::Answer answer = ask(requester.request(2, 1));
-  EXPECT_EQ(answer.code, 0);
-  EXPECT_THAT(answer.lines, ElementsAre(Pair("", "own line")));
-  ask(requester.request(4, 1, 1));
-  EXPECT_EQ(daemon.report(), "traceBegin 1");
-  ask(requester.request(4, 0, 0));
-  EXPECT_EQ(daemon.report(), "traceEnd");
-  ask(requester.request(5));
-  EXPECT_EQ(daemon.report(), "refresh");
-  answer = ask(requester.request(400, 1, 0, "abc"));
-  EXPECT_EQ(answer.code, -1);
-  EXPECT_EQ(answer.message, "refused by me\n");
-  EXPECT_THAT(answer.interim, ElementsAre("400 1 0 abc"));
-  EXPECT_EQ(ask(requester.request(400, 1, 1, "abc")).code, -9129);
-  ask(requester.request(1, 1));
-  EXPECT_EQ(daemon.report(), "stop 7 own reason");
-  kill(daemon.pid(), SIGTERM);
-  EXPECT_EQ(daemon.report(), "stop 15 own cancel");
-}
-
-TEST_F(DriverUnderMaster, A_second_instance_is_refused_with_the_locks_key) {
-  char path[] = "/tmp/driver_lock_XXXXXX";
-  close(mkstemp(path));
-  if (!begin({"plain", path})) {
-    unlink(path);
-    GTEST_SKIP() << "needs root and PID namespaces";
-  }
-  Started second;
-  EXPECT_TRUE(second.from_master("master", program(kProbe), {"plain", path}));
-  EXPECT_EQ(second.start["code"], "1017");
-  EXPECT_EQ(second.start["key"], std::to_string(ftok(path, 'd')));
-  daemon.command("exit");
-  EXPECT_EQ(daemon.report(), "ended 0");
-  unlink(path);
+TEST(DriverFromInetd, Is_refused_with_the_locks_key) {
+  char expected[100];
+  snprintf(expected, sizeof expected, "1003 dae_init failed with sema_key=%x\nDAE_EM_PWRONG_INETD\n",
+           ftok("/", 'd'));
+  EXPECT_EQ(reports_of([](Driver* driver, auto report) {
+              const int service = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+              for (const int fd : {0, 1, 2}) dup2(service, fd);
+              report(start(driver, "/"));
+            }),
+            expected);
 }
 
 }  // namespace

@@ -2,13 +2,9 @@
 #include "kpl.h"
 
 #include <errno.h>
-#include <fcntl.h>
 #include <stdlib.h>
-#include <sys/stat.h>
 
-#include <chrono>
 #include <filesystem>
-#include <functional>
 #include <thread>
 #include <vector>
 
@@ -19,15 +15,13 @@ namespace {
 using testing::ElementsAre;
 
 size_t open_descriptors() {
-  size_t count = 0;
-  for ([[maybe_unused]] const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) ++count;
-  return count;
+  const std::filesystem::directory_iterator entries("/proc/self/fd");
+  return static_cast<size_t>(std::distance(begin(entries), end(entries)));
 }
 
 /// Begins the answer to a request with that return address.
-kplhdr* begin(const sockaddr_un& retaddr) {
-  // Requests lie in their buffer at any alignment.
-  static char request[1 + sizeof(kplhdr)];
+kplhdr* begin_answer(const sockaddr_un& retaddr) {
+  char request[1 + sizeof(kplhdr)];  // requests lie in their buffer at any alignment
   kplhdr header = {};
   header.retaddr = retaddr;
   header.dversion = 5;
@@ -36,50 +30,48 @@ kplhdr* begin(const sockaddr_un& retaddr) {
 }
 
 int reply(kplhdr* header, int cont, const std::string& body = "") {
-  std::string bytes(sizeof(kplhdr), '#');
-  bytes += body;
+  const std::string own(sizeof(kplhdr), '#');
+  std::string bytes = own + body;
   const int result = kplsrpy(header, bytes.data(), static_cast<int>(bytes.size()), cont);
-  EXPECT_EQ(bytes.substr(0, sizeof(kplhdr)), std::string(sizeof(kplhdr), '#'));  // the caller's stays as it is
+  EXPECT_EQ(bytes, own + body);  // the caller's stays as it is
   return result;
 }
 
-kplhdr header_of(const std::string& packet) {
-  kplhdr header = {};
-  memcpy(&header, packet.data(), std::min(packet.size(), sizeof header));
-  return header;
+sockaddr_un address_of(const std::string& path) {
+  sockaddr_un address = {};
+  address.sun_family = AF_UNIX;
+  path.copy(address.sun_path, sizeof address.sun_path);
+  return address;
 }
 
-TEST(KplReply, Packets_arrive_with_the_requests_header) {
+TEST(KplReply, Packets_arrive_in_order_with_the_requests_header) {
+  const Datagram requester;
+  std::vector<std::string> received(300);  // far more than a socket's queue takes
+  std::thread reader([&] {
+    for (std::string& packet : received) {
+      if ((packet = requester.receive()).empty()) break;
+    }
+  });
   const size_t before = open_descriptors();
-  {
-    Datagram requester;
-    kplhdr* header = begin(requester.address());
-    EXPECT_EQ(reply(header, KPL_CONT_MESSAGE, "interim"), 0);
-    EXPECT_EQ(reply(header, KPL_CONT_END, "last"), 0);
-    const std::string interim = requester.receive();
-    const std::string last = requester.receive();
-    EXPECT_EQ(interim.substr(sizeof(kplhdr)), "interim");
-    EXPECT_EQ(last.substr(sizeof(kplhdr)), "last");
-    EXPECT_EQ(header_of(interim).cont, KPL_CONT_MESSAGE);
-    EXPECT_EQ(header_of(last).cont, KPL_CONT_END);
-    EXPECT_EQ(header_of(last).dversion, 5);
-    EXPECT_EQ(memcmp(header_of(last).retaddr.sun_path, requester.address().sun_path, 108), 0);
-  }
+  kplhdr* header = begin_answer(requester.address());
+  const auto cont = [&](size_t i) { return i == received.size() - 1 ? KPL_CONT_END : KPL_CONT_STATUS; };
+  for (size_t i = 0; i < received.size(); ++i) EXPECT_EQ(reply(header, cont(i), std::to_string(i)), 0);
   EXPECT_EQ(open_descriptors(), before);
+  reader.join();
+  for (size_t i = 0; i < received.size(); ++i) {
+    ASSERT_EQ(received[i].substr(sizeof(kplhdr)), std::to_string(i));
+    kplhdr sent = {requester.address(), {}, 5, static_cast<short>(cont(i))};
+    EXPECT_EQ(memcmp(received[i].data(), &sent, sizeof sent), 0);
+  }
 }
 
 TEST(KplReply, A_path_may_fill_the_address_without_an_end) {
   char folder[] = "/tmp/kpl_XXXXXX";
   ASSERT_NE(mkdtemp(folder), nullptr);
-  sockaddr_un address = {};
-  address.sun_family = AF_UNIX;
-  std::string path = std::string(folder) + "/";
-  path.append(sizeof address.sun_path - path.size(), 'p');
-  path.copy(address.sun_path, sizeof address.sun_path);
+  const sockaddr_un address = address_of(folder + std::string("/") + std::string(92, 'p'));
   const int fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-  ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-
-  EXPECT_EQ(reply(begin(address), KPL_CONT_END), 0);
+  EXPECT_EQ(bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+  EXPECT_EQ(reply(begin_answer(address), KPL_CONT_END), 0);
   char packet[200];
   EXPECT_EQ(recv(fd, packet, sizeof packet, MSG_DONTWAIT), static_cast<ssize_t>(sizeof(kplhdr)));
   close(fd);
@@ -88,13 +80,9 @@ TEST(KplReply, A_path_may_fill_the_address_without_an_end) {
 
 TEST(KplReply, Requesters_that_nobody_is_cost_nothing) {
   const size_t before = open_descriptors();
-  sockaddr_un gone;
-  {
-    Datagram requester;
-    gone = requester.address();
-  }
+  const sockaddr_un gone = Datagram().address();
   const auto error_of = [](const sockaddr_un& address) {
-    kplhdr* header = begin(address);
+    kplhdr* header = begin_answer(address);
     EXPECT_EQ(reply(header, KPL_CONT_STATUS), -1);
     const int error = errno;
     EXPECT_EQ(reply(header, KPL_CONT_END), -1);
@@ -102,47 +90,20 @@ TEST(KplReply, Requesters_that_nobody_is_cost_nothing) {
   };
   EXPECT_EQ(error_of(gone), ECONNREFUSED);
   EXPECT_EQ(error_of({}), EDESTADDRREQ);
-  sockaddr_un nameless = {};
-  nameless.sun_family = AF_UNIX;
-  EXPECT_EQ(error_of(nameless), EDESTADDRREQ);
-  nameless.sun_path[0] = '/';
-  nameless.sun_path[1] = 'x';
-  EXPECT_EQ(error_of(nameless), ENOENT);
+  EXPECT_EQ(error_of(address_of("")), EDESTADDRREQ);
+  EXPECT_EQ(error_of(address_of("/x/y")), ENOENT);
   char packet[sizeof(kplhdr)] = {};
-  EXPECT_EQ(kplsrpy(begin(gone), packet, sizeof packet - 1, 0), -1);
+  EXPECT_EQ(kplsrpy(begin_answer({}), packet, sizeof packet - 1, KPL_CONT_END), -1);
   EXPECT_EQ(errno, EINVAL);
 
-  Datagram there;  // the one before is forgotten
-  EXPECT_EQ(reply(begin(there.address()), KPL_CONT_END), 0);
+  const Datagram there;  // the ones before are forgotten
+  EXPECT_EQ(reply(begin_answer(there.address()), KPL_CONT_END), 0);
   EXPECT_EQ(open_descriptors(), before + 1);
 }
 
-TEST(KplReply, Slow_requesters_lose_nothing) {
-  constexpr int kPackets = 300;  // far more than a socket's queue takes
-  Datagram requester;
-  std::vector<int> received;
-  std::thread reader([&] {
-    while (received.size() < kPackets) {
-      const std::string packet = requester.receive();
-      if (packet.size() != sizeof(kplhdr) + sizeof(int)) break;
-      received.emplace_back();
-      memcpy(&received.back(), packet.data() + sizeof(kplhdr), sizeof(int));
-    }
-  });
-  kplhdr* header = begin(requester.address());
-  for (int i = 0; i < kPackets; ++i) {
-    EXPECT_EQ(reply(header, i == kPackets - 1 ? KPL_CONT_END : KPL_CONT_STATUS,
-                    std::string(reinterpret_cast<const char*>(&i), sizeof i)),
-              0);
-  }
-  reader.join();
-  ASSERT_EQ(received.size(), static_cast<size_t>(kPackets));
-  for (int i = 0; i < kPackets; ++i) EXPECT_EQ(received[static_cast<size_t>(i)], i);
-}
-
 TEST(KplReply, A_requester_that_never_reads_is_given_up_once) {
-  Datagram requester;
-  kplhdr* header = begin(requester.address());
+  const Datagram requester;
+  kplhdr* header = begin_answer(requester.address());
   int sent = 0;
   while (reply(header, KPL_CONT_STATUS) == 0 && sent < 100000) ++sent;
   EXPECT_EQ(errno, ETIMEDOUT);
@@ -150,121 +111,84 @@ TEST(KplReply, A_requester_that_never_reads_is_given_up_once) {
   EXPECT_EQ(reply(header, KPL_CONT_END), -1);
 }
 
-/// A master that answers one question with the given packets.
+/// A master that answers one question with the given packets: continuation and body.
 class Master {
  public:
-  using Packets = std::vector<std::pair<int, std::string>>;  // continuation, body
-
-  explicit Master(Packets packets) : packets_(std::move(packets)), thread_([this] { serve(); }) {
+  explicit Master(std::vector<std::pair<int, std::string>> packets) {
     setenv(KPL_MASTER_ENV, ("@" + socket_.name()).c_str(), 1);
+    thread_ = std::thread([this, packets] {
+      question = socket_.receive();
+      if (question.size() < sizeof(kplhdr)) return;
+      kplhdr* header = kplrrqs(question.data());
+      for (const auto& [cont, body] : packets) reply(header, cont, body);
+    });
   }
-  ~Master() {
-    thread_.join();
-    unsetenv(KPL_MASTER_ENV);
-  }
-  const std::string& question() const { return question_; }
+  ~Master() { thread_.join(); }
+
+  std::string question;
 
  private:
-  void serve() {
-    question_ = socket_.receive();
-    if (question_.size() < sizeof(kplhdr)) return;
-    kplhdr* header = kplrrqs(question_.data());
-    for (const auto& [cont, body] : packets_) reply(header, cont, body);
-  }
-
-  Packets packets_;
   Datagram socket_;
-  std::string question_;
   std::thread thread_;
 };
 
-std::string lines(const std::vector<std::string>& margins) {
+std::string lines(const std::string& letters) {
   std::string bytes;
-  for (const std::string& margin : margins) {
-    statcode record = {};
-    margin.copy(record.objname, sizeof record.objname - 1);
+  for (const char letter : letters) {
+    const statcode record = {0, 0, "", {letter}};
     bytes.append(reinterpret_cast<const char*>(&record), sizeof record);
   }
   return bytes;
 }
 
-std::string result(short code) {
-  svrreply body = {};
-  body.rtncode = code;
-  return std::string(reinterpret_cast<const char*>(&body), 101);
-}
+std::string result(short code) { return std::string(reinterpret_cast<const char*>(&code), sizeof code); }
 
-/// All margins that a query gives, two lines a call; *code becomes the last result.
-std::vector<std::string> query(int* code, const char* subsystem = "") {
-  std::vector<std::string> margins;
+/// The first letters of all margins that a query gives, two lines a call, then its result.
+std::string query() {
+  std::string told;
   char host[] = "";
-  std::string name = subsystem;
+  char subsystem[] = "subsys";
   int cont = KPL_CONT_FIRST;
-  do {
+  while (cont != KPL_CONT_END) {
     char bytes[sizeof(kplhdr) + 2 * sizeof(statcode)];
     short length = sizeof bytes;
-    *code = kplstat(host, name.data(), 4711, &length, bytes, &cont);
-    if (*code != 0) break;
+    errno = 0;
+    const int code = kplstat(host, subsystem, 4711, &length, bytes, &cont);
+    if (code != 0) return told + std::to_string(code) + (code == -1 ? strerrorname_np(errno) : "");
     for (int at = sizeof(kplhdr); at < length; at += sizeof(statcode)) {
-      statcode record;
-      memcpy(&record, bytes + at, sizeof record);
-      margins.emplace_back(record.objname);
+      told += bytes[at + static_cast<int>(offsetof(statcode, objname))];
     }
-  } while (cont != KPL_CONT_END);
-  return margins;
+  }
+  return told + "0";
 }
 
-TEST(KplShortStatus, Lines_come_in_the_callers_portions) {
-  int code;
+TEST(KplShortStatus, Lines_come_in_the_callers_portions_and_failures_are_told_apart) {
   {
-    Master master({{KPL_CONT_STATUS, lines({"a", "b", "c"})},
-                   {KPL_CONT_MESSAGE, result(0)},
-                   {KPL_CONT_STATUS, lines({"d", "e"})},
-                   {KPL_CONT_END, result(0)}});
-    EXPECT_THAT(query(&code, "subsys"), ElementsAre("a", "b", "c", "d", "e"));
-    EXPECT_EQ(code, 0);
-    ASSERT_EQ(master.question().size(), 160u);
-    kplreq asked;
-    memcpy(&asked.kplhdr, master.question().data(), 156);
-    EXPECT_EQ(asked.subreq.object, 17);
-    EXPECT_EQ(asked.subreq.action, 2);
-    EXPECT_EQ(asked.subreq.parm1, 0);
-    EXPECT_STREQ(asked.subreq.objname, "subsys");
-    EXPECT_EQ(static_cast<unsigned char>(master.question()[156]) + 256 * master.question()[157], 4711);
+    const Master master({{KPL_CONT_STATUS, lines("abc")},
+                         {KPL_CONT_MESSAGE, "as short as can be"},
+                         {KPL_CONT_STATUS, lines("de")},
+                         {KPL_CONT_END, result(0)}});
+    EXPECT_EQ(query(), "abcde0");
+    ASSERT_EQ(master.question.size(), 160U);
+    const subreq asked = {17, 2, 0, 0, "subsys"};
+    const int pid = 4711;
+    EXPECT_EQ(memcmp(master.question.data() + sizeof(kplhdr), &asked, sizeof asked), 0);
+    EXPECT_EQ(memcmp(master.question.data() + 156, &pid, sizeof pid), 0);
   }
-  Master empty({{KPL_CONT_END, result(0)}});
-  EXPECT_THAT(query(&code), ElementsAre());
-  EXPECT_EQ(code, 0);
-}
-
-TEST(KplShortStatus, Failures_are_told_apart) {
-  int code;
-  {
-    Master refuses({{KPL_CONT_STATUS, lines({"a"})}, {KPL_CONT_END, result(KPL_RC_BAD_REQUEST)}});
-    query(&code);
-    EXPECT_EQ(code, KPL_RC_BAD_REQUEST);
-  }
-  {
-    Master garbles({{KPL_CONT_STATUS, lines({"a"}) + "half"}});
-    query(&code);
-    EXPECT_EQ(code, -1);
-    EXPECT_EQ(errno, EBADMSG);
+  const struct {
+    std::vector<std::pair<int, std::string>> packets;
+    const char* outcome;
+  } cases[] = {{{{KPL_CONT_END, result(0)}}, "0"},
+               {{{KPL_CONT_STATUS, lines("a")}, {KPL_CONT_END, result(-9087)}}, "-9087"},
+               {{{KPL_CONT_STATUS, lines("a") + "half"}}, "-1EBADMSG"},
+               {{{KPL_CONT_END, "1"}}, "-1EBADMSG"}};
+  for (const auto& c : cases) {
+    const Master master(c.packets);
+    EXPECT_EQ(query(), c.outcome);
   }
   setenv(KPL_MASTER_ENV, "/nowhere/at/all", 1);
-  query(&code);
-  EXPECT_EQ(code, -1);
-  EXPECT_EQ(errno, ENOENT);
+  EXPECT_EQ(query(), "-1ENOENT");
   unsetenv(KPL_MASTER_ENV);
-
-  short length = sizeof(statrep);
-  char bytes[sizeof(statrep)];
-  char elsewhere[] = "elsewhere";
-  int cont = KPL_CONT_FIRST;
-  EXPECT_EQ(kplstat(elsewhere, nullptr, 1, &length, bytes, &cont), -1);
-  EXPECT_EQ(errno, EINVAL);
-  cont = KPL_CONT_STATUS;  // goes on with a query that was never begun
-  EXPECT_EQ(kplstat(nullptr, nullptr, 1, &length, bytes, &cont), -1);
-  EXPECT_EQ(errno, EINVAL);
 }
 
 }  // namespace
