@@ -12,17 +12,16 @@
 namespace {
 
 using Clock = std::chrono::steady_clock;
-using std::chrono::milliseconds;
 
 /// How long one answer may wait for a requester that does not read.
-constexpr milliseconds kPatience{2000};
+constexpr Clock::duration kPatience = std::chrono::seconds(2);
 
 /// The answer that a thread is giving.
 struct Answer {
   kplhdr header;
   platform::Descriptor socket;
-  milliseconds patience = kPatience;
-  int gone = 0;  ///< the error that told that the requester is gone; 0 while it is there
+  Clock::duration patience = kPatience;  ///< what is left of it
+  int gone = 0;                          ///< the error that told that the requester is gone; 0 while it is there
 
   void restart() {
     socket = platform::Descriptor();
@@ -46,9 +45,9 @@ int connect_to(const sockaddr_un& retaddr) {
 int wait_for_room() {
   const auto start = Clock::now();
   pollfd entry = {answer.socket.get(), POLLOUT, 0};
-  const int ready = poll(&entry, 1, static_cast<int>(answer.patience.count()));
-  // One millisecond more than measured, so that the waiting ends also when each wait is too short to count.
-  answer.patience -= std::chrono::duration_cast<milliseconds>(Clock::now() - start) + milliseconds(1);
+  const auto left = std::chrono::ceil<std::chrono::milliseconds>(answer.patience);
+  const int ready = poll(&entry, 1, static_cast<int>(left.count()));
+  answer.patience -= Clock::now() - start;
   if (answer.patience.count() <= 0) return ETIMEDOUT;
   return ready >= 0 || errno == EINTR ? 0 : errno;
 }
