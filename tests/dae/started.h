@@ -1,92 +1,139 @@
-// Daemons that are really started: by a shell on a terminal, with three inet sockets, or by a master in a PID
-// namespace; what they report, and what /proc shows of them.
+// Daemons that are really started, by a shell, by a super-server or by whoever runs their command line; what they
+// report, and what /proc shows of them.
 #pragma once
 
-#include <sys/types.h>
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <pty.h>
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
 
+#include <filesystem>
+#include <fstream>
 #include <map>
+#include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "datagram.h"
-#include "kpl.h"
 
-/// Path of a program that was built beside the tests.
-std::string program(const std::string& name);
-
-/// A started daemon. It ends with the object, and so does everything that started it.
+/// A started daemon_probe. It ends with the object.
 class Started {
  public:
-  using Arguments = std::vector<std::string>;
-  using Fields = std::map<std::string, std::string>;
+  using Words = std::vector<std::string>;
 
-  Started();
-  ~Started();
+  Started() {
+    prctl(PR_SET_CHILD_SUBREAPER, 1);  // so that a daemon that lost its parent can be waited for
+    const int zero = open("/dev/zero", O_RDONLY | O_CLOEXEC);
+    dup2(zero, kInherited);
+    high_inherited_ = fcntl(zero, F_DUPFD, 2005);
+    close(zero);
+  }
+  ~Started() {
+    if (pidfd_ >= 0) syscall(SYS_pidfd_send_signal, pidfd_, SIGKILL, nullptr, 0);
+    if (pidfd_ >= 0) has_ended();
+    while (waitpid(-1, nullptr, WNOHANG) > 0) {
+    }
+    for (const int fd : {kInherited, high_inherited_, terminal_, pidfd_}) close(fd);
+  }
   Started(const Started&) = delete;
   Started& operator=(const Started&) = delete;
 
-  /// Each runs PROGRAM REPORT-ADDRESS ARGUMENTS...; the first two return the status of what they ran, as waitpid
-  /// gives it. Descriptor 50 and, when the limit allows, 2005 are open and inherited.
-  int from_shell(const std::string& program, const Arguments& arguments);
-  int from_inetd(const std::string& program, const Arguments& arguments);
-  /// `how` as fake_master takes it. False when there can be no namespace.
-  bool from_master(const std::string& how, const std::string& program, const Arguments& arguments);
+  /// Both start it on a terminal with descriptor 50 and, when the limit allows, 2005 open, and return the exit
+  /// status of what they ran: that of the shell, that of a daemon that failed.
+  int from_shell(const Words& options) {
+    Words words = command_line(options);
+    words.insert(words.begin(), {"/bin/sh", "-c", "\"$0\" \"$@\"; exit $?"});
+    const pid_t shell = forkpty(&terminal_, nullptr, nullptr, nullptr);
+    if (shell == 0) run(words);
+    const int status = exit_status_of(shell);
+    close(std::exchange(terminal_, -1));  // hangs up
+    wait_for_start();
+    return status;
+  }
+  int from_inetd(const Words& options) {
+    const int service = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    const pid_t child = forkpty(&terminal_, nullptr, nullptr, nullptr);
+    if (child == 0) {
+      for (const int fd : {0, 1, 2}) dup2(service, fd);
+      run(command_line(options));
+    }
+    close(service);
+    wait_for_start();
+    return start.starts_with("0 ") ? 0 : exit_status_of(child);
+  }
+  /// For others to run; `wait_for_start` then takes the first report.
+  Words command_line(const Words& options) const {
+    const auto folder = std::filesystem::read_symlink("/proc/self/exe").parent_path();
+    Words words = {folder / "daemon_probe", reports_.name()};
+    words.insert(words.end(), options.begin(), options.end());
+    return words;
+  }
+  void wait_for_start() {
+    start = reports_.receive(&pid_);
+    commands_to_ = start.substr(0, start.find(' '));
+    start.erase(0, commands_to_.size() + 1);
+    if (pid_ > 0) pidfd_ = static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
+  }
 
-  /// What was reported of the start: its key=value fields.
-  Fields start;
+  std::string start;  ///< what was reported of the start
   /// The next report; empty when none comes.
-  std::string report();
-  /// The same for reports of fields; `word` is the first word.
-  Fields report_fields();
-
-  /// Tells the daemon a command.
-  void command(const std::string& text);
-
-  pid_t pid() const { return pid_; }
-  bool is_alive() const;
+  std::string report() { return reports_.receive(); }
+  void command(const std::string& text) { EXPECT_TRUE(reports_.send(commands_to_, text)); }
   /// Waits for the end of the daemon.
-  bool has_ended() const;
+  bool has_ended() const {
+    pollfd entry = {pidfd_, POLLIN, 0};
+    return poll(&entry, 1, Datagram::kPatienceMs) == 1;
+  }
 
-  /// What /proc shows: a line of `status`, the fields of `stat` behind the name, the working directory, and where
-  /// the descriptors lead.
-  std::string status_line(const std::string& label) const;
-  std::vector<std::string> stat() const;
-  std::string cwd() const;
-  std::map<int, std::string> descriptors() const;
-  /// Whether a signal is in the set that `label` names (SigIgn, SigCgt).
-  bool has_signal(const std::string& label, int signo) const;
-
-  /// The master's end of the request socket.
-  int channel() const { return channel_; }
+  std::string pid() const { return std::to_string(pid_); }
+  /// What /proc shows: the lines of `status`, and group, session, terminal and directory.
+  std::map<std::string, std::string> state() const {
+    std::map<std::string, std::string> fields;
+    std::ifstream status("/proc/" + pid() + "/status");
+    for (std::string label, text; std::getline(status, label, ':') && std::getline(status >> std::ws, text);) {
+      fields[label] = text;
+    }
+    std::ifstream stat("/proc/" + pid() + "/stat");
+    std::string word;
+    std::getline(stat, word, ')');  // the name
+    stat >> word >> word >> fields["group"] >> fields["session"] >> fields["terminal"];
+    fields["directory"] = std::filesystem::read_symlink("/proc/" + pid() + "/cwd").string();
+    return fields;
+  }
+  /// Where the descriptors lead.
+  std::map<int, std::string> descriptors() const {
+    std::map<int, std::string> result;
+    for (const auto& entry : std::filesystem::directory_iterator("/proc/" + pid() + "/fd")) {
+      result[std::stoi(entry.path().filename().string())] = std::filesystem::read_symlink(entry.path()).string();
+    }
+    return result;
+  }
 
  private:
-  void take_first_report();
+  static constexpr int kInherited = 50;
+
+  [[noreturn]] static void run(Words words) {
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(word.data());
+    argv.push_back(nullptr);
+    execv(argv[0], argv.data());
+    _exit(127);
+  }
+  static int exit_status_of(pid_t child) {
+    int status = -1;
+    waitpid(child, &status, 0);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  }
 
   Datagram reports_;
-  int channel_ = -1;  // our end
-  int daemon_end_ = -1;
-  int inherited_[2] = {-1, -1};
-  pid_t starter_ = 0;  // fake_master, while it runs
+  std::string commands_to_;
+  int high_inherited_ = -1;
+  int terminal_ = -1;
   pid_t pid_ = 0;
   int pidfd_ = -1;
-};
-
-/// Asks a daemon: builds requests with its own return address and collects what comes back.
-class Requester {
- public:
-  std::string request(short action, short parm1 = 0, short parm2 = 0, const std::string& data = "",
-                      short object = 17) const;
-
-  struct Answer {
-    int code = 1;  // nothing that a daemon gives
-    std::string message;
-    std::vector<std::string> interim;
-    std::vector<std::pair<std::string, std::string>> lines;  // margin and body
-    std::vector<size_t> packets;                             // lines in each status packet
-  };
-  Answer answer() const;
-  bool is_silent() const { return socket_.receive(nullptr, 0).empty(); }
-
- private:
-  Datagram socket_;
 };
