@@ -47,9 +47,9 @@ class Datagram {
   }
 
   /// The next datagram, empty when none comes in time. *sender becomes its sender's process id, as seen from here.
-  std::string receive(pid_t* sender = nullptr, int patience_ms = kPatienceMs) const {
+  std::string receive(pid_t* sender = nullptr) const {
     pollfd entry = {fd_, POLLIN, 0};
-    if (poll(&entry, 1, patience_ms) != 1) return "";
+    if (poll(&entry, 1, kPatienceMs) != 1) return "";
     std::string bytes(16384, '\0');
     alignas(cmsghdr) char control[CMSG_SPACE(sizeof(ucred))];
     iovec part = {bytes.data(), bytes.size()};

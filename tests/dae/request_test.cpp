@@ -2,6 +2,8 @@
 #include <errno.h>
 #include <fcntl.h>
 #include <string.h>
+#include <sys/ipc.h>
+#include <sys/msg.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -172,6 +174,29 @@ TEST_F(Requests, Length_and_process_decide_whether_there_is_a_reply) {
   called.clear();
   dae_KPL_req();  // nothing waits
   EXPECT_EQ(called, "");
+}
+
+TEST_F(Requests, Of_a_queue_only_the_own_type_is_taken_cut_to_the_buffer) {
+  const int key = static_cast<int>(std::random_device()() | 1U);
+  const int queue = msgget(key, IPC_CREAT | IPC_EXCL | 0660);
+  ASSERT_NE(queue, -1);
+  dae_init_KPL_msq(nullptr, key, 7, &kAllRoutines, 0);
+  EXPECT_EQ(dae_KPL_init__INTERNAL__(nullptr), 0);
+  dae_pid__INTERNAL__ = getpid();
+  for (const auto& [type, bytes] : {std::pair(8L, request(17, 5)),
+                                    {7L, request(17, 300).substr(0, 155)},
+                                    {7L, request(17, 300) + std::string(3000, 'd')}}) {
+    const std::string message = std::string(reinterpret_cast<const char*>(&type), sizeof type) + bytes;
+    EXPECT_EQ(msgsnd(queue, message.data(), bytes.size(), 0), 0);
+  }
+  fake_kpl::reset();
+  dae_KPL_req();
+  EXPECT_TRUE(fake_kpl::replies.empty());
+  dae_KPL_req();
+  EXPECT_EQ(data_in, std::string(2000 - 8 - 156, 'd'));
+  dae_KPL_req();  // nothing of that type waits
+  EXPECT_EQ(fake_kpl::replies.size(), 1U);
+  msgctl(queue, IPC_RMID, nullptr);
 }
 
 TEST_F(Requests, Mutated_requests_are_answered_or_ignored) {
