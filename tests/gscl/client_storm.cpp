@@ -6,18 +6,18 @@
 #include <thread>
 #include <vector>
 
-#include "gscl/gscl.h"
 #include "peek.h"
+#include "recording_api.h"
 #include "tests/support/allocations.h"
 
 namespace {
 
 using namespace zelt_gscl_V1;
+using recording::kNoValue;
 using zelt_gscl::GS_WAITFOR_RECEIVED;
 
 constexpr int kWorkers = 4;
 constexpr int kRounds = 60;
-constexpr wyx_state_value_t kNoValue = {0, nullptr};
 
 /// A base API that answers like a daemon: a request is accepted and its notification queued; dispatch hands queued
 /// notifications to the callbacks. It allocates nothing once its tables have grown. One at a time.
@@ -70,28 +70,13 @@ class FakeDaemon {
     return WYX_OK;
   }
   static void deliver(const Event& event) {
-    static char text[] = "a state value of sixty-four bytes, as long as a usual one is ...";
-    wyx_provider_t ids[8];
-    for (short i = 0; i < 8; ++i) ids[i] = wyx_provider_t{{i, static_cast<short>(event.token)}};
-    wyx_membership_t members = {8, ids};
-    wyx_state_value_t value = {sizeof text - 1, text};
-    if (event.protocol == WYX_SUBSCRIPTION) {
-      wyx_subscription_notification_t n = {};
-      n.gs_notification_type = WYX_SUBSCRIPTION_NOTIFICATION;
-      n.gs_subscriber_token = event.token;
-      n.gs_subscription_type = wyx_subscription_type_t(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_STATE);
-      n.gs_full_membership = &members;
-      n.gs_state_value = &value;
-      return GSController::stub_subscribeCb(&n);
-    }
-    wyx_proposal_t proposal = {};
-    proposal.gs_proposed_by = ids[0];
-    proposal.gs_whats_changed = WYX_UPDATED_MEMBERSHIP;
-    proposal.gs_current_providers = &members;
-    proposal.gs_current_state_value = &value;
-    const auto type = WYX_APPROVED_NOTIFICATION;
-    const wyx_approved_notification_t n = {type, event.token, event.protocol, WYX_EXPLICIT_APPROVE, &proposal, 1};
-    GSController::stub_approvedCb(&n);
+    thread_local recording::Says says = {.changed = WYX_UPDATED_MEMBERSHIP,
+                                         .current = std::string(64, 'v'),
+                                         .members = std::vector<wyx_provider_t>(8)};
+    says.to = event.token;
+    says.by = wyx_provider_t{{1, static_cast<short>(event.token)}};
+    if (event.protocol != WYX_SUBSCRIPTION) return recording::approve(event.protocol, says);
+    recording::subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_STATE, says);
   }
 
   static inline FakeDaemon* the_daemon = nullptr;

@@ -92,25 +92,6 @@ TEST(Debug, environment_isReadByTheFirstLineThatNeedsItUnlessTheLevelWasSet) {
   EXPECT_EQ(file.text(), "kept");
 }
 
-TEST(Debug, fileSet_replacesTheOneBefore) {
-  const TempFile first(""), second("");
-  const FreshOutput seen = in_fresh_process([&] {
-    GSSetDebugLevel(0);
-    gscl_set_debug_file(first.path());
-    GStracef(0, "one\n");
-    gscl_set_debug_file(second.path());
-    GStracef(0, "two\n");
-    gscl_set_debug_file("/nowhere/at/all");
-    GStracef(0, "three\n");
-    gscl_set_debug_file(second.path());
-    gscl_set_debug_file(nullptr);
-    GStracef(0, "four\n");
-  });
-  EXPECT_THAT(first.text(), MatchesRegex(PREFIX "TRC_GSCL one\n"));
-  EXPECT_EQ(second.text(), "") << "opened again, so truncated";
-  EXPECT_THAT(seen.err, MatchesRegex(PREFIX "TRC_GSCL three\n" PREFIX "TRC_GSCL four\n"));
-}
-
 TEST(Debug, prefix_namesLocalTimeAndThread) {
   const FreshOutput seen = in_fresh_process([] {
     const auto now = [] {

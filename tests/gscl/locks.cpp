@@ -187,23 +187,11 @@ TEST(RWLock, copies_areFreeAndIndependent) {
 TEST(RWLock, handle_waitsWithoutLimitWhateverTheDeadline) {
   GSRWLock lock;
   ASSERT_EQ(lock.WriteLock(nullptr), 0);
-  std::atomic<bool> released{false};
-  std::thread writer([&] {
-    EXPECT_EQ(lock.WriteLock(&kPast), 0);
-    EXPECT_TRUE(released);
-    lock.WriteUnlock();
-  });
-  std::thread reader([&] {
-    EXPECT_EQ(lock.ReadLock(&kPast), 0);
-    EXPECT_TRUE(released);
-    lock.ReadUnlock();
-  });
+  std::jthread writer([&] { EXPECT_EQ(lock.WriteLock(&kPast) + lock.WriteUnlock(), 0); });
+  std::jthread reader([&] { EXPECT_EQ(lock.ReadLock(&kPast) + lock.ReadUnlock(), 0); });
   auto& inner = **reinterpret_cast<GSRWLockImpl**>(&lock);
   EXPECT_TRUE(eventually([&] { return writersWaiting(inner) == 1 && readersWaiting(inner) == 1; }));
-  released = true;
   EXPECT_EQ(lock.WriteUnlock(), 0);
-  writer.join();
-  reader.join();
 }
 
 // Readers, writers, deadlines and cancellations race with releases: never a writer beside anybody; a lost wake-up

@@ -73,18 +73,6 @@ TEST(Queue, failedGrowth_changesNothing) {
   expectFailedGrowthChangesNothing([&](int) { market.produce(&object); }, [&] { return market.QueueCount(); });
 }
 
-TEST(EventQueue, wait_takesWhatIsThereWhateverTheTimeOut) {
-  GSIntegerEventQueue queue;
-  int event = 7;
-  EXPECT_EQ(queue.pop_event(&event), 0);
-  EXPECT_EQ(event, 7) << "left alone";
-  EXPECT_EQ(queue.push_event(5), 1);
-  EXPECT_EQ(queue.push_event(6), 2);
-  EXPECT_EQ(queue.wait_event(&event, 0, 0), 0);
-  EXPECT_EQ(event, 5);
-  EXPECT_EQ(queue.wait_event(nullptr, -5, 0), 0) << "a deadline in the past does not matter either";
-}
-
 TEST(EventQueue, timeOut_isCountedOnceFromTheCall) {
   GSIntegerEventQueue queue;
   std::atomic<bool> stop{false};

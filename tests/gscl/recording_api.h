@@ -39,8 +39,9 @@ inline std::string lowHex(uintptr_t value) {
 }
 
 /// One event reads "<state>/<token> <what>", state and token being the watched client's at that moment. <what> is
-/// a call of the base API, "wyx_leave(12)", a callback, "-> approvedCb", a result, "= WYX_OK", or a trace line
-/// with its channel, "A text" (D: detail, W: warning), without its line end. Addresses of the watched client read
+/// a call of the base API with its numbers, "wyx_goodbye(12)", a callback, "-> approvedCb", a result, "= WYX_OK",
+/// or a trace line with its channel, "A text" (D: detail, W: warning), without its line end. Addresses of the
+/// watched client read
 /// "@", the calling thread's id "#", numbers of requests "seq=S", and "Prov[g,Id=3/7,T=12]" reads "P[3/7,T=12]".
 class RecordingApi {
  public:
@@ -96,7 +97,7 @@ class RecordingApi {
   wyx_rc_t answer = WYX_OK;
   wyx_token_t token = kToken;         // what join and subscribe give
   std::function<void()> during;       // runs inside every entry point
-  wyx_proposal_info_t proposal = {};  // of the last request
+  wyx_proposal_info_t proposal = {};  // of the last join or subscription
   std::string entered;  // "<group>/<instance>/<local name>" of the last join, the group of the last subscription
   struct Setup {
     int version, count;
@@ -157,17 +158,20 @@ class RecordingApi {
       return the_api->enter("wyx_vote", t, vote, lengths[0], lengths[1], default_vote);
     };
 #define ENTRY(entry) table.entry = [](auto... number) { return the_api->enter(#entry, number...); }
-#define PROPOSAL(entry) \
-  table.entry = [](wyx_token_t t, Info info) { return the_api->proposal = *info, the_api->enter(#entry, t); }
+#define PROPOSAL(entry, record, ...)                                                 \
+  table.entry = [](wyx_token_t t, Info info) {                                       \
+    const auto& r = info->_gs_protocol_info.record;                                  \
+    return the_api->enter(#entry, t, r.gs_num_phases, r.gs_time_limit, __VA_ARGS__); \
+  }
     ENTRY(wyx_quit);
     ENTRY(wyx_dispatch);
     ENTRY(wyx_goodbye);
     ENTRY(wyx_unsubscribe);
-    PROPOSAL(wyx_change_state_value);
-    PROPOSAL(wyx_send_message);
-    PROPOSAL(wyx_leave);
-    PROPOSAL(wyx_expel);
-    PROPOSAL(wyx_change_attributes);
+    PROPOSAL(wyx_change_state_value, _gs_state_change_request, r.gs_new_state.gs_length);
+    PROPOSAL(wyx_send_message, _gs_message_request, r.gs_message.gs_length);
+    PROPOSAL(wyx_leave, _gs_leave_request, r.gs_leave_code);
+    PROPOSAL(wyx_expel, _gs_expel_request, r.gs_deactivate_phase);
+    PROPOSAL(wyx_change_attributes, _gs_attribute_change_request, r.gs_group_attributes->gs_client_version);
 #undef PROPOSAL
 #undef ENTRY
     table.wyx_change_responsiveness = [](const wyx_responsiveness_t*) {
@@ -223,45 +227,51 @@ struct Says {
 
 /// The same, as the base API hands it out.
 struct Records {
-  explicit Records(Says& says) {
+  explicit Records(const Says& says)
+      : members(list(says.members)),
+        changing(list(says.changing)),
+        current(value(says.current)),
+        proposed(value(says.proposed)) {
     proposal.gs_phase_info = {says.phases, says.phase};
     proposal.gs_proposed_by = says.by;
     proposal.gs_whats_changed = static_cast<wyx_whats_changed_t>(says.changed);
     if (!says.members.empty()) proposal.gs_current_providers = &members;
     if (!says.current.empty()) proposal.gs_current_state_value = &current;
     if (!says.proposed.empty()) proposal.gs_proposed_state_value = &proposed;
-    members = {static_cast<unsigned>(says.members.size()), says.members.data()};
-    changing = {static_cast<unsigned>(says.changing.size()), says.changing.data()};
-    current = {static_cast<int>(says.current.size()), says.current.data()};
-    proposed = {static_cast<int>(says.proposed.size()), says.proposed.data()};
+  }
+  static wyx_membership_t list(const std::vector<wyx_provider_t>& ids) {
+    return {static_cast<unsigned>(ids.size()), const_cast<wyx_provider_t*>(ids.data())};
+  }
+  static wyx_state_value_t value(const std::string& text) {
+    return {static_cast<int>(text.size()), const_cast<char*>(text.data())};
   }
   wyx_membership_t members, changing;
   wyx_state_value_t current, proposed;
   wyx_proposal_t proposal = {};
 };
 
-inline void approve(wyx_request_t protocol, Says s = {}) {
+inline void approve(wyx_request_t protocol, const Says& s = {}) {
   Records r(s);
   const auto what = WYX_APPROVED_NOTIFICATION;
   const wyx_approved_notification_t n = {what, s.to, protocol, WYX_EXPLICIT_APPROVE, &r.proposal, 1};
   GSController::stub_approvedCb(&n);
 }
 
-inline void reject(wyx_request_t protocol, Says s = {}) {
+inline void reject(wyx_request_t protocol, const Says& s = {}) {
   Records r(s);
   const auto what = WYX_REJECTED_NOTIFICATION;
   const wyx_rejected_notification_t n = {what, s.to, protocol, WYX_EXPLICIT_REJECT, &r.proposal, 1};
   GSController::stub_rejectedCb(&n);
 }
 
-inline void phase(wyx_request_t protocol, Says s = {}) {
+inline void phase(wyx_request_t protocol, const Says& s = {}) {
   Records r(s);
   const auto what = WYX_N_PHASE_NOTIFICATION;
   const wyx_n_phase_notification_t n = {what, s.to, protocol, WYX_EXPLICIT_APPROVE, 30, &r.proposal, 1};
   GSController::stub_nPhaseCb(&n);
 }
 
-inline void subscription(int type, Says s = {}) {
+inline void subscription(int type, const Says& s = {}) {
   Records r(s);
   wyx_subscription_notification_t n = {};
   n.gs_notification_type = WYX_SUBSCRIPTION_NOTIFICATION;

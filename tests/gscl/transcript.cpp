@@ -81,8 +81,9 @@ TEST_F(Transcript, Provider) {
   const auto made = [&](wyx_rc_t rc) { api.record("= " + std::string(gscl_rc_name(rc))); };
   const wyx_state_value_t value = {5, text};
   const wyx_provider_message_t message = {3, text};
-  const wyx_expel_request_t expel = {};
+  const wyx_expel_request_t expel = {WYX_1_PHASE, 2, {0, nullptr}, 4, text};
   wyx_group_attributes_t attributes = {};
+  attributes.gs_client_version = 9;
   steps = {
       {"join", [&] { made(member.joinGroup()); }},
       {"goodbye", [&] { made(member.goodbyeGroup()); }},
@@ -122,7 +123,6 @@ TEST_F(Transcript, Provider) {
 [IDLE/-1]
 A P[-1/-1,T=-1] was already out-of-group.
 = WYX_NOT_OK
-
 > join
 A GSProvider::joinGroup(P[-1/-1,T=-1]) begins
 A stub_join_group(P[-1/-1,T=-1]) is issued
@@ -136,7 +136,6 @@ D endTransaction @
 A stub_join_group(P[-1/-1,T=12]) token=12 sync_rc=WYX_OK
 A GSProvider::joinGroup(P[-1/-1,T=12]) returns  sync_rc=WYX_OK.
 = WYX_OK
-
 > own join in phase
 A C::stub_nPhaseCb(P[-1/-1,T=12]) protocol=WYX_JOIN token=12, sumCode=WYX_EXPLICIT_APPROVE, \
 notification=WYX_N_PHASE_NOTIFICATION
@@ -144,7 +143,6 @@ before mine
 -> nPhaseCb
 A nPhaseCb(P[-1/-1,T=12]) for WYX_JOIN
 after P[-1/-1,T=12] N_PHASE WYX_JOIN
-
 > own join rejected
 A C::stub_rejectCb(P[-1/-1,T=12]) protocol=WYX_JOIN sumCode=WYX_EXPLICIT_REJECT, myId=-1 provider_token=12
 A Client[P[-1/-1,T=12]] ClientState: GS_IAM_JOINING to GS_IAM_IDLE.
@@ -154,7 +152,6 @@ before mine
 A rejectedCb(P[-1/-1,T=12]) for WYX_JOIN
 A My join(P[-1/-1,T=12]) is rejected.
 after P[-1/-1,T=12] REJECTED WYX_JOIN
-
 > join: WYX_EXISTS
 A GSProvider::joinGroup(P[-1/-1,T=12]) begins
 A stub_join_group(P[-1/-1,T=12]) is issued
@@ -166,7 +163,6 @@ D endTransaction @
 A stub_join_group(P[-1/-1,T=-1]) token=-1 sync_rc=WYX_EXISTS
 A GSProvider::joinGroup(P[-1/-1,T=-1]) returns  sync_rc=WYX_EXISTS.
 = WYX_EXISTS
-
 >> join
 > goodbye: WYX_BAD_MEMBER_TOKEN
 A C::stub_goodbye_group(P[-1/-1,T=12]) is issued
@@ -179,7 +175,6 @@ A Client[P[-1/-1,T=-1]] ClientState: GS_IAM_JOINING to GS_IAM_IDLE.
 D endTransaction @
 A P[-1/-1,T=-1] issued goodbye and get sync_rc=WYX_BAD_MEMBER_TOKEN.
 = WYX_BAD_MEMBER_TOKEN
-
 >> join
 > own join approved
 A C::stub_approvedCb(P[-1/-1,T=12]) for prot=WYX_JOIN  sumCode=WYX_EXPLICIT_APPROVE, whats_changed=0x20
@@ -194,7 +189,6 @@ A My Join(P[3/7,T=12]) is approved
 D returned from approvedCb()
 after P[3/7,T=12] APPROVED WYX_JOIN
 A C::stub_approvedCb(P[3/7,T=12]) done
-
 > other's join approved
 A C::stub_approvedCb(P[3/7,T=12]) for prot=WYX_JOIN  sumCode=WYX_EXPLICIT_APPROVE, whats_changed=0x0
 A C::stub_approvedCb(P[3/7,T=12])- I was already joined.. ID=[3/7]. my_req=0
@@ -206,20 +200,11 @@ A My Join(P[3/7,T=12]) is approved
 D returned from approvedCb()
 after not mine
 A C::stub_approvedCb(P[3/7,T=12]) done
-
-> goodbye: WYX_NO_INIT
-A C::stub_goodbye_group(P[3/7,T=12]) is issued
-D beginTransaction @
-wyx_goodbye(12)
-A stub_goodbye_group(P[3/7,T=12]) token=12 sync_rc=WYX_NO_INIT
-D endTransaction @
-A P[3/7,T=12] issued goodbye and get sync_rc=WYX_NO_INIT.
-= WYX_NO_INIT
-
+>> goodbye: WYX_NO_INIT
 > change
 A stub_change_state_value(P[3/7,T=12]) is issued
 D beginTransaction @
-wyx_change_state_value(12)
+wyx_change_state_value(12, 2, 30, 5)
 D startProtocolRequested(P[3/7,T=12]) type=WYX_STATE_VALUE_CHANGE
 D endTransaction @
 A stub_change_state_value(P[3/7,T=12]) token=12 sync_rc=WYX_OK
@@ -227,25 +212,25 @@ A stub_change_state_value(P[3/7,T=12]) token=12 sync_rc=WYX_OK
 > leave: WYX_COLLIDE
 A stub_leave(P[3/7,T=12]) is issued
 D beginTransaction @
-wyx_leave(12)
+wyx_leave(12, 2, 30, 1)
 D endTransaction @
 A stub_leave(P[3/7,T=12]) token=12 sync_rc=WYX_COLLIDE
 = WYX_COLLIDE
 >~ message
 A stub_send_message(P[3/7,T=12]) is issued
-wyx_send_message(12)
+wyx_send_message(12, 1, 0, 3)
 D startProtocolRequested(P[3/7,T=12]) type=WYX_PROVIDER_MESSAGE
 >~ leave
 A stub_leave(P[3/7,T=12]) is issued
-wyx_leave(12)
+wyx_leave(12, 2, 30, 1)
 D startProtocolRequested(P[3/7,T=12]) type=WYX_LEAVE
 >~ expel
 A stub_expel(P[3/7,T=12]) is issued
-wyx_expel(12)
+wyx_expel(12, 1, 2, 4)
 D startProtocolRequested(P[3/7,T=12]) type=WYX_EXPEL
 >~ attributes
 A stub_change_attributes(P[3/7,T=12]) is issued
-wyx_change_attributes(12)
+wyx_change_attributes(12, 1, 0, 9)
 D startProtocolRequested(P[3/7,T=12]) type=WYX_GROUP_ATTRIBUTE_CHANGE
 > vote
 A stub_vote(P[3/7,T=12]) vote=WYX_VOTE_APPROVE defvote=WYX_VOTE_REJECT issued
@@ -253,12 +238,6 @@ wyx_vote(12, 1, 5, 3, 3)
 D setVoteIsSubmitted(P[3/7,T=12])
 A stub_vote(P[3/7,T=12]) token=12 sync_rc=WYX_OK
 = WYX_OK
-> vote: WYX_VOTE_NOT_EXPECTED
-A stub_vote(P[3/7,T=12]) vote=WYX_VOTE_APPROVE defvote=WYX_VOTE_REJECT issued
-wyx_vote(12, 1, 5, 3, 3)
-A stub_vote(P[3/7,T=12]) token=12 sync_rc=WYX_VOTE_NOT_EXPECTED
-= WYX_VOTE_NOT_EXPECTED
-
 >~ failure approved
 before not mine
 A P[3/7,T=12] Failure approved.
@@ -328,13 +307,7 @@ D endTransaction @
 A stub_subscribe_group(Subs[G=g,T=12]) token=12 sync_rc=WYX_OK
 A Subs[G=g,T=12]: subscribe sync_rc=WYX_OK
 = WYX_OK
-> unsubscribe: WYX_NO_INIT
-D beginTransaction @
-wyx_unsubscribe(12)
-D endTransaction @
-A stub_unsubscribe_group(Subs[G=g,T=12]) returns sync_rc=WYX_NO_INIT
-A Subs[G=g,T=12]: unsubscribe sync_rc=WYX_NO_INIT
-= WYX_NO_INIT
+>> unsubscribe: WYX_NO_INIT
 > unsubscribe
 D beginTransaction @
 wyx_unsubscribe(12)
@@ -343,7 +316,6 @@ D endTransaction @
 A stub_unsubscribe_group(Subs[G=g,T=-1]) returns sync_rc=WYX_OK
 A Subs[G=g,T=-1]: unsubscribe sync_rc=WYX_OK
 = WYX_OK
-
 >> subscribe
 > full
 [SUBSCRIBED/12]
