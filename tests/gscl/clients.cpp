@@ -156,18 +156,6 @@ TEST_F(Client, TraceRoutineThatThrows_leavesNoLockHeld) {
   std::thread([&] { EXPECT_EQ(member.joinGroup(), WYX_OK); }).join();
 }
 
-/// "<current>/<proposed>".
-std::string values(GSClient& client) {
-  GSStateValue current, proposed;
-  client.getCurrentStateValue(current);
-  client.getProposedStateValue(proposed);
-  const auto text = [](GSStateValue& value) {
-    const wyx_state_value_t* v = value.getValue();
-    return v == nullptr ? "" : std::string(v->gs_state, static_cast<size_t>(v->gs_length));
-  };
-  return text(current) + "/" + text(proposed);
-}
-
 class Routing : public ClientTest {
  protected:
   /// Whether `notify` reaches the waiters, seen at the line that only an own request writes.
@@ -204,63 +192,20 @@ TEST_F(Routing, OwnRequest_byProtocolAndProposer) {
   }
 }
 
-TEST_F(Routing, ValuesAndMembers_areThoseOfTheNotification) {
-  const auto expect = [&](GSClient& client, const char* expected, std::vector<wyx_provider_t> members) {
-    EXPECT_EQ(values(client), expected);
-    ASSERT_EQ(client.getMemberCount(), static_cast<int>(members.size())) << expected;
-    for (size_t i = 0; i < members.size(); ++i) {
-      wyx_provider_t id = {};
-      EXPECT_EQ(client.getMemberAt(static_cast<int>(i), &id), 1);
-      EXPECT_EQ(id, members[i]) << expected;
-    }
-  };
-  member.joinGroup();
-  phase(WYX_JOIN, {.changed = WYX_PROPOSED_STATE_VALUE, .current = "now", .proposed = "next"});
-  expect(member, "now/next", {});
-  approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .current = "state", .members = {kOther, kOwn}});
-  expect(member, "state/", {kOther, kOwn});
-  EXPECT_EQ(member.getId(), kOwn);
-  phase(WYX_STATE_VALUE_CHANGE,
-        {.by = kOther, .changed = WYX_PROPOSED_STATE_VALUE, .current = "ignored", .proposed = "next"});
-  expect(member, "state/next", {kOther, kOwn});
-  phase(WYX_STATE_VALUE_CHANGE, {.by = kOther, .phase = 2, .phases = 3});
-  expect(member, "state/next", {kOther, kOwn});
-  phase(WYX_STATE_VALUE_CHANGE, {.by = kOther, .phase = 2, .phases = 1});
-  expect(member, "state/", {kOther, kOwn});
-  approve(WYX_STATE_VALUE_CHANGE, {.by = kOther, .current = "one", .proposed = "two", .members = {kOwn}});
-  expect(member, "one/two", {kOther, kOwn});
-  approve(WYX_JOIN, {.by = kOther, .changed = WYX_UPDATED_MEMBERSHIP, .current = "left", .members = {kOwn}});
-  expect(member, "left/", {kOwn});
-  reject(WYX_STATE_VALUE_CHANGE, {.current = "back", .proposed = "two"});
-  delayedError(WYX_JOIN, WYX_COLLIDE);
-  expect(member, "back/two", {});
-  member.joinGroup();
-  expect(member, "/", {});
-  EXPECT_EQ(member.getOldClientState(), GS_IAM_IDLE);
-  member.joinGroup();
-  EXPECT_EQ(member.getOldClientState(), GS_IAM_JOINING) << "moves also without a change";
-
-  api.token = 13;
-  watcher.subscribeGroup();
-  subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_STATE,
-               {.current = "v", .members = {kOwn}, .changing = {kOther}, .to = 13});
-  expect(watcher, "v/", {kOwn});
-  subscription(WYX_SUBSCRIPTION_DELTA_JOIN, {.current = "w", .changing = {kOther}, .to = 13});
-  expect(watcher, "v/", {kOwn, kOther});
-  subscription(WYX_SUBSCRIPTION_DELTA_LEAVE, {.changing = {kOwn}, .to = 13});
-  expect(watcher, "v/", {kOther});
-  delayedError(WYX_SUBSCRIPTION, WYX_COLLIDE, 13);
-  EXPECT_EQ(watcher.getClientState(), GS_IAM_IDLE);
-}
-
 TEST_F(Routing, ClientOfAToken_isTheEarliestThatIsNotIdle) {
   mortal->joinGroup();
   approve(WYX_JOIN);
   EXPECT_EQ(mortal->getClientState(), GS_IAM_JOINED);
+  member.joinGroup();
   member.joinGroup();  // with the same token
-  approve(WYX_JOIN);
+  EXPECT_EQ(member.getOldClientState(), GS_IAM_JOINING) << "moves also without a change";
+  approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .members = {kOwn}});
   EXPECT_EQ(member.getClientState(), GS_IAM_JOINED);
+  EXPECT_EQ(member.getMemberCount(), 1);
+  wyx_provider_t id = {};
+  EXPECT_EQ(member.getMemberAt(-1, &id) + member.getMemberAt(1, &id) + member.getMemberAt(0, nullptr), 0);
   announce(WYX_GROUP_DISSOLVED);
+  EXPECT_EQ(member.getMemberCount(), 0);
   EXPECT_EQ(member.getToken(), -1);
   EXPECT_EQ(mortal->getToken(), kToken);
 }

@@ -77,8 +77,7 @@ class RecordingApi {
     std::string state;
     if (watched_ != nullptr) {
       replace(lowHex(reinterpret_cast<uintptr_t>(watched_)).c_str(), "@");
-      state = std::string("[") + (gscl_GSClientStateName(watched_->getClientState()) + 7) + "/" +
-              std::to_string(watched_->getToken()) + "]";
+      state = stateOf(*watched_);
     }
     replace(lowHex(pthread_self()).c_str(), "#");
     replace("Prov\\[g,Id=", "P[");
@@ -87,6 +86,25 @@ class RecordingApi {
     std::lock_guard<std::mutex> lock(mutex_);
     if (std::exchange(state_, state) != state) events_.push_back(state);
     events_.push_back(what);
+  }
+  static std::string stateOf(GSClient& client) {
+    std::string state = std::string("[") + (gscl_GSClientStateName(client.getClientState()) + 7) + "/" +
+                        std::to_string(client.getToken());
+    GSStateValue current, proposed;
+    client.getCurrentStateValue(current);
+    client.getProposedStateValue(proposed);
+    for (GSStateValue* value : {&current, &proposed}) {
+      state += value == &current ? " " : "/";
+      if (value->getValue() != nullptr) {
+        state.append(value->getValue()->gs_state, static_cast<size_t>(value->getValue()->gs_length));
+      }
+    }
+    wyx_provider_t id = {};
+    for (int i = 0; client.getMemberAt(i, &id) == 1; ++i) {
+      state += " " + std::to_string(id._gs_provider_info._gs_instance_number) + "." +
+               std::to_string(id._gs_provider_info._gs_node_number);
+    }
+    return state + "]";
   }
   /// What was recorded since the last call.
   Lines take() {

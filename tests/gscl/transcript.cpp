@@ -35,6 +35,19 @@ class Transcript : public ClientTest {
     finish(step, expected);
   }
 
+  /// Waits without patience and records the result and the summary in numbers.
+  void wait(GSClient& client) {
+    const timespec past = {1, 0};
+    wyx_notification_type_t type = {};
+    wyx_notification_summary_t sum = {{}, {}, WYX_PROPOSED_MEMBERSHIP, WYX_TIME_LIMIT_EXCEEDED, {}, WYX_EXISTS};
+    const GSWaitForRC rc = client.waitForNotification(GS_TRIGGER_AFTER_CALLBACK, &past, &type, &sum);
+    std::ostringstream result;
+    result << "= " << gscl_GSWaitForRCName(rc) << ' ' << type << ": " << sum.gs_notification_type << ' '
+           << sum.gs_protocol_type << ' ' << sum.gs_whats_changed << ' ' << sum.gs_summary_code << ' '
+           << sum.gs_subscription_type << ' ' << sum.gs_delayed_return_code;
+    api.record(result.str());
+  }
+
   std::map<std::string, std::function<void()>> steps;
 
  private:
@@ -93,10 +106,23 @@ TEST_F(Transcript, Provider) {
       {"expel", [&] { made(member.expelMembers(&expel)); }},
       {"attributes", [&] { made(member.change_attributes(attributes, WYX_1_PHASE, 0)); }},
       {"vote", [&] { made(member.vote(WYX_VOTE_APPROVE, WYX_VOTE_REJECT, &value, &message)); }},
-      {"own join in phase", [] { phase(WYX_JOIN); }},
-      {"own join rejected", [] { reject(WYX_JOIN); }},
-      {"own join approved", [] { approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .members = {kOwn}}); }},
-      {"other's join approved", [] { approve(WYX_JOIN, {.by = kOther}); }},
+      {"wait", [&] { wait(member); }},
+      {"own join in phase",
+       [] { phase(WYX_JOIN, {.changed = WYX_PROPOSED_STATE_VALUE, .current = "now", .proposed = "next"}); }},
+      {"own join rejected", [] { reject(WYX_JOIN, {.current = "left"}); }},
+      {"own join approved",
+       [] {
+         approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .current = "one", .members = {kOther, kOwn}});
+       }},
+      {"other's join approved",
+       [] { approve(WYX_JOIN, {.by = kOther, .current = "two", .proposed = "three", .members = {kOwn}}); }},
+      {"first phase",
+       [] {
+         phase(WYX_EXPEL,
+               {.by = kOther, .changed = WYX_PROPOSED_STATE_VALUE, .current = "ignored", .proposed = "next"});
+       }},
+      {"second phase", [] { phase(WYX_EXPEL, {.by = kOther, .phase = 2, .phases = 3}); }},
+      {"only phase", [] { phase(WYX_EXPEL, {.by = kOther, .phase = 2, .phases = 1}); }},
       {"failure approved", [] { approve(WYX_FAILURE_LEAVE, {.by = kOther}); }},
       {"failure rejected", [] { reject(WYX_FAILURE_LEAVE); }},
       {"delayed error", [] { delayedError(WYX_STATE_VALUE_CHANGE, WYX_COLLIDE); }},
@@ -120,7 +146,7 @@ TEST_F(Transcript, Provider) {
   api.watch(&member);
   play(R"(
 > goodbye
-[IDLE/-1]
+[IDLE/-1 /]
 A P[-1/-1,T=-1] was already out-of-group.
 = WYX_NOT_OK
 > join
@@ -128,17 +154,19 @@ A GSProvider::joinGroup(P[-1/-1,T=-1]) begins
 A stub_join_group(P[-1/-1,T=-1]) is issued
 D beginTransaction @
 wyx_join(-1)
-[IDLE/12]
+[IDLE/12 /]
 A Client[P[-1/-1,T=12]] ClientState: GS_IAM_IDLE to GS_IAM_JOINING.
-[JOINING/12]
+[JOINING/12 /]
 D startProtocolRequested(P[-1/-1,T=12]) type=WYX_JOIN
 D endTransaction @
 A stub_join_group(P[-1/-1,T=12]) token=12 sync_rc=WYX_OK
 A GSProvider::joinGroup(P[-1/-1,T=12]) returns  sync_rc=WYX_OK.
 = WYX_OK
 > own join in phase
+[JOINING/12 now/]
 A C::stub_nPhaseCb(P[-1/-1,T=12]) protocol=WYX_JOIN token=12, sumCode=WYX_EXPLICIT_APPROVE, \
 notification=WYX_N_PHASE_NOTIFICATION
+[JOINING/12 now/next]
 before mine
 -> nPhaseCb
 A nPhaseCb(P[-1/-1,T=12]) for WYX_JOIN
@@ -146,7 +174,7 @@ after P[-1/-1,T=12] N_PHASE WYX_JOIN
 > own join rejected
 A C::stub_rejectCb(P[-1/-1,T=12]) protocol=WYX_JOIN sumCode=WYX_EXPLICIT_REJECT, myId=-1 provider_token=12
 A Client[P[-1/-1,T=12]] ClientState: GS_IAM_JOINING to GS_IAM_IDLE.
-[IDLE/12]
+[IDLE/12 left/]
 before mine
 -> rejectedCb
 A rejectedCb(P[-1/-1,T=12]) for WYX_JOIN
@@ -155,7 +183,7 @@ after P[-1/-1,T=12] REJECTED WYX_JOIN
 > join: WYX_EXISTS
 A GSProvider::joinGroup(P[-1/-1,T=12]) begins
 A stub_join_group(P[-1/-1,T=12]) is issued
-[IDLE/-1]
+[IDLE/-1 left/]
 D beginTransaction @
 wyx_join(-1)
 A Client[P[-1/-1,T=-1]] ClientState: GS_IAM_IDLE to GS_IAM_IDLE.
@@ -169,9 +197,9 @@ A C::stub_goodbye_group(P[-1/-1,T=12]) is issued
 D beginTransaction @
 wyx_goodbye(12)
 A stub_goodbye_group(P[-1/-1,T=12]) token=12 sync_rc=WYX_BAD_MEMBER_TOKEN, and removed
-[JOINING/-1]
+[JOINING/-1 /]
 A Client[P[-1/-1,T=-1]] ClientState: GS_IAM_JOINING to GS_IAM_IDLE.
-[IDLE/-1]
+[IDLE/-1 /]
 D endTransaction @
 A P[-1/-1,T=-1] issued goodbye and get sync_rc=WYX_BAD_MEMBER_TOKEN.
 = WYX_BAD_MEMBER_TOKEN
@@ -179,8 +207,9 @@ A P[-1/-1,T=-1] issued goodbye and get sync_rc=WYX_BAD_MEMBER_TOKEN.
 > own join approved
 A C::stub_approvedCb(P[-1/-1,T=12]) for prot=WYX_JOIN  sumCode=WYX_EXPLICIT_APPROVE, whats_changed=0x20
 A Client[P[3/7,T=12]] ClientState: GS_IAM_JOINING to GS_IAM_JOINED.
-[JOINED/12]
+[JOINED/12 /]
 A C::stub_approved: set new members
+[JOINED/12 one/ 4.8 3.7]
 before mine
 D calling approvedCb()
 -> approvedCb
@@ -189,9 +218,20 @@ A My Join(P[3/7,T=12]) is approved
 D returned from approvedCb()
 after P[3/7,T=12] APPROVED WYX_JOIN
 A C::stub_approvedCb(P[3/7,T=12]) done
+> wait
+D IsAlreadySatisfied(#) OK where_recv=2 where=102
+D GSClient::waitFor(P[3/7,T=12]) where=102, notify=WYX_APPROVED_NOTIFICATION \
+sumCode=WYX_EXPLICIT_APPROVE _SATISFIED
+= GS_NOTIFICATION_RECEIVED 4: 4 1 32 1 0 0
+> wait
+D IsAlready(#) NOT_OK2 where_recv=0 wf_where=102
+D IsAlready(#) NOT_OK2 where_recv=0 wf_where=102
+D GSClient::waitFor(P[3/7,T=12]) where=102, notify=WYX_APPROVED_NOTIFICATION is not matched..so wait again
+= GS_NOTIFICATION_PENDING -1: -1 -1 1 16 0 2
 > other's join approved
 A C::stub_approvedCb(P[3/7,T=12]) for prot=WYX_JOIN  sumCode=WYX_EXPLICIT_APPROVE, whats_changed=0x0
 A C::stub_approvedCb(P[3/7,T=12])- I was already joined.. ID=[3/7]. my_req=0
+[JOINED/12 two/three 4.8 3.7]
 before not mine
 D calling approvedCb()
 -> approvedCb
@@ -238,6 +278,13 @@ wyx_vote(12, 1, 5, 3, 3)
 D setVoteIsSubmitted(P[3/7,T=12])
 A stub_vote(P[3/7,T=12]) token=12 sync_rc=WYX_OK
 = WYX_OK
+>~ first phase
+[JOINED/12 two/next 4.8 3.7]
+before not mine
+after not mine
+>> second phase
+>~ only phase
+[JOINED/12 two/ 4.8 3.7]
 >~ failure approved
 before not mine
 A P[3/7,T=12] Failure approved.
@@ -251,6 +298,8 @@ A C::stub_delayedErrorCb(P[3/7,T=12]) protocol=WYX_STATE_VALUE_CHANGE token=12, 
 before mine
 -> delayedErrorCb
 after P[3/7,T=12] DELAYED_ERROR WYX_STATE_VALUE_CHANGE
+>~ wait
+= GS_NOTIFICATION_RECEIVED 2: 2 5 0 0 0 16
 > announcement
 A C::stub_announceCb(P[3/7,T=12]) summary=WYX_DEFAULT_APPROVE|WYX_DISSOLVED
 before not mine
@@ -267,14 +316,17 @@ W stub_nPhaseCb token 99 not found
 W stub_announcementCb provider_token=99 not found
 W Subscriber 12 is not found...ERROR
 W C::stub_delayedErrCb - unable to find a client(token=99) for protocol=WYX_LEAVE
+>> leave
 > end
 A C::stub_announceCb(P[3/7,T=12]) summary=WYX_GROUP_DISSOLVED
 A Client[P[3/7,T=12]] ClientState: GS_IAM_JOINED to GS_IAM_IDLE.
-[IDLE/-1]
+[IDLE/-1 /]
 before mine
 -> announcementCb
 A announcementCb(P[3/7,T=-1]) WYX_GROUP_DISSOLVED
 after P[3/7,T=-1] ANNOUNCEMENT empty-request
+>~ wait
+= GS_NOTIFICATION_RECEIVED 6: 6 -1 0 256 0 0
 )");
 }
 
@@ -283,9 +335,19 @@ TEST_F(Transcript, Subscriber) {
   steps = {
       {"subscribe", [&] { made(watcher.subscribeGroup()); }},
       {"unsubscribe", [&] { made(watcher.unsubscribeGroup()); }},
-      {"full", [] { subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_DELTA_JOIN); }},
-      {"joins", [] { subscription(WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_DELTA_LEAVE); }},
-      {"leaves", [] { subscription(WYX_SUBSCRIPTION_DELTA_LEAVE); }},
+      {"wait", [&] { wait(watcher); }},
+      {"full",
+       [] {
+         subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_STATE,
+                      {.current = "v", .members = {kOwn}, .changing = {kOther}});
+       }},
+      {"joins",
+       [] {
+         subscription(WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_DELTA_LEAVE,
+                      {.current = "ignored", .changing = {kOther}});
+       }},
+      {"leaves", [] { subscription(WYX_SUBSCRIPTION_DELTA_LEAVE, {.changing = {kOwn}}); }},
+      {"refused", [] { delayedError(WYX_SUBSCRIPTION, WYX_COLLIDE); }},
       {"other", [] { subscription(WYX_SUBSCRIPTION_SPECIAL_DATA); }},
       {"dissolved", [] { subscription(WYX_SUBSCRIPTION_DISSOLVED | WYX_SUBSCRIPTION_MEMBERSHIP); }},
       {"died", [] { subscription(WYX_SUBSCRIPTION_GS_HAS_DIED); }},
@@ -293,7 +355,7 @@ TEST_F(Transcript, Subscriber) {
   api.watch(&watcher);
   play(R"(
 > unsubscribe
-[IDLE/-1]
+[IDLE/-1 /]
 A stub_unsubscribe_group(Subs[G=g,T=-1]) cannot be issued because it is not subscribed.
 A Subs[G=g,T=-1]: unsubscribe sync_rc=WYX_BAD_MEMBER_TOKEN
 = WYX_BAD_MEMBER_TOKEN
@@ -301,7 +363,7 @@ A Subs[G=g,T=-1]: unsubscribe sync_rc=WYX_BAD_MEMBER_TOKEN
 A stub_subscribe_group(Subs[G=g,T=-1]) is issued
 D beginTransaction @
 wyx_subscribe(-1)
-[SUBSCRIBING/12]
+[SUBSCRIBING/12 /]
 D startProtocolRequested(Subs[G=g,T=12]) type=WYX_SUBSCRIPTION
 D endTransaction @
 A stub_subscribe_group(Subs[G=g,T=12]) token=12 sync_rc=WYX_OK
@@ -311,37 +373,42 @@ A Subs[G=g,T=12]: subscribe sync_rc=WYX_OK
 > unsubscribe
 D beginTransaction @
 wyx_unsubscribe(12)
-[IDLE/-1]
+[IDLE/-1 /]
 D endTransaction @
 A stub_unsubscribe_group(Subs[G=g,T=-1]) returns sync_rc=WYX_OK
 A Subs[G=g,T=-1]: unsubscribe sync_rc=WYX_OK
 = WYX_OK
 >> subscribe
 > full
-[SUBSCRIBED/12]
+[SUBSCRIBED/12 /]
 A Subs[G=g,T=12] is now subscribed.
 A Subs[G=g,T=12] received FULL_MBRSHIP.
+[SUBSCRIBED/12 v/ 3.7]
 before mine
 -> subscribeCb
-A subscribeCb(Subs[G=g,T=12]) WYX_SUBSCRIPTION_DELTA_JOIN|_MEMBERSHIP
+A subscribeCb(Subs[G=g,T=12]) WYX_SUBSCRIPTION_STATE|_DELTA_JOIN|_MEMBERSHIP
 after Subs[G=g,T=12] SUBSCRIPTION WYX_SUBSCRIPTION
+>~ wait
+D IsAlreadySatisfied(#) OK...where_recv=2 where=102
+= GS_NOTIFICATION_RECEIVED 7: 7 10 0 0 11 0
 >~ joins
 A Subs[G=g,T=12] received DELTA_JOINS.
+[SUBSCRIBED/12 v/ 3.7 4.8]
 >~ leaves
 A Subs[G=g,T=12] received DELTA_LEAVES.
+[SUBSCRIBED/12 v/ 4.8]
 >~ other
 A WHATELSE=40
-> dissolved
+>~ dissolved
 A Subs[G=g,T=12] is dissolved.
-[IDLE/12]
-before mine
--> subscribeCb
-A subscribeCb(Subs[G=g,T=12]) subscription_type[0x88]
-after Subs[G=g,T=12] SUBSCRIPTION WYX_SUBSCRIPTION
+[IDLE/12 v/]
 >> subscribe
 >~ died
 A Subs[G=g,T=12] is dissolved.
-[IDLE/12]
+[IDLE/12 /]
+>> subscribe
+>~ refused
+[IDLE/12 /]
 )");
 }
 

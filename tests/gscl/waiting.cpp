@@ -53,48 +53,6 @@ class Waiting : public ClientTest {
   }
 };
 
-TEST_F(Waiting, NotificationBeforeTheWait_isNotLostAndNotReportedTwice) {
-  member.joinGroup();
-  approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP});
-  EXPECT_EQ(waitFor(member, kMinute).rc, GS_WAITFOR_RECEIVED);
-  const Outcome second = waitFor(member, kPast);
-  EXPECT_EQ(second.rc, GS_WAITFOR_PENDING);
-  EXPECT_EQ(second.type, -1);
-  EXPECT_EQ(second.summary.gs_notification_type, -1);
-  EXPECT_EQ(second.summary.gs_protocol_type, -1);
-  EXPECT_EQ(second.summary.gs_whats_changed, WYX_PROPOSED_MEMBERSHIP) << "left alone";
-  approve(WYX_STATE_VALUE_CHANGE);
-  EXPECT_EQ(waitFor(member, kPast).rc, GS_WAITFOR_PENDING) << "a satisfied block records nothing";
-}
-
-TEST_F(Waiting, SummaryByNotification) {
-  const auto expect = [&](GSClient& client, wyx_notification_summary_t expected) {
-    const Outcome out = waitFor(client, kMinute);
-    EXPECT_EQ(out.rc, GS_WAITFOR_RECEIVED);
-    EXPECT_EQ(out.type, expected.gs_notification_type);
-    EXPECT_EQ(memcmp(&out.summary, &expected, sizeof expected), 0) << expected.gs_notification_type;
-  };
-  const auto kNone = static_cast<wyx_request_t>(-1);
-  joined(member);
-  change(member);
-  approve(WYX_STATE_VALUE_CHANGE, {.changed = WYX_UPDATED_STATE_VALUE});
-  expect(member, {WYX_APPROVED_NOTIFICATION,
-                  WYX_STATE_VALUE_CHANGE,
-                  WYX_UPDATED_STATE_VALUE,
-                  WYX_EXPLICIT_APPROVE,
-                  {},
-                  WYX_OK});
-  change(member);
-  delayedError(WYX_LEAVE, WYX_COLLIDE);
-  expect(member, {WYX_DELAYED_ERROR_NOTIFICATION, WYX_LEAVE, {}, {}, {}, WYX_COLLIDE});
-  change(member);
-  announce(WYX_GROUP_DISSOLVED);  // recorded, so it counts although the client is idle
-  expect(member, {WYX_ANNOUNCEMENT_NOTIFICATION, kNone, {}, WYX_GROUP_DISSOLVED, {}, WYX_OK});
-  watcher.subscribeGroup();
-  subscription(WYX_SUBSCRIPTION_STATE);
-  expect(watcher, {WYX_SUBSCRIPTION_NOTIFICATION, WYX_SUBSCRIPTION, {}, {}, WYX_SUBSCRIPTION_STATE, WYX_OK});
-}
-
 TEST_F(Waiting, UnsupportedForms_touchNothing) {
   member.joinGroup();
   for (int form : {0x1, 0x3, 0x202, 0x302, 0x201, 0x200}) {
@@ -171,7 +129,6 @@ TEST_F(Waiting, OnlyOwnProtocols_areRecordedInTheBlocks) {
   approve(WYX_FAILURE_LEAVE);
   announce(WYX_RESPONSIVENESS_NO_RESPONSE);
   EXPECT_EQ(waitFor(member, kPast).rc, GS_WAITFOR_PENDING);
-
   member.action = [&] {
     member.action = nullptr;
     member.leaveGroup(0, WYX_1_PHASE, 0);
@@ -227,29 +184,6 @@ TEST_F(Waiting, FifthThread_takesTheSatisfiedBlockElseTheOldest) {
   EXPECT_EQ(e.wait(), GS_WAITFOR_PENDING);
   EXPECT_EQ(a.wait(), GS_WAITFOR_RECEIVED);
   EXPECT_EQ(c.wait(), GS_WAITFOR_RECEIVED);
-}
-
-TEST_F(Waiting, Lines_ofOneAnsweredRequest) {
-  joined(member);
-  change(member);
-  api.take();
-  waitFor(member, kPast);
-  EXPECT_EQ(api.take(),
-            (Lines{"D IsAlready(#) NOT_OK2 where_recv=0 wf_where=102",
-                   "D IsAlready(#) NOT_OK2 where_recv=0 wf_where=102",
-                   "D GSClient::waitFor(P[3/7,T=12]) where=102, notify=empty-notification is not matched..so wait "
-                   "again"}));
-  approve(WYX_STATE_VALUE_CHANGE);
-  api.take();
-  waitFor(member, kMinute);
-  EXPECT_EQ(api.take(), (Lines{"D IsAlreadySatisfied(#) OK where_recv=2 where=102",
-                               "D GSClient::waitFor(P[3/7,T=12]) where=102, notify=WYX_APPROVED_NOTIFICATION "
-                               "sumCode=WYX_EXPLICIT_APPROVE _SATISFIED"}));
-  api.token = 13;
-  subscribed(watcher);
-  api.take();
-  waitFor(watcher, kMinute);
-  EXPECT_EQ(api.take().front(), "D IsAlreadySatisfied(#) OK...where_recv=2 where=102");
 }
 
 TEST_F(Waiting, CancelledWait_givesTheMutexBack) {
