@@ -193,21 +193,20 @@ TEST_F(Routing, OwnRequest_byProtocolAndProposer) {
 }
 
 TEST_F(Routing, ClientOfAToken_isTheEarliestThatIsNotIdle) {
-  mortal->joinGroup();
-  approve(WYX_JOIN);
-  EXPECT_EQ(mortal->getClientState(), GS_IAM_JOINED);
+  joined(*mortal);
   member.joinGroup();
   member.joinGroup();  // with the same token
   EXPECT_EQ(member.getOldClientState(), GS_IAM_JOINING) << "moves also without a change";
   approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .members = {kOwn}});
-  EXPECT_EQ(member.getClientState(), GS_IAM_JOINED);
-  EXPECT_EQ(member.getMemberCount(), 1);
+  EXPECT_EQ(member.getClientState(), GS_IAM_JOINED) << "registered first";
   wyx_provider_t id = {};
   EXPECT_EQ(member.getMemberAt(-1, &id) + member.getMemberAt(1, &id) + member.getMemberAt(0, nullptr), 0);
+  delayedError(WYX_JOIN, WYX_COLLIDE);
+  EXPECT_EQ(member.getMemberCount(), 0) << "idle, although the list is still there";
+  EXPECT_EQ(member.getToken(), kToken);
   announce(WYX_GROUP_DISSOLVED);
-  EXPECT_EQ(member.getMemberCount(), 0);
-  EXPECT_EQ(member.getToken(), -1);
-  EXPECT_EQ(mortal->getToken(), kToken);
+  EXPECT_EQ(mortal->getToken(), -1);
+  EXPECT_EQ(member.getToken(), kToken);
 }
 
 TEST_F(Routing, Callback_mayDestroyItsOwnClient) {

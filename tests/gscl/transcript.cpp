@@ -55,8 +55,8 @@ class Transcript : public ClientTest {
     if (step.empty()) return;
     const size_t colon = step.find(": "), name = step.find(' ') + 1;
     api.answer = WYX_OK;
-    while (colon != step.npos && gscl_rc_name(api.answer) != step.substr(colon + 2)) {
-      api.answer = static_cast<wyx_rc_t>(api.answer + 1);
+    for (int rc = 1; colon != step.npos && rc <= WYX_INVALID_SOURCE_GROUP; ++rc) {
+      if (gscl_rc_name(wyx_rc_t(rc)) == step.substr(colon + 2)) api.answer = wyx_rc_t(rc);
     }
     api.take();
     steps.at(step.substr(name, colon == step.npos ? colon : colon - name))();
