@@ -90,61 +90,7 @@ class Transcript : public ClientTest {
 
 char text[] = "value";
 
-TEST_F(Transcript, Provider) {
-  const auto made = [&](wyx_rc_t rc) { api.record("= " + std::string(gscl_rc_name(rc))); };
-  const wyx_state_value_t value = {5, text};
-  const wyx_provider_message_t message = {3, text};
-  const wyx_expel_request_t expel = {WYX_1_PHASE, 2, {0, nullptr}, 4, text};
-  wyx_group_attributes_t attributes = {};
-  attributes.gs_client_version = 9;
-  steps = {
-      {"join", [&] { made(member.joinGroup()); }},
-      {"goodbye", [&] { made(member.goodbyeGroup()); }},
-      {"change", [&] { made(member.changeStateValue(value, WYX_N_PHASE, 30)); }},
-      {"message", [&] { made(member.send_message(message, WYX_1_PHASE, 0)); }},
-      {"leave", [&] { made(member.leaveGroup(1, WYX_N_PHASE, 30)); }},
-      {"expel", [&] { made(member.expelMembers(&expel)); }},
-      {"attributes", [&] { made(member.change_attributes(attributes, WYX_1_PHASE, 0)); }},
-      {"vote", [&] { made(member.vote(WYX_VOTE_APPROVE, WYX_VOTE_REJECT, &value, &message)); }},
-      {"wait", [&] { wait(member); }},
-      {"own join in phase",
-       [] { phase(WYX_JOIN, {.changed = WYX_PROPOSED_STATE_VALUE, .current = "now", .proposed = "next"}); }},
-      {"own join rejected", [] { reject(WYX_JOIN, {.current = "left"}); }},
-      {"own join approved",
-       [] {
-         approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .current = "one", .members = {kOther, kOwn}});
-       }},
-      {"other's join approved",
-       [] { approve(WYX_JOIN, {.by = kOther, .current = "two", .proposed = "three", .members = {kOwn}}); }},
-      {"first phase",
-       [] {
-         phase(WYX_EXPEL,
-               {.by = kOther, .changed = WYX_PROPOSED_STATE_VALUE, .current = "ignored", .proposed = "next"});
-       }},
-      {"second phase", [] { phase(WYX_EXPEL, {.by = kOther, .phase = 2, .phases = 3}); }},
-      {"only phase", [] { phase(WYX_EXPEL, {.by = kOther, .phase = 2, .phases = 1}); }},
-      {"failure approved", [] { approve(WYX_FAILURE_LEAVE, {.by = kOther}); }},
-      {"failure rejected", [] { reject(WYX_FAILURE_LEAVE); }},
-      {"delayed error", [] { delayedError(WYX_STATE_VALUE_CHANGE, WYX_COLLIDE); }},
-      {"announcement", [] { announce(WYX_GROUP_DISSOLVED | WYX_DEFAULT_APPROVE); }},
-      {"end", [] { announce(WYX_GROUP_DISSOLVED); }},
-      {"merge", [] { merge(); }},
-      {"for nobody",
-       [&] {
-         approve(WYX_JOIN, {.to = 99});
-         reject(WYX_JOIN, {.to = 13});  // a subscriber's
-         phase(WYX_JOIN, {.to = 99});
-         announce(WYX_GROUP_DISSOLVED, 99);
-         merge(99);
-         subscription(WYX_SUBSCRIPTION_STATE);
-         delayedError(WYX_LEAVE, WYX_NOT_OK, 99);
-       }},
-  };
-  api.token = 13;
-  watcher.subscribeGroup();
-  api.token = kToken;
-  api.watch(&member);
-  play(R"(
+const char kProviderStory[] = R"(
 > goodbye
 [IDLE/-1 /]
 A P[-1/-1,T=-1] was already out-of-group.
@@ -327,33 +273,66 @@ A announcementCb(P[3/7,T=-1]) WYX_GROUP_DISSOLVED
 after P[3/7,T=-1] ANNOUNCEMENT empty-request
 >~ wait
 = GS_NOTIFICATION_RECEIVED 6: 6 -1 0 256 0 0
-)");
+)";
+
+TEST_F(Transcript, Provider_fromJoinToTheEnd_stepByStep) {
+  const auto made = [&](wyx_rc_t rc) { api.record("= " + std::string(gscl_rc_name(rc))); };
+  const wyx_state_value_t value = {5, text};
+  const wyx_provider_message_t message = {3, text};
+  const wyx_expel_request_t expel = {WYX_1_PHASE, 2, {0, nullptr}, 4, text};
+  wyx_group_attributes_t attributes = {};
+  attributes.gs_client_version = 9;
+  steps = {
+      {"join", [&] { made(member.joinGroup()); }},
+      {"goodbye", [&] { made(member.goodbyeGroup()); }},
+      {"change", [&] { made(member.changeStateValue(value, WYX_N_PHASE, 30)); }},
+      {"message", [&] { made(member.send_message(message, WYX_1_PHASE, 0)); }},
+      {"leave", [&] { made(member.leaveGroup(1, WYX_N_PHASE, 30)); }},
+      {"expel", [&] { made(member.expelMembers(&expel)); }},
+      {"attributes", [&] { made(member.change_attributes(attributes, WYX_1_PHASE, 0)); }},
+      {"vote", [&] { made(member.vote(WYX_VOTE_APPROVE, WYX_VOTE_REJECT, &value, &message)); }},
+      {"wait", [&] { wait(member); }},
+      {"own join in phase",
+       [] { phase(WYX_JOIN, {.changed = WYX_PROPOSED_STATE_VALUE, .current = "now", .proposed = "next"}); }},
+      {"own join rejected", [] { reject(WYX_JOIN, {.current = "left"}); }},
+      {"own join approved",
+       [] {
+         approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .current = "one", .members = {kOther, kOwn}});
+       }},
+      {"other's join approved",
+       [] { approve(WYX_JOIN, {.by = kOther, .current = "two", .proposed = "three", .members = {kOwn}}); }},
+      {"first phase",
+       [] {
+         phase(WYX_EXPEL,
+               {.by = kOther, .changed = WYX_PROPOSED_STATE_VALUE, .current = "ignored", .proposed = "next"});
+       }},
+      {"second phase", [] { phase(WYX_EXPEL, {.by = kOther, .phase = 2, .phases = 3}); }},
+      {"only phase", [] { phase(WYX_EXPEL, {.by = kOther, .phase = 2, .phases = 1}); }},
+      {"failure approved", [] { approve(WYX_FAILURE_LEAVE, {.by = kOther}); }},
+      {"failure rejected", [] { reject(WYX_FAILURE_LEAVE); }},
+      {"delayed error", [] { delayedError(WYX_STATE_VALUE_CHANGE, WYX_COLLIDE); }},
+      {"announcement", [] { announce(WYX_GROUP_DISSOLVED | WYX_DEFAULT_APPROVE); }},
+      {"end", [] { announce(WYX_GROUP_DISSOLVED); }},
+      {"merge", [] { merge(); }},
+      {"for nobody",
+       [&] {
+         approve(WYX_JOIN, {.to = 99});
+         reject(WYX_JOIN, {.to = 13});  // a subscriber's
+         phase(WYX_JOIN, {.to = 99});
+         announce(WYX_GROUP_DISSOLVED, 99);
+         merge(99);
+         subscription(WYX_SUBSCRIPTION_STATE);
+         delayedError(WYX_LEAVE, WYX_NOT_OK, 99);
+       }},
+  };
+  api.token = 13;
+  watcher.subscribeGroup();
+  api.token = kToken;
+  api.watch(&member);
+  play(kProviderStory);
 }
 
-TEST_F(Transcript, Subscriber) {
-  const auto made = [&](wyx_rc_t rc) { api.record("= " + std::string(gscl_rc_name(rc))); };
-  steps = {
-      {"subscribe", [&] { made(watcher.subscribeGroup()); }},
-      {"unsubscribe", [&] { made(watcher.unsubscribeGroup()); }},
-      {"wait", [&] { wait(watcher); }},
-      {"full",
-       [] {
-         subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_STATE,
-                      {.current = "v", .members = {kOwn}, .changing = {kOther}});
-       }},
-      {"joins",
-       [] {
-         subscription(WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_DELTA_LEAVE,
-                      {.current = "ignored", .changing = {kOther}});
-       }},
-      {"leaves", [] { subscription(WYX_SUBSCRIPTION_DELTA_LEAVE, {.changing = {kOwn}}); }},
-      {"refused", [] { delayedError(WYX_SUBSCRIPTION, WYX_COLLIDE); }},
-      {"other", [] { subscription(WYX_SUBSCRIPTION_SPECIAL_DATA); }},
-      {"dissolved", [] { subscription(WYX_SUBSCRIPTION_DISSOLVED | WYX_SUBSCRIPTION_MEMBERSHIP); }},
-      {"died", [] { subscription(WYX_SUBSCRIPTION_GS_HAS_DIED); }},
-  };
-  api.watch(&watcher);
-  play(R"(
+const char kSubscriberStory[] = R"(
 > unsubscribe
 [IDLE/-1 /]
 A stub_unsubscribe_group(Subs[G=g,T=-1]) cannot be issued because it is not subscribed.
@@ -409,10 +388,35 @@ A Subs[G=g,T=12] is dissolved.
 >> subscribe
 >~ refused
 [IDLE/12 /]
-)");
+)";
+
+TEST_F(Transcript, Subscriber_fromSubscriptionToTheEnd_stepByStep) {
+  const auto made = [&](wyx_rc_t rc) { api.record("= " + std::string(gscl_rc_name(rc))); };
+  steps = {
+      {"subscribe", [&] { made(watcher.subscribeGroup()); }},
+      {"unsubscribe", [&] { made(watcher.unsubscribeGroup()); }},
+      {"wait", [&] { wait(watcher); }},
+      {"full",
+       [] {
+         subscription(WYX_SUBSCRIPTION_MEMBERSHIP | WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_STATE,
+                      {.current = "v", .members = {kOwn}, .changing = {kOther}});
+       }},
+      {"joins",
+       [] {
+         subscription(WYX_SUBSCRIPTION_DELTA_JOIN | WYX_SUBSCRIPTION_DELTA_LEAVE,
+                      {.current = "ignored", .changing = {kOther}});
+       }},
+      {"leaves", [] { subscription(WYX_SUBSCRIPTION_DELTA_LEAVE, {.changing = {kOwn}}); }},
+      {"refused", [] { delayedError(WYX_SUBSCRIPTION, WYX_COLLIDE); }},
+      {"other", [] { subscription(WYX_SUBSCRIPTION_SPECIAL_DATA); }},
+      {"dissolved", [] { subscription(WYX_SUBSCRIPTION_DISSOLVED | WYX_SUBSCRIPTION_MEMBERSHIP); }},
+      {"died", [] { subscription(WYX_SUBSCRIPTION_GS_HAS_DIED); }},
+  };
+  api.watch(&watcher);
+  play(kSubscriberStory);
 }
 
-TEST_F(Transcript, EndsOfClients) {
+TEST_F(Transcript, Destroyed_clientsSayTheirLastLines) {
   {
     GSProvider provider("g", 3, nullptr);
     joined(provider);
