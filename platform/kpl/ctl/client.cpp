@@ -52,7 +52,13 @@ End Client::ask(const control::Request& request, const Interim& interim) {
   const std::string question = control::encode(request);
   if (!connect_to_master()) return not_reached();
   bool ended = false;
-  const End end = exchange(question, interim, &ended);
+  const End end = [&]() -> End {
+    try {
+      return exchange(question, interim, &ended);
+    } catch (const control::Malformed& error) {
+      return {Result::kNotReached, 0, path_ + " is no kplmstr's: " + error.what()};
+    }
+  }();
   if (!ended) socket_ = platform::Descriptor();  // what comes late would be taken for the next answer
   return end;
 }
@@ -70,7 +76,7 @@ End Client::exchange(const std::string& question, const Interim& interim, bool* 
     const ssize_t length = recv(socket_.get(), packet.data(), packet.size(), 0);
     if (length < 0 && errno != ECONNRESET) return not_reached();
     if (length <= 0)
-      return {Result::kNotReached, 0, "kplmstr has closed the connection: not permitted, or it ended"};
+      return {Result::kNotReached, 0, "kplmstr has closed the connection: not permitted, too many, or it ended"};
     packet.resize(static_cast<std::size_t>(length));
     const Answer answer = control::decode_answer(packet);
     if (const End* end = std::get_if<End>(&answer)) {

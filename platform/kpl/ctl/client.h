@@ -16,8 +16,8 @@ class Client {
   /// Connects at the first request.
   explicit Client(std::string socket_path) : path_(std::move(socket_path)) {}
 
-  /// Waits for the end of the request; `interim` is told what comes before. A master that cannot be asked, or does
-  /// not answer in time, ends it too. Throws control::Malformed for what cannot be sent.
+  /// Waits for the end of the request; `interim` is told what comes before. A master that cannot be asked, does
+  /// not answer in time, or makes no sense, ends it too. Throws control::Malformed for what cannot be sent.
   control::End ask(const control::Request& request, const Interim& interim);
 
  private:

@@ -1,4 +1,5 @@
 // kplctl: asks the KPL master.
+#include <algorithm>
 #include <cstdio>
 
 #include "ctl/client.h"
@@ -35,12 +36,24 @@ Outcome ask(Client& client, const kpl::control::Request& request) {
   return outcome;
 }
 
+/// What subsystems say may come from their clients and must not steer a terminal.
+void print_text(FILE* to, std::string text) {
+  std::replace_if(
+      text.begin(), text.end(), [](unsigned char c) { return (c < 0x20 && c != '\n' && c != '\t') || c == 0x7f; },
+      '?');
+  print(to, text);
+}
+
 void print_for_people(const Outcome& outcome) {
-  for (const std::string& message : outcome.messages) print(stdout, message + "\n");
-  print(stdout, kpl::ctl::long_status(outcome.lines));
+  for (const std::string& message : outcome.messages) print_text(stdout, message + "\n");
+  print_text(stdout, kpl::ctl::long_status(outcome.lines));
   if (outcome.end.text.empty()) return;
   const bool good = outcome.end.result == Result::kOk;
-  print(good ? stdout : stderr, (good ? "" : "kplctl: ") + outcome.end.text + "\n");
+  print_text(good ? stdout : stderr, (good ? "" : "kplctl: ") + outcome.end.text + "\n");
+}
+
+kpl::control::End no_such_group(const std::string& group) {
+  return {Result::kWrongState, 0, "there is no subsystem in group '" + group + "'"};
 }
 
 /// `list`, and `status` without --long: the master's own knowledge.
@@ -50,6 +63,9 @@ int tell_subsystems(Client& client, const Options& options) {
     return !options.group.empty() && entry.value("group", "") != options.group;
   };
   std::erase_if(outcome.entries, in_other_group);
+  if (!options.group.empty() && outcome.entries.empty() && outcome.end.result == Result::kOk) {
+    outcome.end = no_such_group(options.group);
+  }
   const bool list = options.request.action == Action::kList;
   if (options.json) {
     json answer = kpl::ctl::to_json(outcome);
@@ -76,7 +92,7 @@ std::vector<std::string> names_of(Client& client, const Options& options, kpl::c
   }
   *end = all.end;
   if (names.empty() && end->result == Result::kOk) {
-    *end = {Result::kWrongState, 0, "there is no subsystem in group '" + options.group + "'"};
+    *end = no_such_group(options.group);
   }
   return names;
 }

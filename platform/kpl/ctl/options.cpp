@@ -13,10 +13,9 @@ constexpr int kMinParameter = -32768;
 constexpr int kMaxParameter = 32767;
 
 constexpr char kFooter[] =
-    "Exit status: 0 done, 1 the subsystem or the master reported an error, 2 wrong use, 3 the master cannot be "
-    "reached,\n4 no such subsystem or not in the state for it, 5 no answer within its time, 6 not supported by "
-    "the "
-    "subsystem";
+    "Exit status: 0 done, 1 the subsystem or the master reported an error, 2 wrong use,\n"
+    "3 the master cannot be reached, 4 no such subsystem or not in the state for it,\n"
+    "5 no answer within its time, 6 not supported by the subsystem";
 
 CLI::App* add_command(CLI::App& app, Options& options, const char* name, const char* help, Action action) {
   CLI::App* command = app.add_subcommand(name, help);
@@ -77,6 +76,11 @@ void check(const Options& options) {
   if (options.request.data.size() > control::kMaxData) {
     throw platform::SettingError("DATA: at most " + std::to_string(control::kMaxData) + " bytes");
   }
+  try {
+    control::encode(options.request);
+  } catch (const control::Malformed& error) {
+    throw platform::SettingError(error.what());
+  }
 }
 
 }  // namespace
@@ -89,7 +93,7 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
       ->capture_default_str()
       ->type_name("PATH");
   app.add_flag("--json", options.json, "Answer in JSON, for scripts");
-  app.require_subcommand(1);
+  app.require_subcommand(0, 1);  // checked below: a wrong one is to be named
   app.fallthrough();
   app.footer(kFooter);
   add_subsystem(add_command(app, options, "start", "Start a subsystem", Action::kStart), options);
@@ -112,6 +116,7 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
   } catch (const CLI::ParseError& error) {
     throw platform::SettingError(platform::first_line(error.what()));
   }
+  if (app.get_subcommands().empty()) throw platform::SettingError("a COMMAND is needed, see --help");
   check(options);
   return options;
 }
