@@ -12,6 +12,7 @@ using platform::Descriptor;
 
 constexpr int kAcceptsAtOnce = 16;                      // before the connected are served again
 constexpr std::size_t kMaxConnections = 256;            // one more is closed at once
+constexpr std::size_t kKeptForRoot = 16;                // of them: the access group cannot lock root out
 constexpr std::size_t kMaxWaiting = 4 * 1024 * 1024;    // bytes; a requester that does not read is closed
 constexpr int kSendBuffer = 512 * 1024;                 // bytes; the system may give less
 constexpr std::chrono::milliseconds kAcceptPause{100};  // when descriptors have run out
@@ -53,7 +54,7 @@ void ControlServer::add_connection(Descriptor socket) {
     log_.warn("connection (pid {}, uid {}): closed: not permitted", peer->pid, peer->uid);
     return;
   }
-  if (connections_.size() >= kMaxConnections) {
+  if (connections_.size() >= kMaxConnections - (peer->uid == 0 ? 0 : kKeptForRoot)) {
     log_.warn("connection (pid {}, uid {}): closed: too many connections", peer->pid, peer->uid);
     return;
   }
