@@ -1,5 +1,6 @@
 // gsd: the group-services daemon, in the foreground or as a daemon.
 #include <sys/resource.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -48,18 +49,28 @@ void serve(gs::daemon::Options options, std::function<gs::daemon::Options()> rer
   log->info("stopped");
 }
 
+/// A daemon's standard error may lead nowhere; whoever starts one looks into the system's log then.
+int fail(const char* problem, int status, bool daemon) {
+  fprintf(stderr, "gsd: %s\n", problem);
+  if (!daemon) return status;
+  openlog("gsd", LOG_PID, LOG_DAEMON);
+  syslog(LOG_ERR, "not started: %s", problem);
+  return status;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
+  bool daemon = false;
   try {
     const auto options = gs::daemon::parse_options(argc, argv);
-    if (options) serve(*options, [=] { return *gs::daemon::parse_options(argc, argv); });
+    if (!options) return 0;
+    daemon = options->daemon;
+    serve(*options, [=] { return *gs::daemon::parse_options(argc, argv); });
     return 0;
   } catch (const gs::daemon::OptionError& error) {
-    fprintf(stderr, "gsd: %s\n", error.what());
-    return kExitBadOption;
+    return fail(error.what(), kExitBadOption, daemon);
   } catch (const std::exception& error) {
-    fprintf(stderr, "gsd: %s\n", error.what());
-    return kExitFailure;
+    return fail(error.what(), kExitFailure, daemon);
   }
 }

@@ -128,9 +128,11 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
         ->type_name(kSettings[i].value);
   }
   bool daemon = false;
-  app.add_flag("--daemon", daemon, "Become a daemon, under the KPL master or from a shell");
+  CLI::Option* as_daemon =
+      app.add_flag("--daemon", daemon, "Become a daemon, under the KPL master or from a shell");
   app.add_option("--ready-fd", ready_fd, "Descriptor that is told \"ready\" once clients can connect")
-      ->type_name("FD");
+      ->type_name("FD")
+      ->excludes(as_daemon);  // a daemon closes what it was started with
   try {
     app.parse(argc, argv);
   } catch (const CLI::Success& asked) {

@@ -35,6 +35,7 @@ class Server : private Transport {
   /// Calls `action` whenever `fd` is readable. One descriptor at most.
   void watch(int fd, std::function<void()> action);
   void set_log_level(spdlog::level::level_enum level) { log_->set_level(level); }
+  void log_error(const std::string& what) { log_->error("{}", what); }
   void set_queue_bound(std::size_t bytes) { sessions_.set_queue_bound(bytes); }
   std::vector<Engine::GroupStatus> groups() const { return sessions_.groups(); }
   std::vector<SessionLayer::SessionStatus> sessions() const { return sessions_.status(); }

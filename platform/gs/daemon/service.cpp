@@ -2,7 +2,9 @@
 
 #include <stdexcept>
 
+#include "common/log.h"
 #include "dae/dae.h"
+#include "daemon/printable.h"
 
 namespace gs::daemon {
 namespace {
@@ -25,7 +27,7 @@ std::string members_of(const Engine::GroupStatus& group) {
 }
 
 void print_group(const Engine::GroupStatus& group) {
-  line("group", group.name);
+  line("group", printable(group.name));
   line("  members", std::to_string(group.members.size()) + ": " + members_of(group));
   line("  state", std::to_string(group.state_length) + " bytes, event " + std::to_string(group.seqnum));
   line("  protocol", group.running_protocol.empty() ? "none" : group.running_protocol);
@@ -51,6 +53,7 @@ void Service::attach(Server& server, Options& options) {
   server_ = &server;
   options_ = &options;
   if (getKPLDescriptor() >= 0) server.watch(getKPLDescriptor(), [this] { on_request(); });
+  if (getStopCode() != 0) server.stop(getStopMsg());  // SIGTERM came before the server took it over
 }
 
 void Service::on_request() {
@@ -59,24 +62,36 @@ void Service::on_request() {
 }
 
 void Service::traceBegin(int dae_long) {
+  tracing_ = true;
   server_->set_log_level(dae_long == 1 ? spdlog::level::trace : spdlog::level::debug);
 }
 
-void Service::traceEnd() { server_->set_log_level(options_->log_level); }
+void Service::traceEnd() {
+  tracing_ = false;
+  server_->set_log_level(options_->log_level);
+}
 
-/// What cannot change while clients are connected is told, not dropped in silence.
+/// What cannot change while clients are connected is told, not dropped in silence. A mistake changes nothing.
 void Service::refresh() try {
+  const auto later = [](const char* setting) { inform_printf("%s: changes with the next start\n", setting); };
   const Options now = reread_();
+  // Also under the old name: it may have been moved away to keep it short.
+  if (!now.log_file.empty()) {
+    platform::log_to_file(now.log_file);
+    options_->log_file = now.log_file;
+  } else if (!options_->log_file.empty()) {
+    later("log-file");
+  }
   options_->log_level = now.log_level;
   options_->queue_bound = now.queue_bound;
-  server_->set_log_level(now.log_level);
+  if (!tracing_) server_->set_log_level(now.log_level);
   server_->set_queue_bound(now.queue_bound);
-  const auto later = [](const char* setting) { inform_printf("%s: changes with the next start\n", setting); };
   if (now.socket_path != options_->socket_path) later("socket-path");
   if (now.access_group != options_->access_group) later("access-group");
   if (now.node_number != options_->node_number) later("node-number");
 } catch (const std::exception& error) {
   error_printf("%s", error.what());
+  server_->log_error(std::string("refresh: ") + error.what());
 }
 
 void Service::longStatus() {

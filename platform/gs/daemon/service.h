@@ -35,6 +35,7 @@ class Service : public zelt_gscl_V1::KPLDriver {
   const std::function<Options()> reread_;
   Server* server_ = nullptr;
   Options* options_ = nullptr;
+  bool tracing_ = false;
 };
 
 }  // namespace gs::daemon

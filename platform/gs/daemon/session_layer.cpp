@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "daemon/printable.h"
 #include "engine/text.h"
 #include "gscl/GSUtils.h"
 
