@@ -3,7 +3,6 @@
 #include <cerrno>
 #include <cstring>
 #include <fstream>
-#include <iterator>
 #include <sstream>
 
 namespace platform {
@@ -23,10 +22,10 @@ std::string syntax_problem(const std::string& message) {
 
 std::string content_of(const std::string& path) {
   errno = 0;
-  std::ifstream file(path, std::ios::binary);
-  std::string content{std::istreambuf_iterator<char>(file), {}};
+  std::ostringstream content;
+  content << std::ifstream(path, std::ios::binary).rdbuf();  // does not throw, for a folder neither
   if (errno != 0) throw SettingError(path + ": cannot be read: " + strerror(errno));
-  return content;
+  return content.str();
 }
 
 }  // namespace

@@ -159,12 +159,23 @@ void check(const toml::value& file, const Definition& definition) {
   }
 }
 
+/// What no two subsystems may have: each makes its queue anew when it starts.
+void check_shared(const Definition& definition, const Definition& other) {
+  const auto refuse = [&](const std::string& what) {
+    throw SettingError(definition.file + ": " + what + " is taken by " + other.file);
+  };
+  if (definition.name == other.name) refuse("name: '" + definition.name + "'");
+  if (definition.queue_key != 0 && definition.queue_key == other.queue_key) {
+    refuse("queue-key: " + std::to_string(definition.queue_key));
+  }
+}
+
 std::vector<std::string> toml_files(const std::string& folder) {
   std::error_code error;
   std::vector<std::string> files;
   std::filesystem::directory_iterator entries(folder, error);
   for (; !error && entries != std::filesystem::directory_iterator(); entries.increment(error)) {
-    if (entries->path().extension() == ".toml" && !entries->is_fifo()) files.push_back(entries->path());
+    if (entries->path().extension() == ".toml") files.push_back(entries->path());
   }
   if (error) throw SettingError(folder + ": cannot be read: " + error.message());
   std::sort(files.begin(), files.end());
@@ -186,6 +197,11 @@ const char* name_of(Transport transport) {
 }
 
 Definition read_definition(const std::string& file) {
+  std::error_code error;
+  const auto type = std::filesystem::status(file, error).type();
+  if (std::filesystem::exists(std::filesystem::file_status(type)) && type != std::filesystem::file_type::regular) {
+    throw SettingError(file + ": is no regular file");  // to read a pipe might never end
+  }
   const toml::value content = platform::parse_toml_file(file);
   Definition definition;
   definition.file = file;
@@ -199,14 +215,10 @@ Folder read_folder(const std::string& folder) {
   for (const std::string& file : toml_files(folder)) {
     try {
       Definition definition = read_definition(file);
-      const auto same = [&](const Definition& other) { return other.name == definition.name; };
-      const auto taken = std::find_if(result.definitions.begin(), result.definitions.end(), same);
-      if (taken != result.definitions.end()) {
-        throw SettingError(file + ": name: '" + definition.name + "' is taken by " + taken->file);
-      }
+      for (const Definition& other : result.definitions) check_shared(definition, other);
       result.definitions.push_back(std::move(definition));
     } catch (const SettingError& error) {
-      result.problems.push_back(error.what());
+      result.skipped.push_back({file, error.what()});
     }
   }
   return result;

@@ -42,12 +42,16 @@ struct Definition {
 Definition read_definition(const std::string& file);
 
 struct Folder {
+  struct Skipped {
+    std::string file;
+    std::string problem;  // one line, with the file
+  };
   std::vector<Definition> definitions;  // sorted by file name
-  std::vector<std::string> problems;    // one line for each file that is skipped
+  std::vector<Skipped> skipped;
 };
 
-/// All files *.toml of the folder. A broken one, or one whose name was taken before it, is skipped. Throws
-/// platform::SettingError: the folder cannot be read.
+/// All files *.toml of the folder. A broken one, or one whose name or queue was taken before it, is skipped.
+/// Throws platform::SettingError: the folder cannot be read.
 Folder read_folder(const std::string& folder);
 
 }  // namespace kpl::master

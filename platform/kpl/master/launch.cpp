@@ -2,17 +2,21 @@
 
 #include <fcntl.h>
 #include <grp.h>
+#include <linux/close_range.h>
 #include <pwd.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
+#include <charconv>
 #include <csignal>
 #include <cstring>
+#include <string_view>
 #include <vector>
 
 #include "kpl.h"
+#include "master/left_behind.h"
 
 extern char** environ;
 
@@ -22,6 +26,7 @@ namespace {
 using platform::Descriptor;
 
 constexpr int kExitNotRun = 127;
+constexpr std::size_t kPidDigits = 11;
 
 /// What the new process tells when it cannot become the program.
 struct Failure {
@@ -34,6 +39,7 @@ struct Plan {
   std::vector<std::string> texts;
   std::vector<char*> argv;
   std::vector<char*> envp;
+  char* pid_text = nullptr;  // where the new process puts its id
   bool change_user = false;
   uid_t uid = 0;
   gid_t gid = 0;
@@ -60,16 +66,21 @@ void plan_user(const Definition& definition, Plan& plan) {
 }
 
 void plan_texts(const Definition& definition, const std::string& status_socket, Plan& plan) {
-  const std::string variable = KPL_MASTER_ENV "=";
-  plan.texts = {variable + status_socket, definition.program};
+  const std::string master = KPL_MASTER_ENV "=";
+  const std::string identity = std::string(kIdentityVariable) + "=";
+  plan.texts = {master + status_socket, identity + definition.name + ":", definition.program};
   plan.texts.insert(plan.texts.end(), definition.arguments.begin(), definition.arguments.end());
-  for (std::size_t i = 1; i < plan.texts.size(); ++i) plan.argv.push_back(plan.texts[i].data());
+  plan.texts[1].append(kPidDigits, '\0');
+  for (std::size_t i = 2; i < plan.texts.size(); ++i) plan.argv.push_back(plan.texts[i].data());
   plan.argv.push_back(nullptr);
   for (char** one = environ; *one != nullptr; ++one) {
-    if (strncmp(*one, variable.c_str(), variable.size()) != 0) plan.envp.push_back(*one);
+    const std::string_view text = *one;
+    if (!text.starts_with(master) && !text.starts_with(identity)) plan.envp.push_back(*one);
   }
   plan.envp.push_back(plan.texts[0].data());
+  plan.envp.push_back(plan.texts[1].data());
   plan.envp.push_back(nullptr);
+  plan.pid_text = plan.texts[1].data() + plan.texts[1].size() - kPidDigits;
 }
 
 void plan_files(const Definition& definition, Plan& plan) {
@@ -80,9 +91,11 @@ void plan_files(const Definition& definition, Plan& plan) {
   plan.null = Descriptor(open("/dev/null", O_RDWR | O_CLOEXEC));
   if (!plan.null) throw LaunchError(std::string("cannot open /dev/null: ") + strerror(errno));
   if (definition.output.empty()) return;
-  plan.output = Descriptor(
-      open(definition.output.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NOFOLLOW, 0640));
+  constexpr int kFlags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NOFOLLOW;
+  // Not blocking: a pipe that nobody reads would hold up the master.
+  plan.output = Descriptor(open(definition.output.c_str(), kFlags | O_NONBLOCK, 0640));
   if (!plan.output) throw LaunchError("cannot open " + definition.output + ": " + strerror(errno));
+  fcntl(plan.output.get(), F_SETFL, O_APPEND);
 }
 
 [[noreturn]] void give_up(int report, Failure::Step step) {
@@ -100,6 +113,7 @@ void reset_signals(const sigset_t& mask) {
 }
 
 [[noreturn]] void become(const Plan& plan, int request_end, int report, const sigset_t& mask) {
+  std::to_chars(plan.pid_text, plan.pid_text + kPidDigits - 1, getpid());
   if (setsid() < 0) give_up(report, Failure::kSession);
   const int output = plan.output ? plan.output.get() : STDERR_FILENO;
   if (dup2(request_end >= 0 ? request_end : plan.null.get(), STDIN_FILENO) < 0 ||
@@ -111,6 +125,7 @@ void reset_signals(const sigset_t& mask) {
     give_up(report, Failure::kUser);
   }
   reset_signals(mask);
+  close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);  // what the master was started with is not for it
   execve(plan.argv[0], plan.argv.data(), plan.envp.data());
   give_up(report, Failure::kProgram);
 }

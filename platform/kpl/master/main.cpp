@@ -41,11 +41,22 @@ void leave_standard_descriptors(bool keep_log) {
   dup2(null.get(), STDERR_FILENO);
 }
 
+void tell_skipped(const kpl::master::Folder& folder) {
+  for (const auto& skipped : folder.skipped) fprintf(stderr, "kplmstr: %s\n", skipped.problem.c_str());
+}
+
 int check(const Options& options) {
   const auto folder = kpl::master::read_folder(options.definitions);
-  for (const std::string& problem : folder.problems) fprintf(stderr, "kplmstr: %s\n", problem.c_str());
+  tell_skipped(folder);
   printf("%zu subsystems defined in %s\n", folder.definitions.size(), options.definitions.c_str());
-  return folder.problems.empty() ? 0 : kExitFailure;
+  return folder.skipped.empty() ? 0 : kExitFailure;
+}
+
+/// The log will say it, too; but who starts a daemon looks here.
+void tell_mistakes(const std::string& definitions) try {
+  tell_skipped(kpl::master::read_folder(definitions));
+} catch (const platform::SettingError& error) {
+  fprintf(stderr, "kplmstr: %s\n", error.what());
 }
 
 /// Throws when subsystems would not take this process for the master: they would detach from it and be lost.
@@ -61,7 +72,11 @@ void serve(const Options& options) {
   set_standard_descriptors("");
   static std::optional<kpl::master::Detached>
       detached;  // until the end: the caller waits for the reason to be told
-  if (options.daemon) detached.emplace();
+  if (options.daemon) {
+    tell_mistakes(options.definitions);
+    close_range(STDERR_FILENO + 1, ~0U, 0);
+    detached.emplace();
+  }
   be_the_parent();
   umask(S_IWGRP | S_IWOTH);
   if (chdir("/") != 0) throw std::system_error(errno, std::generic_category(), "chdir");
@@ -73,7 +88,7 @@ void serve(const Options& options) {
     leave_standard_descriptors(!options.log_file.empty());
   }
   log->info("kplmstr " KPL_PROGRAM_VERSION " serves {}", options.socket_path);
-  master.start_subsystems();
+  master.start();
   if (detached) detached->ready();
   master.run();
   log->info("stopped");

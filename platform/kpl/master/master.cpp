@@ -7,6 +7,7 @@
 #include <csignal>
 
 #include "kpl.h"
+#include "master/left_behind.h"
 
 namespace kpl::master {
 namespace {
@@ -65,27 +66,44 @@ Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log)
       children_(loop_, SIGCHLD, EV_SIGNAL | EV_PERSIST, [this] { on_children(); }),
       hangup_(loop_, SIGHUP, EV_SIGNAL | EV_PERSIST, [this] { read_definitions(); }),
       terminated_(loop_, SIGTERM, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }),
-      interrupted_(loop_, SIGINT, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }) {
+      interrupted_(loop_, SIGINT, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }) {}
+
+void Master::start() {
+  left_behind_ = find_left_behind(status_socket_);
+  for (const auto& [name, pid] : left_behind_) log_->error("{}", left_behind(name));
   read_definitions();
+  for (auto& [name, subsystem] : subsystems_) {
+    if (!subsystem.definition().autostart) continue;
+    const std::string obstacle = left_behind(name);
+    if (!obstacle.empty()) {
+      log_->error("{}: not started", name);
+      continue;
+    }
+    subsystem.start([](const control::Answer&) {});  // logged there
+  }
+}
+
+std::string Master::left_behind(const std::string& name) const {
+  const auto found = left_behind_.find(name);
+  if (found == left_behind_.end() || subsystem_of(found->second, status_socket_) != name) return {};
+  const std::string pid = std::to_string(found->second);
+  return name + " runs as process " + pid +
+         ", left behind by an earlier kplmstr: it cannot be asked, end it (kill " + pid + ") before you start it";
 }
 
 // -------------------------------------------------------------------------------------------------- definitions
 
-/// A subsystem that is no longer defined is forgotten once it has no process.
 void Master::read_definitions() {
   Folder folder;
   try {
     folder = read_folder(folder_);
   } catch (const platform::SettingError& error) {
-    folder.problems.push_back(error.what());
+    skipped_ = {{folder_, error.what()}};
+    return log_->error("{}; nothing changes", error.what());
   }
-  problems_ = std::move(folder.problems);
-  for (const std::string& problem : problems_) log_->error("{}; skipped", problem);
-  std::erase_if(subsystems_, [&](const auto& entry) {
-    const auto same = [&](const Definition& definition) { return definition.name == entry.first; };
-    return entry.second.state() == Subsystem::State::kInactive &&
-           std::none_of(folder.definitions.begin(), folder.definitions.end(), same);
-  });
+  for (const auto& skipped : folder.skipped) log_->error("{}; skipped", skipped.problem);
+  forget_undefined(folder);
+  skipped_ = std::move(folder.skipped);
   for (Definition& definition : folder.definitions) {
     const auto found = subsystems_.find(definition.name);
     if (found != subsystems_.end()) {
@@ -95,13 +113,23 @@ void Master::read_definitions() {
       subsystems_.try_emplace(name, std::move(definition), Surroundings{loop_, *log_, status_socket_});
     }
   }
-  log_->info("{} subsystems defined in {}", subsystems_.size(), folder_);
+  log_->info("{} subsystems defined in {}", folder.definitions.size(), folder_);
 }
 
-void Master::start_subsystems() {
+/// A mistake in the file of one that runs, or waits to run again, must not end it.
+void Master::forget_undefined(const Folder& folder) {
   for (auto& [name, subsystem] : subsystems_) {
-    if (subsystem.definition().autostart) subsystem.start([](const control::Answer&) {});  // logged there
+    const auto same = [&](const Definition& definition) { return definition.name == name; };
+    if (std::any_of(folder.definitions.begin(), folder.definitions.end(), same)) continue;
+    const auto its_file = [&](const auto& skipped) { return skipped.file == subsystem.definition().file; };
+    const bool broken = std::any_of(folder.skipped.begin(), folder.skipped.end(), its_file);
+    if (!broken || subsystem.state() == Subsystem::State::kInactive) subsystem.undefine();
   }
+  erase_undefined();
+}
+
+void Master::erase_undefined() {
+  std::erase_if(subsystems_, [](const auto& entry) { return !entry.second.defined() && entry.second.pid() <= 0; });
 }
 
 // ------------------------------------------------------------------------------------------------- processes
@@ -115,6 +143,7 @@ void Master::on_children() {
                                     [&](const auto& entry) { return entry.second.pid() == pid; });
     if (found != subsystems_.end()) found->second.ended(status);
   }
+  erase_undefined();
   if (stopping_) stop_when_all_ended();
 }
 
@@ -154,7 +183,11 @@ void Master::tell_subsystems(const control::Request& request, const Reply& reply
     if (request.subsystem.empty() || name == request.subsystem) reply(subsystem.entry());
   }
   if (request.action == Action::kList && request.subsystem.empty()) {
-    for (const std::string& problem : problems_) reply(control::Message{problem + "; skipped"});
+    for (const auto& skipped : skipped_) reply(control::Message{skipped.problem + "; skipped"});
+  }
+  for (const auto& [name, pid] : left_behind_) {
+    const std::string told = left_behind(name);
+    if (!told.empty() && (request.subsystem.empty() || name == request.subsystem)) reply(control::Message{told});
   }
   reply(End{});
 }
@@ -162,6 +195,9 @@ void Master::tell_subsystems(const control::Request& request, const Reply& reply
 void Master::on_subsystem_request(Subsystem& subsystem, const control::Request& request, const Reply& reply) {
   if (request.action == Action::kStart && stopping_)
     return reply(End{Result::kWrongState, 0, "kplmstr is stopping"});
+  if (const std::string told = left_behind(subsystem.definition().name); !told.empty()) {
+    return reply(End{Result::kWrongState, 0, told});
+  }
   if (request.action == Action::kStart) return subsystem.start(reply);
   if (request.action == Action::kStop) return subsystem.stop(request.stop, reply);
   if (request.action == Action::kRequest && request.code < kFirstOwnCode) {

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "master/control_server.h"
+#include "master/definition.h"
 #include "master/loop.h"
 #include "master/options.h"
 #include "master/status_server.h"
@@ -19,16 +20,21 @@ namespace kpl::master {
 
 class Master {
  public:
-  /// Reads the definitions and listens. Throws platform::SettingError and platform::ListenError.
+  /// Listens. Throws platform::SettingError and platform::ListenError.
   Master(const Options& options, std::shared_ptr<spdlog::logger> log);
 
-  /// Starts the subsystems that are to start with the master.
-  void start_subsystems();
+  /// Reads the definitions and starts the subsystems that are to start with the master.
+  void start();
   /// Serves until SIGTERM or SIGINT, then ends all subsystems. SIGHUP reads the definitions again.
   void run() { loop_.run(); }
 
  private:
   void read_definitions();
+  void forget_undefined(const Folder& folder);
+  /// Those without a process.
+  void erase_undefined();
+  /// What is said of a process that an earlier master left behind; empty: none of that name runs.
+  std::string left_behind(const std::string& name) const;
   void on_children();
   void on_terminate();
   void stop_when_all_ended();
@@ -43,7 +49,8 @@ class Master {
   const std::string status_socket_;
   Loop loop_;
   std::map<std::string, Subsystem> subsystems_;
-  std::vector<std::string> problems_;  // files that are skipped
+  std::vector<Folder::Skipped> skipped_;
+  std::map<std::string, pid_t> left_behind_;  // by subsystem, what was found at the start
   bool stopping_ = false;
   ControlServer control_;  // first: its lock tells that this is the only master
   StatusServer status_;

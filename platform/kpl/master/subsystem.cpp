@@ -57,7 +57,13 @@ void Subsystem::start(Reply reply) {
 
 void Subsystem::set_definition(Definition definition) {
   next_definition_ = std::move(definition);
+  defined_ = true;
   if (state_ == State::kInactive) take_definition();
+}
+
+void Subsystem::undefine() {
+  next_definition_.reset();
+  defined_ = false;
 }
 
 void Subsystem::take_definition() {
@@ -123,7 +129,7 @@ void Subsystem::ended(int status) {
     return reply(End{Result::kFailed, 0, last_end_});
   }
   if (asked) return around_.log.info("{}: ended: {}", definition_.name, last_end_);
-  if (definition_.restart) return restart_later(last_end_);
+  if (definition_.restart && defined_) return restart_later(last_end_);
   around_.log.error("{}: ended unasked: {}", definition_.name, last_end_);
 }
 

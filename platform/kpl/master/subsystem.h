@@ -37,8 +37,8 @@ struct Surroundings {
 ///   waiting  | -> starting  | -            | -                    | inactive | -                     | starting
 ///
 /// (1) The process says why and ends; only its end counts. A first start that fails is not tried again.
-/// (2) Waiting where the definition says restart. The delay doubles from crash to crash; a run that was longer
-/// than
+/// (2) Waiting where the definition says restart and is still there. The delay doubles from crash to crash; a run
+/// that was longer than
 ///     the longest delay starts over with the shortest.
 /// A stop that the subsystem refuses leads back to active.
 class Subsystem {
@@ -52,6 +52,9 @@ class Subsystem {
   const Definition& definition() const { return definition_; }
   /// Counts from the next start on.
   void set_definition(Definition definition);
+  /// Has no definition any more: does not start again.
+  void undefine();
+  bool defined() const { return defined_; }
   State state() const { return state_; }
   /// -1 when there is none.
   pid_t pid() const { return process_ ? process_->pid : -1; }
@@ -102,6 +105,7 @@ class Subsystem {
 
   Definition definition_;
   std::optional<Definition> next_definition_;
+  bool defined_ = true;
   Surroundings around_;
   State state_ = State::kInactive;
   std::unique_ptr<Process> process_;
