@@ -1,5 +1,6 @@
 #include "common/toml_file.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
@@ -7,6 +8,9 @@
 
 namespace platform {
 namespace {
+
+constexpr std::size_t kMaxSize = 32 * 1024;
+constexpr int kMaxBrackets = 500;
 
 std::string place(const toml::source_location& where) {
   return where.file_name() + ":" + std::to_string(where.line());
@@ -28,10 +32,21 @@ std::string content_of(const std::string& path) {
   return content.str();
 }
 
+/// The parser calls itself for each bracket and takes a time that grows with the square of a key's length.
+void check_bounds(const std::string& path, const std::string& content) {
+  if (content.size() > kMaxSize)
+    throw SettingError(path + ": is longer than " + std::to_string(kMaxSize) + " bytes");
+  const auto brackets = std::count_if(content.begin(), content.end(), [](char c) { return c == '[' || c == '{'; });
+  if (brackets > kMaxBrackets)
+    throw SettingError(path + ": has more than " + std::to_string(kMaxBrackets) + " brackets");
+}
+
 }  // namespace
 
 toml::value parse_toml_file(const std::string& path) {
-  std::istringstream content(content_of(path));
+  const std::string text = content_of(path);
+  check_bounds(path, text);
+  std::istringstream content(text);
   try {
     return toml::parse(content, path);
   } catch (const toml::syntax_error& error) {

@@ -107,6 +107,7 @@ int ask_subsystems(Client& client, const Options& options) {
     request.subsystem = name;
     outcomes.push_back(ask(client, request));
     if (end.result == Result::kOk) end.result = outcomes.back().end.result;
+    if (!options.group.empty() && !options.json) print(stdout, name + ":\n");
     if (!options.json) print_for_people(outcomes.back());
   }
   if (names.empty()) {
