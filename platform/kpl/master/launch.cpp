@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <grp.h>
-#include <linux/close_range.h>
 #include <pwd.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -125,7 +124,6 @@ void reset_signals(const sigset_t& mask) {
     give_up(report, Failure::kUser);
   }
   reset_signals(mask);
-  close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);  // what the master was started with is not for it
   execve(plan.argv[0], plan.argv.data(), plan.envp.data());
   give_up(report, Failure::kProgram);
 }

@@ -118,8 +118,9 @@ void Master::read_definitions() {
 
 /// A mistake in the file of one that runs, or waits to run again, must not end it.
 void Master::forget_undefined(const Folder& folder) {
-  for (auto& [name, subsystem] : subsystems_) {
-    const auto same = [&](const Definition& definition) { return definition.name == name; };
+  for (auto& entry : subsystems_) {
+    Subsystem& subsystem = entry.second;
+    const auto same = [&](const Definition& definition) { return definition.name == entry.first; };
     if (std::any_of(folder.definitions.begin(), folder.definitions.end(), same)) continue;
     const auto its_file = [&](const auto& skipped) { return skipped.file == subsystem.definition().file; };
     const bool broken = std::any_of(folder.skipped.begin(), folder.skipped.end(), its_file);
