@@ -124,9 +124,9 @@ TEST(DaemonUnderMaster, Is_recognised_and_ends_with_its_exit_handlers_when_it_is
     std::string arguments;
     for (size_t i = 1; i < words.size(); ++i) arguments += "\"" + words[i] + "\", ";
     kpl_test::PrivateMaster master;
-    master.define("d.toml", "name = \"d\"\nprogram = \"" + words[0] + "\"\narguments = [" + arguments + "]\n");
+    master.define("d", "program = \"" + words[0] + "\"\narguments = [" + arguments + "]\n");
     master.start();
-    ASSERT_EQ(master.ctl({"start", "d"}).status, 0) << master.master_log();
+    ASSERT_EQ(master.ctl({"start", "d"}).status, 0) << master.log("master");
     daemon.wait_for_start();
     const int fd = keeps ? 20 : 3;
     ASSERT_EQ(daemon.start,

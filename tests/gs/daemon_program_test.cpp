@@ -221,6 +221,7 @@ TEST_F(DaemonConfig, WrongOptionOrFile_IsOneLineAndStatusTwo) {
       {{"--config"}, "--config"},
       {{"--node-number", "32768"}, "--" + range + "'32768'"},
       {{"--queue-bound", "1k"}, "--queue-bound: must be"},
+      {{"--daemon", "--ready-fd", "1"}, "--daemon excludes --ready-fd"},
       {{"--log-level", "loud"}, "--log-level: must be error, warning, info or debug"},
       {{"--access-group", "no such group"}, "--access-group: there is no group 'no such group'"},
       {{"--socket-path", std::string(108, 's')}, "--socket-path: must be a path of 1 to 107 characters"},

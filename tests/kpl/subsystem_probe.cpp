@@ -25,17 +25,14 @@ void note(const char* text) {
   if (write(log_fd, text, strlen(text)) < 0) _exit(9);
 }
 
-template <int Status>
+template <bool Forced>
 void stop_now() {
-  note(Status == 0 ? "stop normal\n" : "stop forced\n");
+  note(Forced ? "stop forced\n" : "stop normal\n");
   exit(0);
 }
-void on_normal_signal(int) {
-  note("stop normal\n");
-  _exit(0);
-}
-void on_forced_signal(int) {
-  note("stop forced\n");
+template <bool Forced>
+void on_stop_signal(int) {
+  note(Forced ? "stop forced\n" : "stop normal\n");
   _exit(0);
 }
 void on_cancel(int) {
@@ -58,8 +55,8 @@ int other_request(short request, short parm1, short parm2, const void* data, int
 }
 
 constexpr dae_req_sock_t kRoutines = {
-    stop_now<0>,
-    stop_now<1>,
+    stop_now<false>,
+    stop_now<true>,
     on_cancel,
     [](int is_long) { note(is_long != 0 ? "trace on long\n" : "trace on\n"); },
     [] { note("trace off\n"); },
@@ -71,27 +68,20 @@ constexpr dae_req_sock_t kRoutines = {
 void set_transport(const std::string& transport) {
   if (transport == "socket") return dae_init_KPL_sock(&request_fd, &kRoutines, 1);
   if (transport == "signals") {
-    const dae_req_sig_t routines = {on_normal_signal, on_forced_signal, on_cancel};
+    const dae_req_sig_t routines = {on_stop_signal<false>, on_stop_signal<true>, on_cancel};
     return dae_init_KPL_sig(SIGUSR1, SIGUSR2, &routines, 1);
   }
   const std::string place = transport.substr(strlen("queue="));
   dae_init_KPL_msq(&request_fd, std::stoi(place), std::stoi(place.substr(place.find(',') + 1)), &kRoutines, 1);
 }
 
-/// A queue cannot be waited for together with other things, so that is not done here either.
+/// A queue cannot be waited for: it is looked at again and again.
 [[noreturn]] void serve(const std::string& transport, bool silent) {
   for (;;) {
-    if (silent || transport == "signals") {
-      pause();
-      continue;
-    }
-    pollfd entry = {request_fd, POLLIN, 0};
-    if (transport == "socket") {
-      poll(&entry, 1, -1);
-    } else {
-      usleep(2000);
-    }
-    dae_KPL_req();
+    if (silent || transport == "signals") pause();
+    pollfd entry = {transport == "socket" ? request_fd : -1, POLLIN, 0};
+    poll(&entry, 1, transport == "socket" ? -1 : 2);
+    if (!silent) dae_KPL_req();
   }
 }
 

@@ -58,6 +58,14 @@ class Connection {
     while (!next_packet().empty()) {
     }
   }
+  /// Empty: the peer has closed.
+  gs::wire::Packet next_packet() {
+    wait_readable();
+    gs::wire::Packet packet(gs::wire::kMaxPacket);
+    const ssize_t length = recv(fd_, packet.data(), packet.size(), 0);
+    packet.resize(length > 0 ? static_cast<std::size_t>(length) : 0);
+    return packet;
+  }
 
  protected:
   int fd() const { return fd_; }
@@ -76,14 +84,6 @@ class Connection {
   }
 
  private:
-  gs::wire::Packet next_packet() {
-    wait_readable();
-    gs::wire::Packet packet(gs::wire::kMaxPacket);
-    const ssize_t length = recv(fd_, packet.data(), packet.size(), 0);
-    packet.resize(length > 0 ? static_cast<std::size_t>(length) : 0);
-    return packet;
-  }
-
   int fd_;
 };
 

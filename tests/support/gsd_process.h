@@ -6,17 +6,13 @@
 #include <string>
 #include <vector>
 
+#include "support/programs.h"
 #include "support/temp_dir.h"
 
 namespace test_support {
 
-/// What a run of gsd that ended by itself left.
-struct GsdRun {
-  int status = -1;  // exit status; -1: killed by a signal
-  std::string out;
-  std::string err;
-};
-GsdRun run_gsd(const std::vector<std::string>& arguments);
+using GsdRun = Outcome;
+GsdRun run_gsd(std::vector<std::string> arguments);
 
 /// A gsd with a socket in a directory of its own. Stopped, by force if need be, with the object.
 class GsdProcess {
