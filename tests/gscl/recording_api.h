@@ -10,6 +10,7 @@
 #include <mutex>
 #include <regex>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "gscl/gscl.h"
@@ -38,11 +39,11 @@ inline std::string lowHex(uintptr_t value) {
   return text;
 }
 
-/// One event reads "<state>/<token> <what>", state and token being the watched client's at that moment. <what> is
-/// a call of the base API with its numbers, "wyx_goodbye(12)", a callback, "-> approvedCb", a result, "= WYX_OK",
-/// or a trace line with its channel, "A text" (D: detail, W: warning), without its line end. Addresses of the
-/// watched client read
-/// "@", the calling thread's id "#", numbers of requests "seq=S", and "Prov[g,Id=3/7,T=12]" reads "P[3/7,T=12]".
+/// One event is a call of the base API with its numbers, "wyx_goodbye(12)", a callback, "-> approvedCb", a result,
+/// "= WYX_OK", or a trace line with its channel, "A text" (D: detail, W: warning), without its line end. Before it
+/// stands "[<state>/<token> <current value>/<proposed value> <members>]" of the watched client, when that has
+/// changed. Addresses of the watched client read "@", the calling thread's id "#", numbers of requests "seq=S";
+/// "Prov[g,Id=3/7,T=12]" is cut to "P[3/7,T=12]" and "GSController::" to "C::".
 class RecordingApi {
  public:
   explicit RecordingApi(int level = kAllLevels) : table_before_(GSAPIRtns) {
@@ -87,29 +88,10 @@ class RecordingApi {
     if (std::exchange(state_, state) != state) events_.push_back(state);
     events_.push_back(what);
   }
-  static std::string stateOf(GSClient& client) {
-    std::string state = std::string("[") + (gscl_GSClientStateName(client.getClientState()) + 7) + "/" +
-                        std::to_string(client.getToken());
-    GSStateValue current, proposed;
-    client.getCurrentStateValue(current);
-    client.getProposedStateValue(proposed);
-    for (GSStateValue* value : {&current, &proposed}) {
-      state += value == &current ? " " : "/";
-      if (value->getValue() != nullptr) {
-        state.append(value->getValue()->gs_state, static_cast<size_t>(value->getValue()->gs_length));
-      }
-    }
-    wyx_provider_t id = {};
-    for (int i = 0; client.getMemberAt(i, &id) == 1; ++i) {
-      state += " " + std::to_string(id._gs_provider_info._gs_instance_number) + "." +
-               std::to_string(id._gs_provider_info._gs_node_number);
-    }
-    return state + "]";
-  }
   /// What was recorded since the last call.
   Lines take() {
     std::lock_guard<std::mutex> lock(mutex_);
-    return std::move(events_);
+    return std::exchange(events_, {});
   }
 
   wyx_rc_t answer = WYX_OK;
@@ -130,6 +112,24 @@ class RecordingApi {
  private:
   using Info = const wyx_proposal_info_t*;
 
+  static std::string stateOf(GSClient& client) {
+    std::string state = std::string("[") + (gscl_GSClientStateName(client.getClientState()) + 7) + "/" +
+                        std::to_string(client.getToken());
+    const auto text = [](const GSStateValue& value) {
+      const wyx_state_value_t* v = value.getValue();
+      return v == nullptr ? std::string() : std::string(v->gs_state, static_cast<size_t>(v->gs_length));
+    };
+    GSStateValue current, proposed;
+    client.getCurrentStateValue(current);
+    client.getProposedStateValue(proposed);
+    state += " " + text(current) + "/" + text(proposed);
+    wyx_provider_t id = {};
+    for (int i = 0; client.getMemberAt(i, &id) == 1; ++i) {
+      state += " " + std::to_string(id._gs_provider_info._gs_instance_number) + "." +
+               std::to_string(id._gs_provider_info._gs_node_number);
+    }
+    return state + "]";
+  }
   template <class... Arguments>
   wyx_rc_t enter(const char* name, Arguments... arguments) {
     std::string list;
