@@ -66,33 +66,16 @@ class Run {
   static constexpr std::size_t kQueueBound = 64 * 1024;
 
   void step() {
-    switch (input_.byte() % 12) {
-      case 0:
-        return open();
-      case 1:
-        return full_session();
-      case 2:
-        return sample();
-      case 3:
-        return raw_packet();
-      case 4:
-        return framed_payload();
-      case 5:
-        return attach();
-      case 6:
-        return request();
-      case 7:
-        return change_wire();
-      case 8:
-        return daemon_.layer.writable(some());
-      case 9:
-        return daemon_.layer.lost(some(), "fuzzed");
-      case 10:
-        return daemon_.pass(Duration(input_.byte() * 100));
-      case 11:
-        return daemon_.say(some(), wire::PingAnswer{input_.byte(), input_.byte() % 2 == 0});
-    }
+    static constexpr void (Run::*kSteps[])() = {&Run::open,       &Run::full_session,   &Run::sample,
+                                                &Run::raw_packet, &Run::framed_payload, &Run::attach,
+                                                &Run::request,    &Run::change_wire,    &Run::writable,
+                                                &Run::lose,       &Run::pass_time,      &Run::answer_ping};
+    (this->*kSteps[input_.byte() % std::size(kSteps)])();
   }
+  void writable() { daemon_.layer.writable(some()); }
+  void lose() { daemon_.layer.lost(some(), "fuzzed"); }
+  void pass_time() { daemon_.pass(Duration(input_.byte() * 100)); }
+  void answer_ping() { daemon_.say(some(), wire::PingAnswer{input_.byte(), input_.byte() % 2 == 0}); }
 
   /// One of the connections, open or not; never the well-behaved client's.
   ConnectionId some() {

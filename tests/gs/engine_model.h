@@ -94,7 +94,10 @@ class Model {
     if (std::holds_alternative<VoteRequest>(event.request) && view != providers_.end() &&
         view->second.asked != (outcome.rc != WYX_VOTE_NOT_EXPECTED))
       error(from, "has a vote judged against what it was asked");
-    if (outcome.rc == WYX_OK) return std::visit([&](const auto& r) { accept(from, r); }, event.request);
+    if (outcome.rc == WYX_OK) {
+      std::visit([&](const auto& r) { accept(from, r); }, event.request);
+      return expect_end(from, protocol_of(event.request));
+    }
     if (!event.answered && !outcome.deliveries.empty()) error(from, "is refused at once, yet something is sent");
     if (!event.answered || gone_hosts_.contains(event.session.node)) return;
     refused_to_ = from;
@@ -105,18 +108,10 @@ class Model {
     if (providers_.contains(from) || subscribers_.contains(from)) error(from, "joins with a token that is in use");
     const ProviderId id{r.instance, static_cast<std::int16_t>(from.session.node)};
     providers_[from] = {r.attributes.group_name, id, r.attributes, {}, false, false, WYX_NULL_VOTE, 0, {}};
-    expect_end(from, WYX_JOIN);
   }
-  void accept(const Endpoint& from, const StateChangeRequest&) { expect_end(from, WYX_STATE_VALUE_CHANGE); }
-  void accept(const Endpoint& from, const MessageRequest&) { expect_end(from, WYX_PROVIDER_MESSAGE); }
-  void accept(const Endpoint& from, const ExpelRequest&) { expect_end(from, WYX_EXPEL); }
-  void accept(const Endpoint& from, const AttributeChangeRequest&) {
-    expect_end(from, WYX_GROUP_ATTRIBUTE_CHANGE);
-  }
-  void accept(const Endpoint& from, const LeaveRequest& r) {
-    expect_end(from, WYX_LEAVE);
-    providers_[from].leave = r;
-  }
+  template <typename Proposal>
+  void accept(const Endpoint&, const Proposal&) {}
+  void accept(const Endpoint& from, const LeaveRequest& r) { providers_[from].leave = r; }
   void accept(const Endpoint& from, const SubscribeRequest& r) {
     subscribers_[from] = {r.group_name, r.control, false, {}, {}};
   }
@@ -136,6 +131,7 @@ class Model {
     if (r.message) group.voted_message = std::make_shared<const Bytes>(*r.message);
   }
   void expect_end(const Endpoint& from, wyx_request_t protocol) {
+    if (protocol == WYX_INTERNAL_REQUEST || protocol == WYX_SUBSCRIPTION) return;
     auto it = providers_.find(from);
     if (it == providers_.end()) return error(from, "is answered WYX_OK without being a provider");
     ++it->second.pending[protocol];

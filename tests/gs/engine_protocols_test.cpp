@@ -1,55 +1,10 @@
-// Protocols as those who take part see them, where the simulator's model leaves room: who is asked first, what the
-// queue holds together and in which order, what notifications carry for people and tools.
+// Protocols as those who take part see them, where the simulator's model leaves room.
 #include "gs/engine_script.h"
 
 namespace gs::test {
 namespace {
 
 class EngineProtocols : public Script {};
-
-TEST_F(EngineProtocols, Join_asks_members_and_joiner_also_the_first_one_about_itself) {
-  attributes.num_phases = WYX_N_PHASE;
-  attributes.time_limit = 9;
-  join(1);
-  EXPECT_TRUE(engine.status()[0].members.empty());
-  approve({1});
-  join(2);
-  vote(2, WYX_VOTE_CONTINUE, "new", "why");
-  apply(TimerExpiredEvent{timers.back().id});
-  approve({1, 2});
-  EXPECT_EQ(seen(),
-            "1: phase 1 join by 1, members -, changing 1, limit 9\n"
-            "1: approved join by 1 <approve>, members 1, changing 1\n"
-            "1 2: phase 1 join by 2, members 1, changing 2, limit 9\n"
-            "1 2: phase 2 join by 2 <default-approve|time>, members 1, changing 2, proposed 'new', msg 'why', "
-            "limit 9\n"
-            "1 2: approved join by 2 <default-approve|time>, members 1 2, changing 2, state 'new'\n");
-}
-
-TEST_F(EngineProtocols, Queue_runs_failures_first_then_one_by_one) {
-  group_of({1, 2, 3, 4});
-  change_state(1, "x", kPhases);
-  join(5);
-  leave(4, 42, kPhases);
-  dies(2);
-  goodbye(3);
-  approve({1, 4});
-  vote(1, WYX_VOTE_CONTINUE);
-  EXPECT_EQ(leave(4), WYX_COLLIDE);
-  approve({5});
-  vote(1, WYX_VOTE_APPROVE, "dropped");
-  vote(5, WYX_VOTE_REJECT);
-  EXPECT_EQ(seen(),
-            "1 2 3 4: phase 1 state by 1, members 1 2 3 4, proposed 'x'\n"
-            "1 4: approved state by 1 <default-approve|failed>, members 1 2 3 4, state 'x'\n"
-            "1 4: approved failure by 2 <approve>, members 1 3 4, changing 2(died), state 'x'\n"
-            "1 4: approved failure by 3 <approve>, members 1 4, changing 3(goodbye), state 'x'\n"
-            "1 4 5: approved join by 5 <approve>, members 1 4 5, changing 5, state 'x'\n"
-            "1 5: phase 1 leave by 4, members 1 4 5, changing 4(voluntary=42), state 'x'\n"
-            "1 5: phase 2 leave by 4, members 1 4 5, changing 4(voluntary=42), state 'x'\n"
-            "1 4 5: approved leave by 4 <reject>, members 1 5, changing 4(voluntary=42), state 'x'\n");
-  EXPECT_EQ(leave(4), WYX_BAD_MEMBER_TOKEN);
-}
 
 TEST_F(EngineProtocols, Queue_runs_batches_where_the_group_says_so_and_leaves_of_the_same_terms_only) {
   attributes.batch_control = WYX_BATCH_BOTH;
@@ -104,20 +59,6 @@ TEST_F(EngineProtocols, Goodbye_frees_token_and_id_at_once_also_of_a_joiner) {
   approve({1, 2});
   EXPECT_EQ(goodbye(3), WYX_OK);
   EXPECT_EQ(goodbye(3), WYX_BAD_MEMBER_TOKEN);
-}
-
-TEST_F(EngineProtocols, Expel_dismisses_the_listed_with_their_waiting_leave) {
-  group_of({1, 2, 3, 4});
-  request(1, ExpelRequest{1, kPhases, {id(2), id(4)}, 3, "flag"});
-  leave(4);
-  approve({1, 3});
-  EXPECT_EQ(seen(),
-            "1 3: phase 1 expel by 1, members 1 2 3 4, changing 2 4(expelled expelled), deactivate 3 'flag'\n"
-            "1 2 3 4: approved expel by 1 <approve>, members 1 3, changing 2 4(expelled expelled), "
-            "deactivate 3 'flag'\n"
-            "2: announcement <dissolved>\n"
-            "4: error 6 for leave\n"
-            "4: announcement <dissolved>\n");
 }
 
 TEST_F(EngineProtocols, Vote_results_are_collected_as_the_batch_control_says) {

@@ -18,48 +18,39 @@ class EngineRequests : public Script {
   void expect_refused(int who, const std::vector<std::pair<Request, wyx_rc_t>>& wrong) {
     for (const auto& [request, rc] : wrong) expect_refused(who, request, rc);
   }
-  template <typename Change>
-  JoinRequest join_with(Change change) const {
-    JoinRequest join{1, attributes, 2, "p"};
-    change(join);
-    return join;
-  }
   JoinRequest join_request(Token token, std::int16_t instance) const { return {token, attributes, instance, "p"}; }
-  VoteRequest vote_of(wyx_vote_value_t vote, std::optional<Bytes> state = {}, std::optional<Bytes> message = {},
-                      wyx_vote_value_t default_vote = WYX_NULL_VOTE) const {
-    return {1, vote, std::move(state), std::move(message), default_vote};
-  }
 
  private:
   int refusals_ = 0;
 };
 
 TEST_F(EngineRequests, Join_with_wrong_values_or_other_attributes_than_the_groups_is_refused) {
-  const auto in = [](auto member, auto value) { return [=](JoinRequest& j) { j.attributes.*member = value; }; };
+  const auto with = [&](auto member, auto value) {
+    JoinRequest join = join_request(1, 2);
+    join.attributes.*member = value;
+    return join;
+  };
   using A = GroupAttributes;
-  const std::vector<std::pair<Request, wyx_rc_t>> always = {
-      {join_request(-1, 2), WYX_BAD_MEMBER_TOKEN},
-      {join_with(in(&A::group_name, "")), WYX_BAD_PARAMETER},
-      {join_with(in(&A::group_name, std::string(33, 'g'))), WYX_NAME_TOO_LONG},
-      {join_with([](JoinRequest& j) { j.local_name = std::string(257, 'l'); }), WYX_NAME_TOO_LONG},
-      {join_with(in(&A::source_group_name, "s")), WYX_NOT_SUPPORTED},
-      {join_with(in(&A::num_phases, wyx_num_phases_t(0))), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::default_vote, WYX_VOTE_CONTINUE)), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::batch_control, wyx_batch_ctrl_t(64))), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::merge_control, wyx_merge_ctrl_t(-3))), WYX_BAD_GROUP_ATTRIBUTES}};
-  expect_refused(2, always);
+  JoinRequest long_name = join_request(1, 2);
+  long_name.local_name = std::string(257, 'l');
+  expect_refused(2, {{join_request(-1, 2), WYX_BAD_MEMBER_TOKEN},
+                     {long_name, WYX_NAME_TOO_LONG},
+                     {with(&A::group_name, ""), WYX_BAD_PARAMETER},
+                     {with(&A::group_name, std::string(33, 'g')), WYX_NAME_TOO_LONG},
+                     {with(&A::source_group_name, "s"), WYX_NOT_SUPPORTED},
+                     {with(&A::num_phases, wyx_num_phases_t(0)), WYX_BAD_GROUP_ATTRIBUTES},
+                     {with(&A::default_vote, WYX_VOTE_CONTINUE), WYX_BAD_GROUP_ATTRIBUTES},
+                     {with(&A::batch_control, wyx_batch_ctrl_t(64)), WYX_BAD_GROUP_ATTRIBUTES},
+                     {with(&A::merge_control, wyx_merge_ctrl_t(-3)), WYX_BAD_GROUP_ATTRIBUTES}});
   EXPECT_TRUE(engine.status().empty());
-  EXPECT_EQ(request(3, join_with(in(&A::group_name, std::string(32, 'g')))), WYX_OK);
+  EXPECT_EQ(request(3, with(&A::group_name, std::string(32, 'g'))), WYX_OK);
 
   group_of({1});
-  const std::vector<std::pair<Request, wyx_rc_t>> in_this_group = {
-      {join_with(in(&A::client_version, std::int16_t{1})), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::batch_control, WYX_BATCH_JOINS)), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::num_phases, WYX_N_PHASE)), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::default_vote, WYX_VOTE_REJECT)), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::merge_control, WYX_LARGER_MERGE)), WYX_BAD_GROUP_ATTRIBUTES},
-      {join_with(in(&A::time_limit, std::uint16_t{1})), WYX_BAD_GROUP_ATTRIBUTES}};
-  expect_refused(2, in_this_group);
+  for (const JoinRequest& other :
+       {with(&A::client_version, std::int16_t{1}), with(&A::batch_control, WYX_BATCH_JOINS),
+        with(&A::num_phases, WYX_N_PHASE), with(&A::default_vote, WYX_VOTE_REJECT),
+        with(&A::merge_control, WYX_LARGER_MERGE), with(&A::time_limit, std::uint16_t{1})})
+    expect_refused(2, other, WYX_BAD_GROUP_ATTRIBUTES);
 }
 
 TEST_F(EngineRequests, Session_with_as_many_clients_as_may_be_gets_no_more_until_one_goes) {
@@ -109,16 +100,16 @@ TEST_F(EngineRequests, Proposals_and_votes_with_wrong_values_are_refused) {
                      {expel({id(2)}, kPhases, -1), WYX_INVALID_DEACTIVATE_PHASE},
                      {expel({id(2)}, kOnePhase, 2), WYX_INVALID_DEACTIVATE_PHASE},
                      {expel({id(2)}, kOnePhase, 0, Bytes(257, 'f')), WYX_BAD_PARAMETER},
-                     {vote_of(WYX_VOTE_APPROVE), WYX_VOTE_NOT_EXPECTED}});
+                     {VoteRequest{1, WYX_VOTE_APPROVE, {}, {}}, WYX_VOTE_NOT_EXPECTED}});
   EXPECT_EQ(change_state(1, Bytes(kMaxStateValue, 'x')), WYX_OK);
 
   leave(2, 0, kPhases);
-  expect_refused(2, vote_of(WYX_VOTE_APPROVE), WYX_VOTE_NOT_EXPECTED);
-  expect_refused(1, {{vote_of(WYX_NULL_VOTE), WYX_VOTE_VALUE_NOT_ALLOWED},
-                     {vote_of(WYX_VOTE_APPROVE_AND_SWITCH_ALPHA_OMEGA), WYX_VOTE_VALUE_NOT_ALLOWED},
-                     {vote_of(WYX_VOTE_APPROVE, {}, {}, WYX_VOTE_CONTINUE), WYX_VOTE_VALUE_NOT_ALLOWED},
-                     {vote_of(WYX_VOTE_APPROVE, large), WYX_BAD_PARAMETER},
-                     {vote_of(WYX_VOTE_APPROVE, {}, large), WYX_BAD_PARAMETER}});
+  expect_refused(2, VoteRequest{1, WYX_VOTE_APPROVE, {}, {}}, WYX_VOTE_NOT_EXPECTED);
+  expect_refused(1, {{VoteRequest{1, WYX_NULL_VOTE, {}, {}}, WYX_VOTE_VALUE_NOT_ALLOWED},
+                     {VoteRequest{1, WYX_VOTE_APPROVE_AND_SWITCH_ALPHA_OMEGA, {}, {}}, WYX_VOTE_VALUE_NOT_ALLOWED},
+                     {VoteRequest{1, WYX_VOTE_APPROVE, {}, {}, WYX_VOTE_CONTINUE}, WYX_VOTE_VALUE_NOT_ALLOWED},
+                     {VoteRequest{1, WYX_VOTE_APPROVE, large, {}}, WYX_BAD_PARAMETER},
+                     {VoteRequest{1, WYX_VOTE_APPROVE, {}, large}, WYX_BAD_PARAMETER}});
 }
 
 TEST_F(EngineRequests, Proposals_collide_while_a_protocol_runs_and_want_a_members_token) {

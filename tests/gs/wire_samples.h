@@ -3,7 +3,7 @@
 
 #include <vector>
 
-#include "wire/messages.h"
+#include "gs/same.h"
 
 namespace gs::wire::samples {
 
@@ -80,15 +80,6 @@ inline ProtocolNotification full_protocol(std::size_t state_size = 5) {
       {{3, 4}, WYX_VOTE_REJECT, WYX_PROVIDER_FAILED, WYX_HOST_FAILURE, std::nullopt, Bytes()}};
   p.changing_vote_results = {{{5, 6}, WYX_VOTE_CONTINUE, 0, 0, std::nullopt, std::nullopt}};
   return n;
-}
-
-/// Of a request that failed; WYX_INTERNAL_REQUEST for those that are no protocol.
-inline wyx_request_t protocol_of(const Request& request) {
-  static constexpr wyx_request_t kTypes[] = {
-      WYX_JOIN,         WYX_STATE_VALUE_CHANGE,     WYX_PROVIDER_MESSAGE, WYX_LEAVE,
-      WYX_EXPEL,        WYX_GROUP_ATTRIBUTE_CHANGE, WYX_INTERNAL_REQUEST, WYX_INTERNAL_REQUEST,
-      WYX_SUBSCRIPTION, WYX_INTERNAL_REQUEST};
-  return kTypes[request.index()];
 }
 
 inline std::vector<Notification> notifications() {
