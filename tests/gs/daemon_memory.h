@@ -117,16 +117,6 @@ class MemoryClient {
   }
   std::vector<wire::ServerMessage> events() { return daemon_.transport.take(event); }
   MemoryTransport::Wire& event_wire() { return daemon_.transport.wires.at(event); }
-  /// The last notification of type T since the last look; null: none.
-  template <typename T>
-  std::shared_ptr<const Notification> last_of() {
-    std::shared_ptr<const Notification> last;
-    for (const auto& message : events()) {
-      const auto* notify = std::get_if<wire::Notify>(&message);
-      if (notify != nullptr && std::holds_alternative<T>(*notify->what)) last = notify->what;
-    }
-    return last;
-  }
   bool closed() const { return daemon_.closed(request) && daemon_.closed(event); }
 
  private:

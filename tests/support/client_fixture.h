@@ -18,11 +18,10 @@ struct SetupResult {
   wyx_descriptor_t descriptor = -1;
 };
 
-inline SetupResult setup(const wyx_responsiveness_t& responsiveness = {},
-                         wyx_socket_ctrl_t control = WYX_SOCKET_NO_SIGNAL) {
+inline SetupResult setup() {
   SetupResult result;
   result.rc =
-      wyx_setup(28, 7, &result.descriptor, control, &responsiveness, "", on_ping, on_delayed_error, on_query);
+      wyx_setup(28, 7, &result.descriptor, WYX_SOCKET_NO_SIGNAL, nullptr, "", on_ping, on_delayed_error, on_query);
   return result;
 }
 
@@ -64,14 +63,14 @@ inline wyx_rc_t change_state(wyx_token_t token, std::string state, wyx_num_phase
   const wyx_proposal_info_t info = state_info(state, phases, limit);
   return wyx_change_state_value(token, &info);
 }
-inline wyx_rc_t send_message(wyx_token_t token, std::string text, wyx_num_phases_t phases = WYX_1_PHASE) {
+inline wyx_rc_t send_message(wyx_token_t token, std::string text) {
   wyx_proposal_info_t info = {};
-  info._gs_protocol_info._gs_message_request = {phases, 0, {static_cast<int>(text.size()), text.data()}};
+  info._gs_protocol_info._gs_message_request = {WYX_1_PHASE, 0, {static_cast<int>(text.size()), text.data()}};
   return wyx_send_message(token, &info);
 }
-inline wyx_rc_t leave(wyx_token_t token, unsigned code = 0, wyx_num_phases_t phases = WYX_1_PHASE) {
+inline wyx_rc_t leave(wyx_token_t token, unsigned code = 0) {
   wyx_proposal_info_t info = {};
-  info._gs_protocol_info._gs_leave_request = {phases, 0, code};
+  info._gs_protocol_info._gs_leave_request = {WYX_1_PHASE, 0, code};
   return wyx_leave(token, &info);
 }
 inline wyx_rc_t expel(wyx_token_t token, wyx_provider_t whom, std::string flag) {
