@@ -207,6 +207,8 @@ TEST_F(Routing, ClientOfAToken_isTheEarliestThatIsNotIdle) {
   announce(WYX_GROUP_DISSOLVED);
   EXPECT_EQ(mortal->getToken(), -1);
   EXPECT_EQ(member.getToken(), kToken);
+  member.joinGroup();
+  EXPECT_EQ(member.getMemberCount(), 0) << "those of an earlier life are forgotten";
 }
 
 TEST_F(Routing, Callback_mayDestroyItsOwnClient) {

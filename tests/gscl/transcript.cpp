@@ -120,7 +120,7 @@ after P[-1/-1,T=12] N_PHASE WYX_JOIN
 > own join rejected
 A C::stub_rejectCb(P[-1/-1,T=12]) protocol=WYX_JOIN sumCode=WYX_EXPLICIT_REJECT, myId=-1 provider_token=12
 A Client[P[-1/-1,T=12]] ClientState: GS_IAM_JOINING to GS_IAM_IDLE.
-[IDLE/12 left/]
+[IDLE/12 left/gone]
 before mine
 -> rejectedCb
 A rejectedCb(P[-1/-1,T=12]) for WYX_JOIN
@@ -129,7 +129,7 @@ after P[-1/-1,T=12] REJECTED WYX_JOIN
 > join: WYX_EXISTS
 A GSProvider::joinGroup(P[-1/-1,T=12]) begins
 A stub_join_group(P[-1/-1,T=12]) is issued
-[IDLE/-1 left/]
+[IDLE/-1 left/gone]
 D beginTransaction @
 wyx_join(-1)
 A Client[P[-1/-1,T=-1]] ClientState: GS_IAM_IDLE to GS_IAM_IDLE.
@@ -294,7 +294,7 @@ TEST_F(Transcript, Provider_fromJoinToTheEnd_stepByStep) {
       {"wait", [&] { wait(member); }},
       {"own join in phase",
        [] { phase(WYX_JOIN, {.changed = WYX_PROPOSED_STATE_VALUE, .current = "now", .proposed = "next"}); }},
-      {"own join rejected", [] { reject(WYX_JOIN, {.current = "left"}); }},
+      {"own join rejected", [] { reject(WYX_JOIN, {.current = "left", .proposed = "gone"}); }},
       {"own join approved",
        [] {
          approve(WYX_JOIN, {.changed = WYX_UPDATED_MEMBERSHIP, .current = "one", .members = {kOther, kOwn}});
