@@ -2,12 +2,11 @@
 
 #include <sys/un.h>
 
-#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <filesystem>
-#include <iostream>
 #include <iterator>
 
+#include "common/command_line.h"
 #include "common/log.h"
 #include "common/toml_file.h"
 
@@ -133,14 +132,7 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
   app.add_option("--ready-fd", ready_fd, "Descriptor that is told \"ready\" once clients can connect")
       ->type_name("FD")
       ->excludes(as_daemon);  // a daemon closes what it was started with
-  try {
-    app.parse(argc, argv);
-  } catch (const CLI::Success& asked) {
-    app.exit(asked, std::cout, std::cerr);
-    return std::nullopt;
-  } catch (const CLI::ParseError& error) {
-    throw OptionError(first_line(error.what()));
-  }
+  if (!platform::parse_command_line(app, argc, argv)) return std::nullopt;
 
   Options options;
   if (daemon) make_absolute(&config);

@@ -4,7 +4,7 @@
 
 #include "common/log.h"
 #include "dae/dae.h"
-#include "daemon/printable.h"
+#include "engine/text.h"
 
 namespace gs::daemon {
 namespace {

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 
-#include "daemon/printable.h"
 #include "engine/text.h"
 #include "gscl/GSUtils.h"
 

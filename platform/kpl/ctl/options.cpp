@@ -1,7 +1,6 @@
 #include "ctl/options.h"
 
-#include <CLI/CLI.hpp>
-#include <iostream>
+#include "common/command_line.h"
 
 namespace kpl::ctl {
 namespace {
@@ -108,14 +107,7 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
       options);
   add_request(app, options);
   add_command(app, options, "list", "Tell how subsystems are defined", Action::kList);
-  try {
-    app.parse(argc, argv);
-  } catch (const CLI::Success& asked) {
-    app.exit(asked, std::cout, std::cerr);
-    return std::nullopt;
-  } catch (const CLI::ParseError& error) {
-    throw platform::SettingError(platform::first_line(error.what()));
-  }
+  if (!platform::parse_command_line(app, argc, argv)) return std::nullopt;
   if (app.get_subcommands().empty()) throw platform::SettingError("a COMMAND is needed, see --help");
   check(options);
   return options;

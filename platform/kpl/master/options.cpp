@@ -2,10 +2,9 @@
 
 #include <unistd.h>
 
-#include <CLI/CLI.hpp>
 #include <filesystem>
-#include <iostream>
 
+#include "common/command_line.h"
 #include "common/log.h"
 #include "kpl.h"
 
@@ -43,14 +42,7 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
   app.add_flag("--daemon", options.daemon, "Detach from the terminal; return once subsystems can be started");
   app.add_flag("--check", options.check,
                "Only tell what is wrong with the definitions; exit status 1 if anything is");
-  try {
-    app.parse(argc, argv);
-  } catch (const CLI::Success& asked) {
-    app.exit(asked, std::cout, std::cerr);
-    return std::nullopt;
-  } catch (const CLI::ParseError& error) {
-    throw platform::SettingError(platform::first_line(error.what()));
-  }
+  if (!platform::parse_command_line(app, argc, argv)) return std::nullopt;
   const auto known = platform::log_level(level);
   if (!known)
     throw platform::SettingError("--log-level: must be error, warning, info or debug, not '" + level + "'");

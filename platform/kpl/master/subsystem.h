@@ -38,8 +38,7 @@ struct Surroundings {
 ///
 /// (1) The process says why and ends; only its end counts. A first start that fails is not tried again.
 /// (2) Waiting where the definition says restart and is still there. The delay doubles from crash to crash; a run
-/// that was longer than
-///     the longest delay starts over with the shortest.
+///     that was longer than the longest delay starts over with the shortest.
 /// A stop that the subsystem refuses leads back to active.
 class Subsystem {
  public:

@@ -1,0 +1,24 @@
+// How this host's programs read their command lines.
+#pragma once
+
+#include <CLI/CLI.hpp>
+#include <iostream>
+
+#include "common/settings.h"
+
+namespace platform {
+
+/// False when help or the version was asked for, which is answered then. Throws SettingError for wrong use.
+inline bool parse_command_line(CLI::App& app, int argc, const char* const* argv) {
+  try {
+    app.parse(argc, argv);
+    return true;
+  } catch (const CLI::Success& asked) {
+    app.exit(asked, std::cout, std::cerr);
+    return false;
+  } catch (const CLI::ParseError& error) {
+    throw SettingError(first_line(error.what()));
+  }
+}
+
+}  // namespace platform
