@@ -47,10 +47,15 @@ struct Plan {
   Descriptor output;  // empty: the master's own
 };
 
-void plan_user(const Definition& definition, Plan& plan) {
+/// Null: there is none. Good until the next call.
+const passwd* user_of(const Definition& definition) {
   std::uint64_t number = 0;
   const bool is_number = platform::set_number(definition.user, 0, UINT32_MAX - 1, &number).empty();
-  const passwd* user = is_number ? getpwuid(static_cast<uid_t>(number)) : getpwnam(definition.user.c_str());
+  return is_number ? getpwuid(static_cast<uid_t>(number)) : getpwnam(definition.user.c_str());
+}
+
+void plan_user(const Definition& definition, Plan& plan) {
+  const passwd* user = user_of(definition);
   if (user == nullptr) throw LaunchError("there is no user '" + definition.user + "'");
   if (user->pw_uid == geteuid()) return;
   plan.change_user = true;
@@ -129,6 +134,12 @@ void reset_signals(const sigset_t& mask) {
 }
 
 }  // namespace
+
+std::optional<uid_t> user_id(const Definition& definition) {
+  const passwd* user = user_of(definition);
+  if (user == nullptr) return std::nullopt;
+  return user->pw_uid;
+}
 
 Launched launch(const Definition& definition, int request_end, const std::string& status_socket) {
   Plan plan;

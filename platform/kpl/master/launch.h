@@ -24,6 +24,9 @@ struct Launched {
   platform::Descriptor report;  // readable, not blocking, once it is known how it went
 };
 
+/// The definition's user; nothing: there is none of that name.
+std::optional<uid_t> user_id(const Definition& definition);
+
 /// Forks a process that leads a session of its own, has `request_end` (-1: /dev/null) on descriptor 0, the
 /// definition's user, and the master's environment with KPL_MASTER_SOCKET, and becomes the definition's program.
 /// With a request channel a user other than root gets 0 as its group, which the channel demands of a subsystem.

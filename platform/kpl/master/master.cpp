@@ -7,7 +7,7 @@
 #include <csignal>
 
 #include "kpl.h"
-#include "master/left_behind.h"
+#include "master/launch.h"
 
 namespace kpl::master {
 namespace {
@@ -69,9 +69,11 @@ Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log)
       interrupted_(loop_, SIGINT, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }) {}
 
 void Master::start() {
-  left_behind_ = find_left_behind(status_socket_);
-  for (const auto& [name, pid] : left_behind_) log_->error("{}", left_behind(name));
   read_definitions();
+  for (const Claim& claim : find_claims(status_socket_)) {
+    if (believes(claim)) left_behind_[claim.name] = claim.pid;
+  }
+  for (const auto& [name, pid] : left_behind_) log_->error("{}", left_behind(name));
   for (auto& [name, subsystem] : subsystems_) {
     if (!subsystem.definition().autostart) continue;
     const std::string obstacle = left_behind(name);
@@ -83,9 +85,17 @@ void Master::start() {
   }
 }
 
+bool Master::believes(const Claim& claim) const {
+  if (claim.user == geteuid()) return true;
+  const auto found = subsystems_.find(claim.name);
+  return found != subsystems_.end() && user_id(found->second.definition()) == claim.user;
+}
+
 std::string Master::left_behind(const std::string& name) const {
   const auto found = left_behind_.find(name);
-  if (found == left_behind_.end() || subsystem_of(found->second, status_socket_) != name) return {};
+  if (found == left_behind_.end()) return {};
+  const auto claim = claim_of(found->second, status_socket_);
+  if (!claim || claim->name != name || !believes(*claim)) return {};
   const std::string pid = std::to_string(found->second);
   return name + " runs as process " + pid +
          ", left behind by an earlier kplmstr: it cannot be asked, end it (kill " + pid + ") before you start it";

@@ -11,6 +11,7 @@
 
 #include "master/control_server.h"
 #include "master/definition.h"
+#include "master/left_behind.h"
 #include "master/loop.h"
 #include "master/options.h"
 #include "master/status_server.h"
@@ -33,6 +34,7 @@ class Master {
   void forget_undefined(const Folder& folder);
   /// Those without a process.
   void erase_undefined();
+  bool believes(const Claim& claim) const;
   /// What is said of a process that an earlier master left behind; empty: none of that name runs.
   std::string left_behind(const std::string& name) const;
   void on_children();
