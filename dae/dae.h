@@ -155,8 +155,8 @@ ZN_GSCL_EXPORT void dae_init_term_sig(void (*term_rtn)(int), int restart);
 ZN_GSCL_EXPORT void dae_init_KPL_msq(int* msqid, int msqkey, int msqtype, const dae_req_msq_t* KPL_rtns,
                                      int restart);
 /// Requests arrive on a socket. *KPL_sockd is the descriptor wanted for it, 3 or more, or negative for any from 3
-/// up; it becomes the descriptor in dae_init, -1 when there is no channel. `KPL_rtns` may be null, `KPL_sockd`
-/// not.
+/// up; it becomes the descriptor in dae_init, -1 when there is no channel. `KPL_rtns` may be null, not so
+/// `KPL_sockd`.
 ZN_GSCL_EXPORT void dae_init_KPL_sock(int* KPL_sockd, const dae_req_sock_t* KPL_rtns, int restart);
 /// Leaves the request socket in blocking mode, so that dae_KPL_req waits for a request.
 ZN_GSCL_EXPORT void dae_init_KPL_sock_block(void);
@@ -168,9 +168,10 @@ ZN_GSCL_EXPORT void dae_init_KPL_sock_block(void);
 /// Null accepts no parent. `err_detail` may be null; else it stays in use until the next dae_init or dae_KPL_req.
 ///
 /// Afterwards the process leads a session (or, where it led a process group before, still that) without terminal,
-/// ignores SIGHUP, SIGINT, SIGQUIT, SIGTSTP, SIGTTIN,
-/// SIGTTOU and SIGPIPE, has "/" as working directory and a umask of 0, descriptors 0 to 2 open and, unless they
-/// were to be kept, no inherited descriptor below 2000 and the limit in force (under KPL and inetd from 3 on).
+/// ignores SIGHUP, SIGINT, SIGQUIT,
+/// SIGTSTP, SIGTTIN, SIGTTOU and SIGPIPE, has "/" as working directory and a umask of 0, descriptors 0 to 2 open
+/// and, unless they were to be kept, no inherited descriptor below 2000 and the limit in force (under KPL and inetd
+/// from 3 on).
 /// Started by anything else than these two and process 1, it is a child of the process that called, which has
 /// ended with exit(0), its exit handlers included: failures after that are reported in the child. The child goes
 /// on when the caller is no longer its parent, whether process 1 or a sub-reaper has adopted it.

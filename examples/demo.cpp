@@ -26,10 +26,12 @@ const char* zn::colour(const char* code) {
 const char* zn::colour_off() { return is_coloured() ? "\033[0m" : ""; }
 
 int main(int argc, char** argv) {
+  const bool is_inside = argc == 3 && std::string(argv[1]) == zn::kInside;
+  if (argc != 1 && !is_inside) return std::fprintf(stderr, "usage: demo\n"), 2;
   zn::catch_interrupts();
   try {
-    if (argc == 2) {
-      zn::demo_inside(argv[1]);
+    if (is_inside) {
+      zn::demo_inside(argv[2]);
       return 0;
     }
     zn::demo_group();

@@ -12,6 +12,9 @@ void demo_group();
 /// comes back where it may not have those.
 void demo_master();
 
+/// First argument of the demonstration when it is to run demo_inside; the second is the folder.
+inline constexpr const char* kInside = "--inside";
+
 /// The part of demo_master that runs inside of the namespaces, as process 1. `folder` is for its files.
 void demo_inside(const std::string& folder);
 

@@ -228,7 +228,7 @@ void zn::demo_master() {
   }
   const auto start = Clock::now();
   const TempFolder folder;
-  Process inside(in_namespaces({program("demo"), folder.path()}), {});
+  Process inside(in_namespaces({program("demo"), kInside, folder.path()}), {});
   for (bool more = true; more;) {
     wait_readable({inside.output()}, start + 3 * kStepLimit);
     more = inside.read_some();

@@ -115,7 +115,7 @@ TEST(DaemonFromInetd, Keeps_its_sockets_and_its_process) {
 }
 
 TEST(DaemonUnderMaster, Is_recognised_and_ends_with_its_exit_handlers_when_it_is_asked_to) {
-  const std::string obstacle = kpl_test::PrivateMaster::obstacle();
+  const std::string obstacle = zn::namespaces_obstacle();
   if (!obstacle.empty()) GTEST_SKIP() << obstacle;
   for (const bool keeps : {false, true}) {
     Started daemon;

@@ -10,21 +10,12 @@
 namespace kpl_test {
 namespace {
 
-using Command = std::vector<std::string>;
-
 // Process 1 of the namespace.
 constexpr char kInit[] =
     "start() { setsid \"$@\" & master=$!; }\n"
     "start \"$@\"\n"
     "while read -r line; do eval \"$line\"; done\n"
     "kill -TERM $master 2>/dev/null; wait $master";
-
-Command in_namespaces(const Command& command) {
-  Command whole = {"unshare", "--pid", "--fork", "--mount-proc", "--ipc", "--kill-child"};
-  if (geteuid() != 0) whole.insert(whole.end(), {"--user", "--map-root-user"});
-  whole.insert(whole.end(), command.begin(), command.end());
-  return whole;
-}
 
 }  // namespace
 
@@ -34,14 +25,9 @@ std::string program_path(const std::string& program) {
 }
 
 Outcome run(const std::string& program, const std::vector<std::string>& arguments) {
-  Command command = {program_path(program)};
+  std::vector<std::string> command = {program_path(program)};
   command.insert(command.end(), arguments.begin(), arguments.end());
   return test_support::run(command);
-}
-
-std::string PrivateMaster::obstacle() {
-  const Outcome tried = test_support::run(in_namespaces({"true"}));
-  return tried.status == 0 ? "" : "namespaces cannot be made here: " + tried.err;
 }
 
 PrivateMaster::~PrivateMaster() {
@@ -61,12 +47,20 @@ void PrivateMaster::define_probe(const std::string& name, const std::string& tra
 }
 
 void PrivateMaster::start(const std::vector<std::string>& options) {
-  Command command = in_namespaces({"sh", "-c", kInit, "sh", program_path("kplmstr"), "--definitions",
-                                   dir_ / "definitions", "--socket-path", socket_path()});
+  std::vector<std::string> command = {"sh",
+                                      "-c",
+                                      kInit,
+                                      "sh",
+                                      program_path("kplmstr"),
+                                      "--definitions",
+                                      dir_ / "definitions",
+                                      "--socket-path",
+                                      socket_path()};
   command.insert(command.end(), options.begin(), options.end());
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("pipe2");
-  shell_ = test_support::spawn(command, log_path("master"), log_path("master"), ends[0], STDIN_FILENO);
+  shell_ = test_support::spawn(zn::in_namespaces(command), log_path("master"), log_path("master"), ends[0],
+                               STDIN_FILENO);
   commands_ = ends[1];
   close(ends[0]);
   if (!wait_until([&] { return ctl({"list"}).status == 0; }))

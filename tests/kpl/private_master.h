@@ -23,9 +23,6 @@ Outcome run(const std::string& program, const std::vector<std::string>& argument
 
 class PrivateMaster {
  public:
-  /// Why there can be no namespaces here; empty: there can.
-  static std::string obstacle();
-
   ~PrivateMaster();
 
   /// Writes NAME.toml with the name and `rest`, ahead of `start` or of SIGHUP.
@@ -62,7 +59,7 @@ class PrivateMaster {
 class WithMaster : public testing::Test {
  protected:
   void SetUp() override {
-    const std::string obstacle = PrivateMaster::obstacle();
+    const std::string obstacle = zn::namespaces_obstacle();
     if (!obstacle.empty()) GTEST_SKIP() << obstacle;
   }
   void TearDown() override {

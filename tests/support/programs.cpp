@@ -7,8 +7,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <fstream>
-#include <iterator>
 #include <stdexcept>
 #include <thread>
 
@@ -19,11 +17,6 @@ extern char** environ;
 namespace test_support {
 
 constexpr std::chrono::seconds kHangLimit{60};
-
-std::string content_of(const std::string& path) {
-  std::ifstream file(path);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
 
 bool wait_until(const std::function<bool()>& done) {
   const auto give_up = std::chrono::steady_clock::now() + kHangLimit;

@@ -7,6 +7,8 @@
 #include <string>
 #include <vector>
 
+#include "examples/processes.h"
+
 namespace test_support {
 
 /// What a program that ended left.
@@ -23,7 +25,8 @@ pid_t spawn(std::vector<std::string> command, const std::string& out, const std:
 /// Its exit status; -1: a signal ended it, or this call did.
 int wait_for_exit(pid_t pid);
 
-std::string content_of(const std::string& path);
+using zn::content_of;
+
 /// False: still not after a long time.
 bool wait_until(const std::function<bool()>& done);
 
