@@ -1,4 +1,4 @@
-// The daemons' log: lines on standard error.
+// The daemons' log: lines on standard error, which never hold up who logs.
 #pragma once
 
 #include <spdlog/logger.h>
@@ -12,10 +12,13 @@ namespace platform {
 /// "error", "warning", "info" or "debug"; nothing for any other text.
 std::optional<spdlog::level::level_enum> log_level(const std::string& name);
 
-/// Standard output and error are appended to the file from here on. Throws std::system_error.
+/// Standard output and error are appended to the file from here on. Throws std::runtime_error: it cannot be
+/// opened, is a link, or lies where others could have put it.
 void log_to_file(const std::string& path);
 
-/// For one thread. `name` is the logger's, not printed.
+/// For one thread. Another one writes, so a standard error that takes nothing costs lines, which are counted, and
+/// no time; the last lines are waited for, for a moment, when the last owner goes. `name` is the logger's, not
+/// printed.
 std::shared_ptr<spdlog::logger> make_log(const std::string& name, spdlog::level::level_enum level);
 
 }  // namespace platform

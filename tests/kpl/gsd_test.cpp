@@ -61,6 +61,7 @@ TEST_F(GsdDaemon, TraceAndRefresh_SwitchTheLogReadTheConfigurationAndTellItsMist
   EXPECT_EQ(ctl({"refresh", "gsd"}).out, "node-number: changes with the next start\n");  // and the trace goes on
   connect_once();
   EXPECT_TRUE(master.wait_for_log("gsd", " info "));
+  EXPECT_TRUE(master.wait_for_log("gsd", "closed: "));
   EXPECT_EQ(ctl({"trace", "off", "gsd"}).status, 0);
   const std::string before = master.log("gsd");
   connect_once();

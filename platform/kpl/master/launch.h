@@ -30,7 +30,7 @@ std::optional<uid_t> user_id(const Definition& definition);
 /// Forks a process that leads a session of its own, has `request_end` (-1: /dev/null) on descriptor 0, the
 /// definition's user, and the master's environment with KPL_MASTER_SOCKET, and becomes the definition's program.
 /// With a request channel a user other than root gets 0 as its group, which the channel demands of a subsystem.
-/// Throws LaunchError. To be called in a process of one thread.
+/// Throws LaunchError. Other threads may run: the new process calls nothing that waits for them.
 Launched launch(const Definition& definition, int request_end, const std::string& status_socket);
 
 /// How it went: nothing while that is not known, empty text when the program runs, else why it does not.
