@@ -4,7 +4,6 @@
 #include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 
 #include <cerrno>
 #include <cstring>
@@ -14,14 +13,18 @@ namespace {
 
 constexpr mode_t kOwnerOnly = 0600;
 constexpr mode_t kOwnerAndGroup = 0660;
+constexpr char kLock[] = ".lock";
+constexpr int kMaxDigits = 10;
 
 [[noreturn]] void fail(const std::string& what, int error) { throw ListenError(what + ": " + strerror(error)); }
 
+/// The file may be somebody else's work: only what is a number is believed, and printed.
 std::string holder_of(int lock_fd) {
-  char text[32] = {};
+  char text[kMaxDigits + 2] = {};
   const ssize_t length = pread(lock_fd, text, sizeof text - 1, 0);
-  const std::string pid(text, length > 0 ? strcspn(text, "\n") : 0);
-  return pid.empty() ? "" : " (pid " + pid + ")";
+  const std::size_t digits = length > 0 ? strspn(text, "0123456789") : 0;
+  if (digits == 0 || digits > kMaxDigits || text[digits] != '\n') return {};
+  return " (pid " + std::string(text, digits) + ")";
 }
 
 }  // namespace
@@ -32,59 +35,70 @@ void make_directory_of(const std::string& path) {
 }
 
 Listener::Listener(const std::string& program, const std::string& path, std::optional<unsigned> access_group)
-    : program_(program), path_(path) {
-  lock();
-  bind_and_listen(access_group);
+    : program_(program), path_(path), access_group_(access_group) {
+  Place place = socket_place(path);
+  lock_ = lock(place);
+  socket_ = listen_at(std::move(place));
 }
 
-Listener::~Listener() { close(); }
-
-void Listener::close() {
-  if (!socket_) return;
-  unlink(path_.c_str());
-  socket_ = Descriptor();
-}
-
-void Listener::lock() {
-  const std::string lock_path = path_ + ".lock";
-  lock_ = Descriptor(open(lock_path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kOwnerOnly));
-  if (!lock_) fail("cannot open the lock file " + lock_path, errno);
-  if (flock(lock_.get(), LOCK_EX | LOCK_NB) != 0) {
-    if (errno != EWOULDBLOCK) fail("cannot lock " + lock_path, errno);
-    throw ListenError("another " + program_ + holder_of(lock_.get()) + " already serves " + path_);
+Descriptor Listener::lock(const Place& place) const {
+  const std::string name = place.name() + kLock;
+  const std::string path = path_ + kLock;
+  constexpr int kFlags = O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY;
+  Descriptor file(openat(place.folder(), name.c_str(), kFlags, kOwnerOnly));
+  if (!file) fail("cannot open the lock file " + path, errno);
+  const auto opened = file_of(file.get());
+  if (!opened || !S_ISREG(opened->st_mode) || opened->st_uid != geteuid() || opened->st_nlink != 1) {
+    throw ListenError(path + " is no lock file of this daemon's user: remove it, or choose another path");
   }
+  if (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
+    if (errno != EWOULDBLOCK) fail("cannot lock " + path, errno);
+    throw ListenError("another " + program_ + holder_of(file.get()) + " already serves " + path_);
+  }
+  if (!same_file(opened, place.found(kLock))) throw ListenError(path + " was removed while it was locked");
   const std::string pid = std::to_string(getpid()) + "\n";
-  if (ftruncate(lock_.get(), 0) != 0 || pwrite(lock_.get(), pid.data(), pid.size(), 0) < 0) {
-    fail("cannot write " + lock_path, errno);
+  if (ftruncate(file.get(), 0) != 0 || pwrite(file.get(), pid.data(), pid.size(), 0) < 0) {
+    fail("cannot write " + path, errno);
   }
+  return file;
 }
 
-void Listener::bind_and_listen(std::optional<unsigned> access_group) {
-  struct stat found {};
-  if (lstat(path_.c_str(), &found) == 0) {
-    if (!S_ISSOCK(found.st_mode)) throw ListenError(path_ + " exists and is not a socket");
-    if (unlink(path_.c_str()) != 0) fail("cannot remove the old socket " + path_, errno);
-  }
-  Descriptor bound(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-  if (!bound) fail("cannot make a socket", errno);
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  if (path_.size() >= sizeof address.sun_path) throw ListenError("the socket path " + path_ + " is too long");
-  memcpy(address.sun_path, path_.c_str(), path_.size() + 1);
+std::unique_ptr<NamedSocket> Listener::listen_at(Place place) const {
+  const NamedSocket::Access access{access_group_ ? kOwnerAndGroup : kOwnerOnly, access_group_};
+  auto bound = std::make_unique<NamedSocket>(std::move(place), SOCK_SEQPACKET, access);
+  if (::listen(bound->fd(), SOMAXCONN) != 0) fail("cannot listen on " + path_, errno);
+  return bound;
+}
 
-  // Made for the owner alone and opened to the group afterwards: there is no moment at which others could connect.
-  const mode_t old_mask = umask(0777 & ~kOwnerOnly);
-  const int result = bind(bound.get(), reinterpret_cast<sockaddr*>(&address), sizeof address);
-  const int error = errno;
-  umask(old_mask);
-  if (result != 0) fail("cannot bind " + path_, error);
-  socket_ = std::move(bound);
-  if (access_group) {
-    if (chown(path_.c_str(), static_cast<uid_t>(-1), *access_group) != 0)
-      fail("cannot give " + path_ + " to the access group", errno);
-    if (chmod(path_.c_str(), kOwnerAndGroup) != 0) fail("cannot open " + path_ + " to the access group", errno);
+bool Listener::lock_in_place(const Place& place) const {
+  return same_file(place.found(kLock), file_of(lock_.get()));
+}
+
+bool Listener::put_in_place(spdlog::logger& log, const std::function<void()>& before) {
+  Place place = socket_place(path_);
+  if (!lock_in_place(place)) {
+    lock_ = lock(place);
+    log.warn("{}{} was removed: locked anew", path_, kLock);
   }
-  if (listen(socket_.get(), SOMAXCONN) != 0) fail("cannot listen on " + path_, errno);
+  if (socket_->in_place()) return false;
+  auto fresh = listen_at(std::move(place));
+  before();
+  socket_ = std::move(fresh);
+  log.warn("{} was removed or replaced: bound anew", path_);
+  return true;
+}
+
+bool Listener::keep_in_place(spdlog::logger& log, const std::function<void()>& before) {
+  if (!socket_) return false;
+  try {
+    const bool bound_anew = put_in_place(log, before);
+    obstacle_.clear();
+    return bound_anew;
+  } catch (const ListenError& error) {
+    if (obstacle_ != error.what()) log.error("{}", error.what());
+    obstacle_ = error.what();
+    return false;
+  }
 }
 
 }  // namespace platform

@@ -8,6 +8,7 @@
 #include <nlohmann/json.hpp>
 
 #include "control/control.h"
+#include "dae/datagram.h"
 #include "kpl/private_master.h"
 #include "support/raw_client.h"
 
@@ -43,7 +44,7 @@ class KplmstrTransport : public Kplmstr, public testing::WithParamInterface<cons
   void SetUp() override {
     Kplmstr::SetUp();
     if (IsSkipped()) return;
-    chmod(master.path("").c_str(), 0777);
+    chmod(master.path("").c_str(), 01777);
     const std::string transport = GetParam();
     std::string more = "group = \"tests\"\n";
     if (transport == "queue=77,5") more += "queue-key = 77\nqueue-type = 5\n";
@@ -232,7 +233,16 @@ TEST_F(Kplmstr, Hangup_ReadsTheDefinitionsAgainAndEndsNothing) {
   master.define("removed", sleeper);
   master.define("broken", sleeper);
   master.define("old", "program = \"/bin/true\"\n");
-  master.start();
+  master.define("environment",
+                "program = \"/usr/bin/env\"\ntransport = \"signals\"\nautostart = true\noutput = \"" +
+                    master.log_path("environment") + "\"\n");
+  const Datagram manager;
+  setenv("NOTIFY_SOCKET", ("@" + manager.name()).c_str(), 1);
+  master.start({"--log-file", master.log_path("file")});
+  unsetenv("NOTIFY_SOCKET");
+  EXPECT_THAT(manager.receive(), HasSubstr("READY=1"));
+  EXPECT_TRUE(master.wait_for_log("environment", "KPL_SUBSYSTEM="));
+  EXPECT_THAT(master.log("environment"), Not(HasSubstr("NOTIFY_SOCKET")));
   EXPECT_TRUE(
       wait_until([&] { return status_of("removed").contains("pid") && status_of("broken").contains("pid"); }));
   const auto file_of = [&](const std::string& name) { return master.path("definitions/" + name + ".toml"); };
@@ -240,8 +250,11 @@ TEST_F(Kplmstr, Hangup_ReadsTheDefinitionsAgainAndEndsNothing) {
   unlink(file_of("removed").c_str());
   std::ofstream(file_of("broken")) << "what?";
   master.define("new", "program = \"/bin/true\"\n");
+  std::filesystem::rename(master.log_path("file"), master.log_path("older"));
   master.tell_shell("kill -HUP $master");
   EXPECT_TRUE(master.wait_for_status("new "));
+  EXPECT_THAT(manager.receive(), HasSubstr("RELOADING=1"));
+  EXPECT_TRUE(master.wait_for_log("file", "subsystems defined"));
   EXPECT_EQ(ctl({"status", "old"}).status, kWrongState);
   for (const char* name : {"removed", "broken"}) {
     master.tell_shell("kill -KILL " + status_of(name)["pid"].dump());
@@ -251,7 +264,7 @@ TEST_F(Kplmstr, Hangup_ReadsTheDefinitionsAgainAndEndsNothing) {
 
   std::filesystem::rename(master.path("definitions"), master.path("gone"));
   master.tell_shell("kill -HUP $master");
-  EXPECT_TRUE(master.wait_for_log("master", "nothing changes"));
+  EXPECT_TRUE(master.wait_for_log("file", "nothing changes"));
   EXPECT_EQ(status_of("broken")["restarts"], 1);
 }
 

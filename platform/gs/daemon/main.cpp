@@ -7,8 +7,11 @@
 #include <cstdio>
 #include <exception>
 #include <functional>
+#include <optional>
 
+#include "common/held_signals.h"
 #include "common/log.h"
+#include "common/service_manager.h"
 #include "daemon/options.h"
 #include "daemon/server.h"
 #include "daemon/service.h"
@@ -37,14 +40,17 @@ void serve(gs::daemon::Options options, std::function<gs::daemon::Options()> rer
   // Never destroyed: SIGTERM may find it until the process ends.
   static auto* const service = new gs::daemon::Service(std::move(reread));
   if (options.daemon) service->detach();
-  signal(SIGPIPE, SIG_IGN);
+  std::optional<platform::HeldSignals> held(std::in_place);
+  const platform::ServiceManager manager;  // a daemon has closed all descriptors when it comes here
   raise_descriptor_limit();
   if (!options.log_file.empty()) platform::log_to_file(options.log_file);
   const auto log = platform::make_log("gsd", options.log_level);
   gs::daemon::Server server(options, log);
-  service->attach(server, options);
+  service->attach(server, options, manager);
+  held.reset();
   log->info("gsd " GSD_VERSION " serves {} as node {}", options.socket_path, options.node_number);
   tell_ready(options.ready_fd);
+  service->tell_ready();
   server.run();
   log->info("stopped");
 }
@@ -62,6 +68,7 @@ int fail(const char* problem, int status, bool daemon) {
 
 int main(int argc, char** argv) {
   bool daemon = false;
+  signal(SIGPIPE, SIG_IGN);
   try {
     const auto options = gs::daemon::parse_options(argc, argv);
     if (!options) return 0;

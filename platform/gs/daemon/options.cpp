@@ -107,6 +107,12 @@ void make_absolute(std::string* path) {
   if (!path->empty()) *path = kStart / *path;
 }
 
+/// One that cannot be looked at is there: reading it tells why.
+bool is_missing(const std::string& path) {
+  std::error_code error;
+  return std::filesystem::status(path, error).type() == std::filesystem::file_type::not_found;
+}
+
 }  // namespace
 
 Options read_config(const std::string& path, Options options) {
@@ -126,6 +132,9 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
     app.add_option(std::string("--") + kSettings[i].name, given[i], kSettings[i].help)
         ->type_name(kSettings[i].value);
   }
+  app.add_option("--config-if-exists", config, "The same, where there is such a file")
+      ->type_name("FILE")
+      ->excludes("--config");
   bool daemon = false;
   CLI::Option* as_daemon =
       app.add_flag("--daemon", daemon, "Become a daemon, under the KPL master or from a shell");
@@ -136,7 +145,9 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
 
   Options options;
   if (daemon) make_absolute(&config);
-  if (app.count("--config") != 0) options = read_config(config, options);
+  if (app.count("--config") != 0 || (app.count("--config-if-exists") != 0 && !is_missing(config))) {
+    options = read_config(config, options);
+  }
   for (std::size_t i = 0; i < std::size(kSettings); ++i) {
     const std::string option = std::string("--") + kSettings[i].name;
     if (app.count(option) == 0) continue;

@@ -72,7 +72,6 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
   const auto on_stop = [](evutil_socket_t signal, short, void* self) {
     static_cast<Server*>(self)->stop(strsignal(static_cast<int>(signal)));
   };
-  acceptable_ = make_event(listener_.fd(), EV_READ | EV_PERSIST, call<&Server::on_acceptable>, this);
   accept_again_ = make_event(
       -1, 0,
       [](evutil_socket_t, short, void* self) {
@@ -88,23 +87,50 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
   interrupted_ = make_event(SIGINT, EV_SIGNAL | EV_PERSIST, on_stop, this);
   event_add(terminated_.get(), nullptr);
   event_add(interrupted_.get(), nullptr);
-  event_add(acceptable_.get(), nullptr);
+  start_accepting();
+  constexpr timeval kLookAgain = {Listener::kLookAgain.count(), 0};
+  look_again_.emplace(
+      *this, -1, 0, [this] { look_at_path(); }, &kLookAgain);
 }
 
 Server::~Server() = default;
 
 void Server::run() { event_base_dispatch(base_.get()); }
 
-void Server::watch(int fd, std::function<void()> action) {
-  watched_action_ = std::move(action);
-  const auto on_readable = [](evutil_socket_t, short, void* self) {
-    static_cast<Server*>(self)->watched_action_();
-  };
-  watched_ = make_event(fd, EV_READ | EV_PERSIST, on_readable, this);
-  event_add(watched_.get(), nullptr);
+Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action,
+                           const timeval* every)
+    : server_(server),
+      action_(std::move(action)),
+      event_(server.make_event(fd, static_cast<short>(what | EV_PERSIST), call, this)) {
+  event_add(event_.get(), every);
+}
+
+void Server::Repeated::call(evutil_socket_t, short, void* self) {
+  const auto* repeated = static_cast<Repeated*>(self);
+  repeated->action_();
+  repeated->server_.arm_deadline();
+}
+
+void Server::repeat(std::chrono::milliseconds every, std::function<void()> action) {
+  const timeval time = {every.count() / 1000, every.count() % 1000 * 1000};
+  repeated_.emplace(*this, -1, 0, std::move(action), &time);
 }
 
 // ---------------------------------------------------------------------------------------------- new connections
+
+void Server::start_accepting() {
+  acceptable_ = make_event(listener_.fd(), EV_READ | EV_PERSIST, call<&Server::on_acceptable>, this);
+  event_add(acceptable_.get(), nullptr);
+}
+
+/// Somebody may have removed or replaced the socket; who is connected does not notice, new clients would.
+void Server::look_at_path() {
+  const auto leave_old = [this] {
+    on_acceptable();  // those that have found it are still served
+    acceptable_.reset();
+  };
+  if (listener_.keep_in_place(*log_, leave_old)) start_accepting();
+}
 
 void Server::on_acceptable() {
   for (int i = 0; i < kAcceptsAtOnce && accept_one(); ++i) {
@@ -123,7 +149,8 @@ bool Server::accept_one() {
 
 /// The connection that could not be accepted stays in the queue and would wake the loop again and again.
 void Server::pause_accepting(int error) {
-  log_->warn("cannot accept more connections for now: {}", strerror(error));
+  sessions_.log_about({}, spdlog::level::warn,
+                      std::string("cannot accept more connections for now: ") + strerror(error));
   event_del(acceptable_.get());
   event_add(accept_again_.get(), &kAcceptPause);
 }
@@ -132,8 +159,9 @@ void Server::add_connection(Descriptor socket) {
   const std::optional<Peer> peer = platform::peer_of(socket.get());
   if (!peer) return;  // gone already
   if (!access_.allows(*peer)) {
-    log_->warn("connection (pid {}, uid {}): closed: not permitted", peer->pid, peer->uid);
-    return;
+    const std::string whose = "pid " + std::to_string(peer->pid) + ", uid " + std::to_string(peer->uid);
+    return sessions_.log_about(peer->uid, spdlog::level::warn,
+                               "connection (" + whose + "): closed: not permitted");
   }
   enlarge_send_buffer(socket.get());
   const ConnectionId id = ++last_connection_;
@@ -214,6 +242,7 @@ void Server::stop(const std::string& why) {
   if (stopping_) return;
   log_->info("stopping on {} with {} clients", why, sessions_.sessions());
   stopping_ = true;
+  stopping_action_();
   event_del(acceptable_.get());
   event_del(accept_again_.get());
   event_del(deadline_.get());

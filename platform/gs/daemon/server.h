@@ -4,6 +4,8 @@
 #include <event2/event.h>
 #include <spdlog/logger.h>
 
+#include <chrono>
+#include <csignal>
 #include <functional>
 #include <memory>
 #include <unordered_map>
@@ -32,11 +34,17 @@ class Server : private Transport {
   /// `why` is for the log. Again: does nothing.
   void stop(const std::string& why);
 
-  /// Calls `action` whenever `fd` is readable. One descriptor at most.
-  void watch(int fd, std::function<void()> action);
+  // What else the loop does, each of them set once at most.
+  /// Calls `action` whenever `fd` is readable.
+  void watch(int fd, std::function<void()> action) { watched_.emplace(*this, fd, EV_READ, std::move(action)); }
+  void on_hangup(std::function<void()> action) { hangup_.emplace(*this, SIGHUP, EV_SIGNAL, std::move(action)); }
+  void repeat(std::chrono::milliseconds every, std::function<void()> action);
+  /// Before the clients are told.
+  void on_stopping(std::function<void()> action) { stopping_action_ = std::move(action); }
   void set_log_level(spdlog::level::level_enum level) { log_->set_level(level); }
-  void log_error(const std::string& what) { log_->error("{}", what); }
+  spdlog::logger& log() { return *log_; }
   void set_queue_bound(std::size_t bytes) { sessions_.set_queue_bound(bytes); }
+  std::size_t clients() const { return sessions_.sessions(); }
   std::vector<Engine::GroupStatus> groups() const { return sessions_.groups(); }
   std::vector<SessionLayer::SessionStatus> sessions() const { return sessions_.status(); }
 
@@ -48,6 +56,20 @@ class Server : private Transport {
     void operator()(event_base* base) const { event_base_free(base); }
   };
   using EventPtr = std::unique_ptr<event, FreeEvent>;
+
+  /// Calls an action again and again.
+  class Repeated {
+   public:
+    Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action,
+             const timeval* every = nullptr);
+
+   private:
+    static void call(evutil_socket_t, short, void* self);
+
+    Server& server_;
+    const std::function<void()> action_;
+    EventPtr event_;
+  };
 
   struct Connection {
     Server* server;
@@ -68,6 +90,8 @@ class Server : private Transport {
   void on_writable(ConnectionId id);
   void on_deadline();
 
+  void look_at_path();
+  void start_accepting();
   bool accept_one();
   void add_connection(Descriptor socket);
   void pause_accepting(int error);
@@ -93,8 +117,11 @@ class Server : private Transport {
   EventPtr terminated_;
   EventPtr interrupted_;
   EventPtr farewell_over_;
-  std::function<void()> watched_action_;
-  EventPtr watched_;
+  std::function<void()> stopping_action_ = [] {};
+  std::optional<Repeated> watched_;
+  std::optional<Repeated> hangup_;
+  std::optional<Repeated> repeated_;
+  std::optional<Repeated> look_again_;
   std::optional<Time> armed_;  // for which time deadline_ stands
   std::unordered_map<ConnectionId, Connection> connections_;
   ConnectionId last_connection_ = 0;

@@ -49,11 +49,19 @@ void Service::detach() {
   throw std::runtime_error("cannot become a daemon: " + std::to_string(code) + " " + err_detail.dae_error_string);
 }
 
-void Service::attach(Server& server, Options& options) {
+void Service::attach(Server& server, Options& options, const platform::ServiceManager& manager) {
   server_ = &server;
   options_ = &options;
+  manager_ = &manager;
+  server.on_hangup([this] { on_hangup(); });
+  server.on_stopping([this] { manager_->stopping(); });
+  if (manager.alive_every()) server.repeat(*manager.alive_every(), [this] { manager_->alive(); });
   if (getKPLDescriptor() >= 0) server.watch(getKPLDescriptor(), [this] { on_request(); });
   if (getStopCode() != 0) server.stop(getStopMsg());  // SIGTERM came before the server took it over
+}
+
+void Service::tell_ready() const {
+  manager_->ready("serves " + options_->socket_path + " as node " + std::to_string(options_->node_number));
 }
 
 void Service::on_request() {
@@ -71,9 +79,12 @@ void Service::traceEnd() {
   server_->set_log_level(options_->log_level);
 }
 
-/// What cannot change while clients are connected is told, not dropped in silence. A mistake changes nothing.
-void Service::refresh() try {
-  const auto later = [](const char* setting) { inform_printf("%s: changes with the next start\n", setting); };
+/// What cannot change while clients are connected is told, not dropped in silence.
+std::vector<std::string> Service::read_again() {
+  std::vector<std::string> told;
+  const auto later = [&](const char* setting) {
+    told.push_back(std::string(setting) + ": changes with the next start");
+  };
   const Options now = reread_();
   // Also under the old name: it may have been moved away to keep it short.
   if (!now.log_file.empty()) {
@@ -89,9 +100,25 @@ void Service::refresh() try {
   if (now.socket_path != options_->socket_path) later("socket-path");
   if (now.access_group != options_->access_group) later("access-group");
   if (now.node_number != options_->node_number) later("node-number");
+  return told;
+}
+
+void Service::refresh() try {
+  for (const std::string& told : read_again()) inform_printf("%s\n", told.c_str());
 } catch (const std::exception& error) {
   error_printf("%s", error.what());
-  server_->log_error(std::string("refresh: ") + error.what());
+  server_->log().error("refresh: {}", error.what());
+}
+
+void Service::on_hangup() {
+  manager_->reloading();
+  try {
+    for (const std::string& told : read_again()) server_->log().warn("{}", told);
+    server_->log().info("the configuration was read again");
+  } catch (const std::exception& error) {
+    server_->log().error("SIGHUP: {}; nothing changes", error.what());
+  }
+  tell_ready();
 }
 
 void Service::longStatus() {

@@ -4,7 +4,9 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <vector>
 
+#include "common/service_manager.h"
 #include "daemon/options.h"
 #include "daemon/server.h"
 #include "gscl/KPLDriver.h"
@@ -13,7 +15,7 @@ namespace gs::daemon {
 
 /// Serves the master's requests on the server's loop: long status, trace on and off (requests and their answers in
 /// the log, with the long trace the notifications as well), refresh (the configuration is read again) and stop.
-/// SIGTERM stops the server whoever started it.
+/// Whoever started it, SIGTERM stops the server and SIGHUP is a refresh.
 class Service : public zelt_gscl_V1::KPLDriver {
  public:
   /// `reread`: the options anew, as command line and configuration file have them now. It may throw OptionError.
@@ -22,8 +24,10 @@ class Service : public zelt_gscl_V1::KPLDriver {
   /// Makes the process a daemon; from a shell it is another one afterwards. Throws std::runtime_error with the
   /// failing step.
   void detach();
-  /// Serves requests until the server stops. `options` are those in force. Both outlive the requests.
-  void attach(Server& server, Options& options);
+  /// Serves requests until the server stops. `options` are those in force. All outlive the requests.
+  void attach(Server& server, Options& options, const platform::ServiceManager& manager);
+  /// The service manager may take the daemon for started.
+  void tell_ready() const;
 
  private:
   void traceBegin(int dae_long) override;
@@ -31,10 +35,14 @@ class Service : public zelt_gscl_V1::KPLDriver {
   void refresh() override;
   void longStatus() override;
   void on_request();
+  void on_hangup();
+  /// What has to wait for the next start, a line each. Throws what is wrong; nothing has changed then.
+  std::vector<std::string> read_again();
 
   const std::function<Options()> reread_;
   Server* server_ = nullptr;
   Options* options_ = nullptr;
+  const platform::ServiceManager* manager_ = nullptr;
   bool tracing_ = false;
 };
 

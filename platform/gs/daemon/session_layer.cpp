@@ -8,7 +8,7 @@
 namespace gs::daemon {
 
 SessionLayer::SessionLayer(const Settings& settings, Environment environment)
-    : settings_(settings), env_(std::move(environment)) {
+    : settings_(settings), env_(std::move(environment)), client_log_(*env_.log) {
   for (std::size_t rc = 0; rc < answers_.size(); ++rc) {
     answers_[rc] = wire::encode(wire::Answer{static_cast<wyx_rc_t>(rc)});
   }
@@ -59,6 +59,7 @@ void SessionLayer::lost(ConnectionId id, const std::string& why) {
 }
 
 void SessionLayer::say_farewell() {
+  client_log_.tell_left_out();
   const wire::Encoded farewell = wire::encode(wire::Farewell{});
   std::vector<ConnectionId> channels;
   for (const auto& [number, session] : sessions_) {
@@ -139,7 +140,7 @@ void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire
   connection.channel = Channel::kEvent;
   connection.session = attach.session_number;
   session->event = id;
-  env_.log->info("{}: connected", describe(connection));
+  log_about(connection.peer.uid, spdlog::level::info, describe(connection) + ": connected");
   answer(id, WYX_OK);
 }
 
@@ -165,8 +166,9 @@ void SessionLayer::send_ping(std::uint64_t session, std::uint64_t ping) {
 
 void SessionLayer::responding_changed(std::uint64_t session, bool responding) {
   const Session& found = *find_session(session);
-  env_.log->log(responding ? spdlog::level::info : spdlog::level::warn, "{}: {}", describe(*find(found.request)),
-                responding ? "answers pings again" : "does not answer pings");
+  const Connection& request = *find(found.request);
+  log_about(request.peer.uid, responding ? spdlog::level::info : spdlog::level::warn,
+            describe(request) + (responding ? ": answers pings again" : ": does not answer pings"));
   env_.ordering.submit(ResponsivenessEvent{id_of(session), responding});
 }
 
@@ -261,16 +263,17 @@ void SessionLayer::end(ConnectionId id, End how, const std::string& why) {
   if (connection == nullptr) return;
   if (connection->session != 0) return end_session(connection->session, how, why);
   // A connection that asks for the node and goes is nothing to speak of.
-  env_.log->log(how == End::kFault ? spdlog::level::warn : spdlog::level::debug, "{}: closed: {}",
-                describe(*connection), why);
+  log_about(connection->peer.uid, how == End::kFault ? spdlog::level::warn : spdlog::level::debug,
+            describe(*connection) + ": closed: " + why);
   drop(id);
 }
 
 void SessionLayer::end_session(std::uint64_t number, End how, const std::string& why) {
   const auto found = sessions_.find(number);
   if (found == sessions_.end()) return;
-  env_.log->log(how == End::kFault ? spdlog::level::warn : spdlog::level::info, "{}: closed: {}",
-                describe(*find(found->second.request)), why);
+  const Connection& closed = *find(found->second.request);
+  log_about(closed.peer.uid, how == End::kFault ? spdlog::level::warn : spdlog::level::info,
+            describe(closed) + ": closed: " + why);
   const ConnectionId request = found->second.request;
   const ConnectionId event = found->second.event;
   timers_.cancel(found->second.attach_limit);
@@ -285,6 +288,13 @@ void SessionLayer::drop(ConnectionId id) {
   timers_.cancel(found->second.handshake);
   connections_.erase(found);
   env_.transport.close(id);
+}
+
+void SessionLayer::log_about(std::optional<std::uint32_t> user, spdlog::level::level_enum level,
+                             const std::string& line) {
+  const Time now = env_.now();
+  if (!client_log_.write(user, level, line, now)) return;
+  timers_.arm(now + platform::ClientLog::kTellAfter, [this] { client_log_.tell_left_out(); });
 }
 
 std::string SessionLayer::describe(const Connection& connection) const {

@@ -24,6 +24,7 @@
 #include <string>
 #include <unordered_map>
 
+#include "common/client_log.h"
 #include "daemon/ordering.h"
 #include "daemon/out_queue.h"
 #include "daemon/pinger.h"
@@ -86,6 +87,9 @@ class SessionLayer : private PingSink {
   /// In the order of their numbers.
   std::vector<SessionStatus> status() const;
   std::vector<Engine::GroupStatus> groups() const { return engine_.status(); }
+
+  /// Into the log, unless there have been too many such lines of late. `user`: whose doing it is, if anybody's.
+  void log_about(std::optional<std::uint32_t> user, spdlog::level::level_enum level, const std::string& line);
 
   /// Counts for what is queued from now on.
   void set_queue_bound(std::size_t bytes) { settings_.queue_bound = bytes; }
@@ -151,6 +155,7 @@ class SessionLayer : private PingSink {
 
   Settings settings_;
   const Environment env_;
+  platform::ClientLog client_log_;
   Engine engine_;
   Timers timers_;
   std::unordered_map<ConnectionId, Connection> connections_;

@@ -26,10 +26,36 @@ ControlServer::ControlServer(const Loop& loop, spdlog::logger& log, const std::s
       access_(access),
       handler_(std::move(handler)),
       listener_("kplmstr", path, access.group),
-      acceptable_(loop, listener_.fd(), EV_READ | EV_PERSIST, [this] { on_acceptable(); }),
-      accept_again_(loop, [this] { acceptable_.arm(); }) {}
+      accept_again_(loop, [this] { acceptable_->arm(); }),
+      look_again_(loop, [this] { look_at_path(); }),
+      client_log_(log),
+      tell_left_out_(loop, [this] { client_log_.tell_left_out(); }) {
+  start_accepting();
+  look_again_.arm(platform::Listener::kLookAgain);
+}
 
-ControlServer::~ControlServer() = default;
+ControlServer::~ControlServer() { client_log_.tell_left_out(); }
+
+void ControlServer::start_accepting() {
+  acceptable_.emplace(loop_, listener_.fd(), EV_READ | EV_PERSIST, [this] { on_acceptable(); });
+}
+
+/// Somebody may have removed or replaced the socket; who is connected does not notice, new requesters would.
+void ControlServer::look_at_path() {
+  look_again_.arm(platform::Listener::kLookAgain);
+  const auto leave_old = [this] {
+    on_acceptable();  // those that have found it are still served
+    acceptable_.reset();
+  };
+  if (listener_.keep_in_place(log_, leave_old)) start_accepting();
+}
+
+void ControlServer::warn_about(std::optional<std::uint32_t> user, const std::string& line) {
+  using platform::ClientLog;
+  const auto now =
+      std::chrono::duration_cast<ClientLog::Time>(std::chrono::steady_clock::now().time_since_epoch());
+  if (client_log_.write(user, spdlog::level::warn, line, now)) tell_left_out_.arm(ClientLog::kTellAfter);
+}
 
 void ControlServer::on_acceptable() {
   for (int i = 0; i < kAcceptsAtOnce; ++i) {
@@ -41,8 +67,8 @@ void ControlServer::on_acceptable() {
     if (errno == ECONNABORTED || errno == EINTR) continue;
     if (errno == EAGAIN) return;
     // The connection that could not be accepted stays in the queue and would wake the loop again and again.
-    log_.warn("cannot accept more connections for now: {}", strerror(errno));
-    acceptable_.disarm();
+    warn_about({}, std::string("cannot accept more connections for now: ") + strerror(errno));
+    acceptable_->disarm();
     return accept_again_.arm(kAcceptPause);
   }
 }
@@ -50,13 +76,13 @@ void ControlServer::on_acceptable() {
 void ControlServer::add_connection(Descriptor socket) {
   const std::optional<platform::Peer> peer = platform::peer_of(socket.get());
   if (!peer) return;  // gone already
-  if (!access_.allows(*peer)) {
-    log_.warn("connection (pid {}, uid {}): closed: not permitted", peer->pid, peer->uid);
-    return;
-  }
+  const auto refuse = [&](const char* why) {
+    const std::string whose = "pid " + std::to_string(peer->pid) + ", uid " + std::to_string(peer->uid);
+    warn_about(peer->uid, "connection (" + whose + "): closed: " + why);
+  };
+  if (!access_.allows(*peer)) return refuse("not permitted");
   if (connections_.size() >= kMaxConnections - (peer->uid == 0 ? 0 : kKeptForRoot)) {
-    log_.warn("connection (pid {}, uid {}): closed: too many connections", peer->pid, peer->uid);
-    return;
+    return refuse("too many connections");
   }
   setsockopt(socket.get(), SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
   const ConnectionId id = ++last_connection_;
@@ -98,7 +124,7 @@ void ControlServer::answer(ConnectionId id, const control::Answer& answer) {
   connection.out_bytes += connection.out.back().size();
   if (std::holds_alternative<control::End>(answer)) connection.readable->arm();
   if (connection.out_bytes > kMaxWaiting) {
-    log_.warn("a requester does not read its answer: closed");
+    warn_about({}, "a requester does not read its answer: closed");
     connections_.erase(found);
     return;
   }

@@ -11,6 +11,7 @@
 #include <string>
 
 #include "common/access.h"
+#include "common/client_log.h"
 #include "common/descriptor.h"
 #include "common/listener.h"
 #include "control/control.h"
@@ -39,6 +40,10 @@ class ControlServer {
   };
 
   void on_acceptable();
+  void start_accepting();
+  void look_at_path();
+  /// Into the log, unless there have been too many such lines of late. `user`: whose doing it is, if anybody's.
+  void warn_about(std::optional<std::uint32_t> user, const std::string& line);
   void add_connection(platform::Descriptor socket);
   void on_readable(ConnectionId id);
   void on_packet(ConnectionId id, const std::string& packet);
@@ -52,8 +57,11 @@ class ControlServer {
   platform::Listener listener_;
   std::map<ConnectionId, Connection> connections_;
   ConnectionId last_connection_ = 0;
-  Event acceptable_;
+  std::optional<Event> acceptable_;
   Event accept_again_;
+  Event look_again_;
+  platform::ClientLog client_log_;
+  Event tell_left_out_;
 };
 
 }  // namespace kpl::master

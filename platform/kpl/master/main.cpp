@@ -10,7 +10,9 @@
 #include <optional>
 #include <system_error>
 
+#include "common/held_signals.h"
 #include "common/log.h"
+#include "common/service_manager.h"
 #include "master/definition.h"
 #include "master/master.h"
 #include "master/options.h"
@@ -68,7 +70,6 @@ void be_the_parent() {
 }
 
 void serve(const Options& options) {
-  signal(SIGPIPE, SIG_IGN);
   set_standard_descriptors("");
   static std::optional<kpl::master::Detached>
       detached;  // until the end: the caller waits for the reason to be told
@@ -77,17 +78,20 @@ void serve(const Options& options) {
     close_range(STDERR_FILENO + 1, ~0U, 0);
     detached.emplace();
   }
+  std::optional<platform::HeldSignals> held(std::in_place);
+  const platform::ServiceManager manager;
   be_the_parent();
   umask(S_IWGRP | S_IWOTH);
   if (chdir("/") != 0) throw std::system_error(errno, std::generic_category(), "chdir");
   if (!options.daemon) set_standard_descriptors(options.log_file);
   const auto log = platform::make_log("kplmstr", options.log_level);
-  kpl::master::Master master(options, log);
+  kpl::master::Master master(options, log, manager);
   if (detached) {
     set_standard_descriptors(options.log_file);
     leave_standard_descriptors(!options.log_file.empty());
   }
   log->info("kplmstr " KPL_PROGRAM_VERSION " serves {}", options.socket_path);
+  held.reset();
   master.start();
   if (detached) detached->ready();
   master.run();
@@ -97,6 +101,7 @@ void serve(const Options& options) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  signal(SIGPIPE, SIG_IGN);
   try {
     const auto options = kpl::master::parse_options(argc, argv);
     if (!options) return 0;

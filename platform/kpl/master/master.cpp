@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <csignal>
 
+#include "common/log.h"
 #include "kpl.h"
 #include "master/launch.h"
 
@@ -56,17 +57,24 @@ control::Line short_line(const std::string& name, const std::string& group, cons
 
 }  // namespace
 
-Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log)
+Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log,
+               const platform::ServiceManager& manager)
     : log_(std::move(log)),
+      manager_(manager),
+      log_file_(options.log_file),
       folder_(options.definitions),
       status_socket_(options.status_socket_path()),
       control_(loop_, *log_, prepared(options.socket_path), access_rule(options),
                [this](const control::Request& request, const Reply& reply) { on_request(request, reply); }),
       status_(loop_, status_socket_, [this](const std::string& name, int pid) { return short_status(name, pid); }),
       children_(loop_, SIGCHLD, EV_SIGNAL | EV_PERSIST, [this] { on_children(); }),
-      hangup_(loop_, SIGHUP, EV_SIGNAL | EV_PERSIST, [this] { read_definitions(); }),
+      hangup_(loop_, SIGHUP, EV_SIGNAL | EV_PERSIST, [this] { on_hangup(); }),
       terminated_(loop_, SIGTERM, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }),
-      interrupted_(loop_, SIGINT, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }) {}
+      interrupted_(loop_, SIGINT, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }),
+      alive_(loop_, [this] {
+        manager_.alive();
+        alive_.arm(*manager_.alive_every());
+      }) {}
 
 void Master::start() {
   read_definitions();
@@ -83,6 +91,23 @@ void Master::start() {
     }
     subsystem.start([](const control::Answer&) {});  // logged there
   }
+  tell_ready();
+  if (manager_.alive_every()) alive_.arm(*manager_.alive_every());
+}
+
+void Master::tell_ready() const {
+  manager_.ready(std::to_string(subsystems_.size()) + " subsystems defined in " + folder_);
+}
+
+void Master::on_hangup() {
+  manager_.reloading();
+  try {
+    if (!log_file_.empty()) platform::log_to_file(log_file_);
+  } catch (const std::exception& error) {
+    log_->error("SIGHUP: {}; the log stays where it is", error.what());
+  }
+  read_definitions();
+  tell_ready();
 }
 
 bool Master::believes(const Claim& claim) const {
@@ -161,6 +186,7 @@ void Master::on_children() {
 void Master::on_terminate() {
   if (stopping_) return;
   stopping_ = true;
+  manager_.stopping();
   log_->info("stopping");
   for (auto& [name, subsystem] : subsystems_) {
     if (subsystem.state() == Subsystem::State::kInactive) continue;

@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "common/service_manager.h"
 #include "master/control_server.h"
 #include "master/definition.h"
 #include "master/left_behind.h"
@@ -22,14 +23,17 @@ namespace kpl::master {
 class Master {
  public:
   /// Listens. Throws platform::SettingError and platform::ListenError.
-  Master(const Options& options, std::shared_ptr<spdlog::logger> log);
+  Master(const Options& options, std::shared_ptr<spdlog::logger> log, const platform::ServiceManager& manager);
 
   /// Reads the definitions and starts the subsystems that are to start with the master.
   void start();
-  /// Serves until SIGTERM or SIGINT, then ends all subsystems. SIGHUP reads the definitions again.
+  /// Serves until SIGTERM or SIGINT, then ends all subsystems. SIGHUP opens the log file anew and reads the
+  /// definitions again.
   void run() { loop_.run(); }
 
  private:
+  void on_hangup();
+  void tell_ready() const;
   void read_definitions();
   void forget_undefined(const Folder& folder);
   /// Those without a process.
@@ -47,6 +51,8 @@ class Master {
   std::optional<std::vector<control::Line>> short_status(const std::string& name, int pid) const;
 
   std::shared_ptr<spdlog::logger> log_;
+  const platform::ServiceManager& manager_;
+  const std::string log_file_;
   const std::string folder_;
   const std::string status_socket_;
   Loop loop_;
@@ -60,6 +66,7 @@ class Master {
   Event hangup_;
   Event terminated_;
   Event interrupted_;
+  Event alive_;
 };
 
 }  // namespace kpl::master

@@ -1,11 +1,9 @@
 #include "master/status_server.h"
 
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/un.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstring>
 
 #include "common/listener.h"
@@ -24,10 +22,6 @@ struct Question {
   std::int32_t pid;
 };
 static_assert(sizeof(Question) == 160);
-
-[[noreturn]] void fail(const std::string& path) {
-  throw platform::ListenError("cannot make the socket " + path + ": " + strerror(errno));
-}
 
 std::string status_packet(const kplhdr& header, const std::vector<control::Line>& lines) {
   std::string packet(reinterpret_cast<const char*>(&header), sizeof header);
@@ -51,25 +45,29 @@ std::string end_packet(const kplhdr& header, short code) {
 }  // namespace
 
 StatusServer::StatusServer(const Loop& loop, const std::string& path, Lookup lookup)
-    : path_(path), lookup_(std::move(lookup)) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  if (path.size() >= sizeof address.sun_path)
-    throw platform::ListenError("the socket path " + path + " is too long");
-  memcpy(address.sun_path, path.c_str(), path.size() + 1);
-  struct stat found {};
-  if (lstat(path.c_str(), &found) == 0) {
-    if (!S_ISSOCK(found.st_mode)) throw platform::ListenError(path + " exists and is not a socket");
-    if (unlink(path.c_str()) != 0) fail(path);
-  }
-  platform::Descriptor bound(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-  if (!bound || bind(bound.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) fail(path);
-  socket_ = std::move(bound);
-  if (chmod(path.c_str(), kForAll) != 0) fail(path);
-  readable_.emplace(loop, socket_.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
+    : loop_(loop), path_(path), lookup_(std::move(lookup)), look_again_(loop, [this] { look_at_path(); }) {
+  listen_at_path();
+  look_again_.arm(platform::Listener::kLookAgain);
 }
 
-StatusServer::~StatusServer() { unlink(path_.c_str()); }
+void StatusServer::listen_at_path() {
+  auto bound = std::make_unique<platform::NamedSocket>(platform::socket_place(path_), SOCK_DGRAM,
+                                                       platform::NamedSocket::Access{kForAll});
+  readable_.reset();
+  socket_ = std::move(bound);
+  readable_.emplace(loop_, socket_->fd(), EV_READ | EV_PERSIST, [this] { on_readable(); });
+}
+
+/// What stands in the way is the control socket's to tell, which lies beside it.
+void StatusServer::look_at_path() {
+  look_again_.arm(platform::Listener::kLookAgain);
+  if (socket_->in_place()) return;
+  try {
+    listen_at_path();
+  } catch (const platform::ListenError&) {
+    return;
+  }
+}
 
 /// The answer goes to where the question came from, not where it says: nobody can have root write elsewhere.
 void StatusServer::on_readable() {
@@ -79,11 +77,11 @@ void StatusServer::on_readable() {
     socklen_t from_length = sizeof from;
     auto* address = reinterpret_cast<sockaddr*>(&from);
     const ssize_t got =
-        recvfrom(socket_.get(), &question, sizeof question, MSG_DONTWAIT | MSG_TRUNC, address, &from_length);
+        recvfrom(socket_->fd(), &question, sizeof question, MSG_DONTWAIT | MSG_TRUNC, address, &from_length);
     if (got < 0) return;
     if (got != sizeof question || from_length <= sizeof(sa_family_t)) continue;
     const auto answer = [&](const std::string& packet) {
-      sendto(socket_.get(), packet.data(), packet.size(), MSG_DONTWAIT | MSG_NOSIGNAL, address, from_length);
+      sendto(socket_->fd(), packet.data(), packet.size(), MSG_DONTWAIT | MSG_NOSIGNAL, address, from_length);
     };
     kplhdr header = question.header;
     header.cont = KPL_CONT_STATUS;
