@@ -4,6 +4,7 @@
 #include "common/mutex.h"
 
 #define GS_GUARDED_BY(x) ZN_GUARDED_BY(x)
+#define GS_REQUIRES(x) ZN_REQUIRES(x)
 
 namespace gs::client {
 
