@@ -2,7 +2,6 @@
 #pragma once
 
 #include <pthread.h>
-#include <spdlog/formatter.h>
 
 #include <cstdint>
 #include <memory>
