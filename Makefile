@@ -2,8 +2,11 @@
 
 PREFIX ?= /usr/local
 release := build/release
+SECONDS ?= 3600
+SEED ?= 1
+MEMBERS ?= 10
 
-.PHONY: all demo test bench install package help
+.PHONY: all demo test storm bench install package help
 
 all: ## build everything, optimised
 	@scripts/build.sh release
@@ -14,6 +17,10 @@ demo: ## processes vote, talk and die, one timeline of what each saw; then daemo
 
 test: ## the whole suite: release build, address+undefined sanitizers, thread sanitizer
 	@scripts/test.sh release asan tsan
+
+storm: ## processes killed and stopped at random, what they saw compared; SECONDS=3600 SEED=1 MEMBERS=10
+	@scripts/build.sh release storm
+	@$(release)/bin/tests/storm --seconds $(SECONDS) --seed $(SEED) --members $(MEMBERS)
 
 bench: ## figures against their bounds; tables here, JSON in build/release/bench
 	@scripts/build.sh release

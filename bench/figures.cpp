@@ -18,7 +18,8 @@ std::string processor() {
   return "unknown processor";
 }
 
-const char* verdict(const Figure& figure) {
+std::string verdict(const Figure& figure) {
+  if (!figure.failed.empty()) return "FAILED: " + figure.failed;
   if (!figure.at_most) return "";
   return figure.measured <= *figure.at_most ? "met" : "MISSED";
 }
@@ -39,7 +40,7 @@ void Figures::print() const {
   std::printf("\n%-66s %12s  %-18s %9s\n", "figure", "measured", "", "at most");
   for (const Figure& f : figures_) {
     std::printf("%-66s %12.2f  %-18s ", f.name.c_str(), f.measured, f.unit.c_str());
-    if (f.at_most) std::printf("%9.2f  %s", *f.at_most, verdict(f));
+    if (f.at_most) std::printf("%9.2f  %s", *f.at_most, verdict(f).c_str());
     std::printf("\n");
   }
 }

@@ -16,12 +16,14 @@ struct Figure {
   double measured = 0;
   std::string unit;
   std::optional<double> at_most;  // none: told, not judged
+  std::string failed = "";        // why the figure counts as missed whatever was measured; empty: it does not
 };
 
 class Figures {
  public:
-  void add(std::string name, double measured, std::string unit, std::optional<double> at_most = std::nullopt) {
-    figures_.push_back({std::move(name), measured, std::move(unit), at_most});
+  void add(std::string name, double measured, std::string unit, std::optional<double> at_most = std::nullopt,
+           std::string failed = "") {
+    figures_.push_back({std::move(name), measured, std::move(unit), at_most, std::move(failed)});
   }
   /// "figure, measured, bound, met or missed".
   void print() const;

@@ -4,8 +4,11 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
+#include <vector>
 
 #include "examples/commands.h"
 
@@ -83,6 +86,72 @@ int subscriber(GSController& controller, Slot& slot, const char* group) {
   BenchSubscriber subscriber(group, slot);
   if (subscriber.subscribeGroup() != WYX_OK) return 1;
   return serve(controller, [](const std::string&) {});
+}
+
+// A member that counts what it is told and looks at nothing else.
+class CountingMember : public zelt_gscl_V1::GSProvider {
+ public:
+  CountingMember(const std::string& group, int instance, Slot& slot)
+      : GSProvider(group.c_str(), static_cast<short>(instance), nullptr), slot_(slot) {}
+  void approvedCb(const wyx_approved_notification_t* n) override {
+    if (n->gs_protocol_type == WYX_FAILURE_LEAVE) slot_.failures++;
+    slot_.count.fetch_add(1, std::memory_order_release);
+  }
+  wyx_rc_t propose_big_state() {
+    std::string state(kBigState, 'b');
+    return changeStateValue(wyx_state_value_t{kBigState, state.data()}, WYX_1_PHASE, 0);
+  }
+
+ private:
+  Slot& slot_;
+};
+
+// Joins and proposes for one of its members when told; its slot says whether it still has its session.
+int counting(GSController& controller, Slot& slot, std::vector<std::unique_ptr<CountingMember>> members) {
+  slot.ready = 1;
+  const int result = serve(controller, [&](const std::string& line) {
+    char what[8];
+    std::size_t which = 0;
+    if (std::sscanf(line.c_str(), "%7s %zu", what, &which) != 2 || which >= members.size()) return;
+    const bool join = std::strcmp(what, "join") == 0;
+    const wyx_rc_t rc = join ? members[which]->joinGroup() : members[which]->propose_big_state();
+    if (rc != WYX_OK) slot.errors++;
+  });
+  slot.ready = 0;
+  return result;
+}
+
+int everywhere(GSController& controller, Slot& slot, int number, int groups) {
+  std::vector<std::unique_ptr<CountingMember>> members;
+  for (int i = 0; i < groups; i++) {
+    members.push_back(std::make_unique<CountingMember>("group" + std::to_string(i), number, slot));
+  }
+  return counting(controller, slot, std::move(members));
+}
+
+int crowd(GSController& controller, Slot& slot, int number, int providers) {
+  std::vector<std::unique_ptr<CountingMember>> members;
+  for (int i = 0; i < providers; i++) {
+    members.push_back(std::make_unique<CountingMember>("crowd", number * providers + i, slot));
+  }
+  return counting(controller, slot, std::move(members));
+}
+
+// Reads nothing: 4 MiB of notifications wait for it, and when it is told so more, until it is closed.
+int deaf(Slot& slot, int number) {
+  constexpr int kFourMiB = 4 * 1024 * 1024 / kBigState;
+  CountingMember member("deaf" + std::to_string(number), 1, slot);
+  if (member.joinGroup() != WYX_OK) return 1;
+  for (int i = 0; i < kFourMiB; i++) {
+    if (member.propose_big_state() != WYX_OK) return 1;
+  }
+  slot.ready = 1;
+  Commands commands;
+  commands.read_some();
+  for (int i = 0; i < 8 * kFourMiB && member.propose_big_state() == WYX_OK; i++) {
+  }
+  slot.ready = 0;
+  return 0;
 }
 
 }  // namespace
@@ -176,6 +245,9 @@ int run_role(const std::string& role, int argc, char** argv) {
   if (controller.initialize() != WYX_OK) return 1;
   if (role == "member") return member(controller, board[number], number, argv[2]);
   if (role == "subscriber") return subscriber(controller, board[number], argv[2]);
+  if (role == "everywhere") return everywhere(controller, board[number], number, std::atoi(argv[2]));
+  if (role == "crowd") return crowd(controller, board[number], number, std::atoi(argv[2]));
+  if (role == "deaf") return deaf(board[number], number);
   board[number].ready = 1;
   return serve(controller, [](const std::string&) {});
 }

@@ -1,4 +1,5 @@
-// The processes that processes.cpp measures against each other. All are this program, started with --role=...
+// The processes that processes.cpp and disturbances.cpp measure. All are the program itself, started with
+// --role=...
 #pragma once
 
 #include <cstdint>
@@ -10,7 +11,8 @@
 
 namespace zn {
 
-constexpr int kPayload = 64;  // bytes of every state value and message
+constexpr int kPayload = 64;          // bytes of every state value and message that is not big
+constexpr int kBigState = 64 * 1024;  // the most there can be
 
 /// What is sent: who sent it and which of its messages it is.
 struct Payload {
@@ -64,6 +66,9 @@ class BenchMember : public zelt_gscl_V1::GSProvider {
 ///   member BOARD SLOT GROUP    a group member; "send N" on its input makes it send N messages
 ///   subscriber BOARD SLOT GROUP
 ///   idle BOARD SLOT            a session and nothing else
+///   everywhere BOARD SLOT N    providers in N groups; "join I", "state I" on its input makes one join, propose 64
+///   KiB crowd BOARD SLOT N         the same with N providers in one group deaf BOARD SLOT            reads
+///   nothing while 4 MiB come for it; on a line of input more, until it is closed
 int run_role(const std::string& role, int argc, char** argv);
 
 /// A pathname socket of the kind that the daemon uses.

@@ -1,0 +1,242 @@
+// What others feel when something happens to those beside them: a death in a thousand groups, the end of a session
+// with a thousand providers, sessions that do not read. Each figure over a daemon of its own.
+//
+//   disturbances [--quick] [--benchmark_out=FILE]
+#include <signal.h>
+#include <time.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <memory>
+#include <vector>
+
+#include "bench/figures.h"
+#include "bench/process_roles.h"
+#include "examples/processes.h"
+
+namespace {
+
+using zelt_gscl_V1::GSController;
+using zn::Clock;
+using zn::Failure;
+using zn::Process;
+
+constexpr auto kLimit = std::chrono::seconds(300);  // a bound on a hang, not on what is measured
+constexpr int64_t kEvery = 500'000;                 // nanoseconds from one request to the next
+constexpr int kAtOnce = 20;                         // joins or changes before everybody has to catch up
+
+struct Settings {
+  int groups = 1000;
+  int readers = 5;
+  int crowd = 1000;  // providers of each of two sessions
+  int deaf = 100;    // sessions that do not read
+  int quiet = 4000;  // requests with nothing going on
+
+  static Settings quick() { return {20, 2, 10, 3, 100}; }
+};
+
+/// A daemon, the processes around it, and a member in a group of its own whose requests are timed.
+class Scene {
+ public:
+  explicit Scene(const std::vector<std::string>& options = {});
+
+  void add(const std::string& role, int count, int argument);
+  Process& at(int i) { return *children_[static_cast<size_t>(i)]; }
+  zn::Slot& slot(int i) { return board_[i]; }
+  pid_t daemon() const { return daemon_.pid(); }
+
+  template <class Condition>
+  void await(const char* what, Condition condition) const;
+  /// Tells process `i` to "join" or "state", member by member, `told` processes being told of each by as many
+  /// notifications as the function says.
+  void tell(int i, const char* what, int members, const std::vector<int>& told);
+  /// Milliseconds from when each request was due to its answer, until `done`: one that hangs makes the next ones
+  /// late, and so counts as often as it would have hurt.
+  template <class Done>
+  std::vector<double> requests(Done done);
+  /// How long the last of these went on.
+  double lasted_ms() const { return lasted_ms_; }
+  /// How many of the processes have lost their sessions.
+  int closed(int first, int count);
+
+ private:
+  zn::PrivateDaemon daemon_;
+  zn::Board board_{daemon_.folder() + "/board"};
+  std::vector<std::unique_ptr<Process>> children_;
+  std::unique_ptr<GSController> controller_;
+  std::unique_ptr<zelt_gscl_V1::GSProvider> unrelated_;
+  double lasted_ms_ = 0;
+};
+
+Scene::Scene(const std::vector<std::string>& options) : daemon_(options) {
+  if (!board_.ok()) throw Failure{"no shared board"};
+  ::setenv("GSD_ENDPOINT", daemon_.environment()[0].second.c_str(), 1);
+  controller_ = std::make_unique<GSController>();
+  if (controller_->initialize() != WYX_OK) throw Failure{"no session"};
+  unrelated_ = std::make_unique<zelt_gscl_V1::GSProvider>("unrelated", 1, nullptr);
+  if (unrelated_->joinGroup() != WYX_OK) throw Failure{"no join"};
+  controller_->dispatch(WYX_NON_BLOCKING);
+}
+
+template <class Condition>
+void Scene::await(const char* what, Condition condition) const {
+  const auto deadline = Clock::now() + kLimit;
+  while (!condition()) {
+    if (Clock::now() > deadline) throw Failure{std::string("waited in vain: ") + what};
+    ::usleep(200);
+  }
+}
+
+void Scene::add(const std::string& role, int count, int argument) {
+  const int first = static_cast<int>(children_.size());
+  for (int i = first; i < first + count; i++) {
+    const std::vector<std::string> command{zn::program("disturbances"), "--role=" + role,
+                                           daemon_.folder() + "/board", std::to_string(i),
+                                           std::to_string(argument)};
+    children_.push_back(std::make_unique<Process>(command, daemon_.environment()));
+  }
+  for (int i = first; i < first + count; i++) await("a process is ready", [&] { return slot(i).ready != 0; });
+}
+
+void Scene::tell(int i, const char* what, int members, const std::vector<int>& told) {
+  std::vector<uint64_t> targets;
+  for (size_t who = 0; who < told.size(); who++) targets.push_back(slot(static_cast<int>(who)).count);
+  for (int member = 0; member < members; member++) {
+    at(i).write_line(std::string(what) + " " + std::to_string(member));
+    const bool joins = std::string(what) == "join";
+    for (size_t who = 0; who < told.size(); who++) {
+      // In a crowd, each that has joined already is told of the next one, and that one too.
+      const bool grows = joins && told[who] == 0;
+      targets[who] += static_cast<uint64_t>(grows ? member + 1 : told[who]);
+    }
+    if (member % kAtOnce != kAtOnce - 1 && member != members - 1) continue;
+    for (size_t who = 0; who < told.size(); who++) {
+      await("everybody is told", [&] { return slot(static_cast<int>(who)).count >= targets[who]; });
+    }
+  }
+  if (slot(i).errors != 0) throw Failure{std::string("a request was refused: ") + what};
+}
+
+template <class Done>
+std::vector<double> Scene::requests(Done done) {
+  std::vector<double> samples;
+  const auto deadline = Clock::now() + kLimit;
+  char text[] = "unrelated";
+  const int64_t start = zn::now_ns();
+  for (int64_t due = start + kEvery; !done(samples.size()) || due < zn::now_ns(); due += kEvery) {
+    if (Clock::now() > deadline) throw Failure{"waited in vain: the disturbance is over"};
+    const timespec when{due / 1'000'000'000, due % 1'000'000'000};
+    ::clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &when, nullptr);
+    const wyx_rc_t rc = unrelated_->send_message(wyx_provider_message_t{sizeof text, text}, WYX_1_PHASE, 0);
+    if (rc != WYX_OK) throw Failure{"an unrelated request was refused"};
+    samples.push_back(static_cast<double>(zn::now_ns() - due) / 1e6);
+    controller_->dispatch(WYX_NON_BLOCKING);
+  }
+  lasted_ms_ = static_cast<double>(zn::now_ns() - start) / 1e6;
+  return samples;
+}
+
+int Scene::closed(int first, int count) {
+  int closed = 0;
+  for (int i = first; i < first + count; i++) closed += slot(i).ready == 0;
+  return closed;
+}
+
+std::string failed(int closed, int readers) {
+  if (closed == 0) return "";
+  return std::to_string(closed) + " of " + std::to_string(readers) + " healthy readers were closed";
+}
+
+// Every reader and the one that dies are members of all groups.
+void death_in_many_groups(const Settings& s, zn::Figures* figures) {
+  Scene scene;
+  scene.add("everywhere", s.readers + 1, s.groups);
+  std::vector<int> told;
+  for (int i = 0; i <= s.readers; i++) {
+    told.push_back(1);
+    scene.tell(i, "join", s.groups, told);
+  }
+  scene.tell(0, "state", s.groups, told);
+
+  std::vector<double> quiet = scene.requests([&](size_t count) { return count >= static_cast<size_t>(s.quiet); });
+  scene.at(s.readers).signal(SIGKILL);
+  std::vector<double> meanwhile = scene.requests([&](size_t) {
+    for (int i = 0; i < s.readers; i++) {
+      if (scene.slot(i).ready != 0 && scene.slot(i).failures < static_cast<uint64_t>(s.groups)) return false;
+    }
+    return true;
+  });
+  const int closed = scene.closed(0, s.readers);
+  figures->add("one death in " + std::to_string(s.groups) + " groups of 64 KiB, " + std::to_string(s.readers) +
+                   " readers: request beside it, p99",
+               zn::percentile(meanwhile, 0.99), "ms", 5, failed(closed, s.readers));
+  figures->add("  longest", *std::max_element(meanwhile.begin(), meanwhile.end()), "ms");
+  figures->add("  with nothing going on, p99", zn::percentile(quiet, 0.99), "ms");
+  figures->add("  time that the disturbance lasted", scene.lasted_ms(), "ms");
+}
+
+void end_of_a_crowd(const Settings& s, zn::Figures* figures) {
+  Scene scene;
+  scene.add("crowd", 2, s.crowd);
+  scene.tell(0, "join", s.crowd, {0});
+  scene.tell(1, "join", s.crowd, {s.crowd, 0});
+
+  std::vector<double> quiet = scene.requests([&](size_t count) { return count >= static_cast<size_t>(s.quiet); });
+  const auto all = static_cast<uint64_t>(s.crowd) * static_cast<uint64_t>(s.crowd);
+  scene.at(1).signal(SIGKILL);
+  const std::vector<double> meanwhile =
+      scene.requests([&](size_t) { return scene.slot(0).ready == 0 || scene.slot(0).failures >= all; });
+  const std::string name = std::to_string(s.crowd) + " providers";
+  figures->add("two sessions with " + name + " in one group, one ends: longest wait",
+               *std::max_element(meanwhile.begin(), meanwhile.end()), "ms", 50, failed(scene.closed(0, 1), 1));
+  figures->add("  with nothing going on, longest", *std::max_element(quiet.begin(), quiet.end()), "ms");
+  figures->add("  time that the disturbance lasted", scene.lasted_ms(), "ms");
+}
+
+double resident_mib(pid_t process) {
+  std::ifstream status("/proc/" + std::to_string(process) + "/status");
+  for (std::string line; std::getline(status, line);) {
+    if (line.rfind("VmRSS:", 0) == 0) return std::atof(line.c_str() + 6) / 1024;
+  }
+  throw Failure{"the daemon is gone"};
+}
+
+void memory_after_the_deaf(const Settings& s, zn::Figures* figures) {
+  Scene scene({"--queue-bound", std::to_string(4 * 1024 * 1024)});
+  const double before = resident_mib(scene.daemon());
+  scene.add("deaf", s.deaf, 0);
+  const double meanwhile = resident_mib(scene.daemon());
+  for (int i = 0; i < s.deaf; i++) scene.at(i).write_line("on");
+  scene.await("all are closed", [&] { return scene.closed(0, s.deaf) == s.deaf; });
+  for (int i = 0; i < s.deaf; i++) scene.at(i).wait_end(Clock::now() + kLimit);
+  scene.requests([](size_t count) { return count >= 100; });  // the daemon has seen all of that
+  const double after = resident_mib(scene.daemon());
+  figures->add("memory of the daemon after " + std::to_string(s.deaf) + " sessions that did not read 4 MiB",
+               after - before, "MiB over before");
+  figures->add("  while they were there", meanwhile - before, "MiB over before");
+  figures->add("  before", before, "MiB");
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  const std::string role = zn::option(argc, argv, "role");
+  if (!role.empty()) return zn::run_role(role, argc - 2, argv + 2);
+
+  zn::catch_interrupts();
+  zn::print_host();
+  const Settings settings = zn::flag(argc, argv, "quick") ? Settings::quick() : Settings{};
+  try {
+    zn::Figures figures;
+    death_in_many_groups(settings, &figures);
+    end_of_a_crowd(settings, &figures);
+    memory_after_the_deaf(settings, &figures);
+    figures.print();
+    return figures.write_json(zn::option(argc, argv, "benchmark_out")) ? 0 : 1;
+  } catch (const Failure& failure) {
+    std::fprintf(stderr, "disturbances: %s\n", failure.text.c_str());
+    return 1;
+  }
+}
