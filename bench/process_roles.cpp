@@ -97,6 +97,7 @@ class CountingMember : public zelt_gscl_V1::GSProvider {
     if (n->gs_protocol_type == WYX_FAILURE_LEAVE) slot_.failures++;
     slot_.count.fetch_add(1, std::memory_order_release);
   }
+  void announcementCb(const wyx_announcement_notification_t*) override { slot_.ready = 0; }  // the session is over
   wyx_rc_t propose_big_state() {
     std::string state(kBigState, 'b');
     return changeStateValue(wyx_state_value_t{kBigState, state.data()}, WYX_1_PHASE, 0);
@@ -109,7 +110,7 @@ class CountingMember : public zelt_gscl_V1::GSProvider {
 // Joins and proposes for one of its members when told; its slot says whether it still has its session.
 int counting(GSController& controller, Slot& slot, std::vector<std::unique_ptr<CountingMember>> members) {
   slot.ready = 1;
-  const int result = serve(controller, [&](const std::string& line) {
+  return serve(controller, [&](const std::string& line) {
     char what[8];
     std::size_t which = 0;
     if (std::sscanf(line.c_str(), "%7s %zu", what, &which) != 2 || which >= members.size()) return;
@@ -117,8 +118,6 @@ int counting(GSController& controller, Slot& slot, std::vector<std::unique_ptr<C
     const wyx_rc_t rc = join ? members[which]->joinGroup() : members[which]->propose_big_state();
     if (rc != WYX_OK) slot.errors++;
   });
-  slot.ready = 0;
-  return result;
 }
 
 int everywhere(GSController& controller, Slot& slot, int number, int groups) {

@@ -8,6 +8,7 @@
 #include <map>
 #include <memory>
 #include <random>
+#include <sstream>
 #include <string_view>
 #include <vector>
 
@@ -52,6 +53,15 @@ wyx_group_attributes_t attributes_of(int group, short version) {
   attributes.gs_group_default_vote = kind.vote;
   attributes.gs_time_limit = kind.limit;
   return attributes;
+}
+
+/// The parts with spaces between them.
+template <class First, class... Rest>
+std::string words(const First& first, const Rest&... rest) {
+  std::ostringstream out;
+  out << first;
+  ((out << ' ' << rest), ...);
+  return out.str();
 }
 
 std::string hash_of(const char* bytes, int length) {
@@ -128,10 +138,7 @@ class Member : public zelt_gscl_V1::GSProvider {
       : GSProvider(group_name(group).c_str(), 0, nullptr), env_(env), group_(group) {}
 
   void act();
-  std::string report() {
-    return "P " + std::to_string(group_) + " " + (joined() ? std::to_string(instance_) : "0") + " " +
-           std::to_string(seqnum_) + " " + members_ + " " + std::to_string(open_.size());
-  }
+  std::string report() { return words("P", group_, joined() ? instance_ : 0, seqnum_, members_, open_.size()); }
 
   void nPhaseCb(const wyx_n_phase_notification_t* n) override {
     event('n', *n);
@@ -147,19 +154,19 @@ class Member : public zelt_gscl_V1::GSProvider {
     ended(n->gs_protocol_type, *n->gs_proposal);
   }
   void announcementCb(const wyx_announcement_notification_t* n) override {
-    log("A", std::to_string(n->gs_summary_code));
+    log("A", n->gs_summary_code);
     open_.clear();
   }
   void delayedErrorCb(const wyx_delayed_error_notification_t* n) override {
-    log("D", std::to_string(n->gs_protocol_type) + " " + std::to_string(n->gs_delayed_return_code));
+    log("D", n->gs_protocol_type, n->gs_delayed_return_code);
     open_.erase(n->gs_protocol_type);
   }
 
  private:
   bool joined() { return getClientState() == zelt_gscl::GS_IAM_JOINED; }
-  void log(const char* mark, const std::string& what = "") {
-    env_.log(std::string(mark) + " " + std::to_string(group_) + " " + std::to_string(instance_) +
-             (what.empty() ? "" : " ") + what);
+  template <class... What>
+  void log(const char* mark, const What&... what) {
+    env_.log(words(mark, group_, instance_, what...));
   }
   template <class Notification>
   void event(char kind, const Notification& n);
@@ -170,7 +177,7 @@ class Member : public zelt_gscl_V1::GSProvider {
   void propose(int what);
   void asked(wyx_request_t protocol, wyx_rc_t rc) {
     if (rc != WYX_OK) return;
-    log("R", std::to_string(protocol));
+    log("R", protocol);
     open_[protocol] = true;
   }
   std::vector<char> bytes() {
@@ -193,10 +200,9 @@ void Member::event(char kind, const Notification& n) {
   seqnum_ = n.gs_event_seqnum;
   members_ = text(p.gs_current_providers);
   const bool updated = kind == 'a' && (p.gs_whats_changed & WYX_UPDATED_STATE_VALUE) != 0;
-  log("E", std::to_string(p.gs_proposed_by._gs_provider_info._gs_instance_number) + " " +
-               std::to_string(n.gs_event_seqnum) + " " + kind + " " + std::to_string(n.gs_protocol_type) + " " +
-               members_ + " " + text(p.gs_changing_providers) + " " + text(p.gs_current_state_value) + " " +
-               (updated ? "1 " : "0 ") + rest_of(p, n.gs_protocol_type, n.gs_summary_code));
+  log("E", p.gs_proposed_by._gs_provider_info._gs_instance_number, n.gs_event_seqnum, kind, n.gs_protocol_type,
+      members_, text(p.gs_changing_providers), text(p.gs_current_state_value), updated,
+      rest_of(p, n.gs_protocol_type, n.gs_summary_code));
 }
 
 void Member::ended(wyx_request_t protocol, const wyx_proposal_t& proposal) {
@@ -289,16 +295,15 @@ class Watcher : public zelt_gscl_V1::GSSubscriber {
     const bool idle = getClientState() == zelt_gscl::GS_IAM_IDLE;
     if (!idle && !env_.rally && env_.chance(1)) unsubscribeGroup();
     if (!idle || subscribeGroup() != WYX_OK) return;
-    env_.log("B " + std::to_string(group_) + " " + std::to_string(++serial_));
+    env_.log(words("B", group_, ++serial_));
     members_ = "-";
   }
-  std::string report() { return "T " + std::to_string(group_) + " " + members_; }
+  std::string report() { return words("T", group_, members_); }
 
   void subscribeCb(const wyx_subscription_notification_t* n) override {
     if (n->gs_full_membership) members_ = text(n->gs_full_membership);
-    env_.log("T " + std::to_string(group_) + " " + std::to_string(serial_) + " " +
-             std::to_string(n->gs_event_seqnum) + " " + std::to_string(n->gs_subscription_type) + " " +
-             text(n->gs_full_membership) + " " + text(n->gs_changing_membership) + " " + text(n->gs_state_value));
+    env_.log(words("T", group_, serial_, n->gs_event_seqnum, n->gs_subscription_type, text(n->gs_full_membership),
+                   text(n->gs_changing_membership), text(n->gs_state_value)));
   }
 
  private:

@@ -64,6 +64,11 @@ bool has_ended(pid_t child) {
          info.si_pid == child;
 }
 
+void await_good_end(Process& process, const std::string& who) {
+  const int status = process.wait_end(Clock::now() + kHang);
+  if (status != 0) throw Failure{"a " + who + " ended with wait status " + std::to_string(status)};
+}
+
 template <class Condition>
 void wait_until(const std::string& what, Condition condition) {
   const auto deadline = Clock::now() + kHang;
@@ -76,10 +81,38 @@ void wait_until(const std::string& what, Condition condition) {
 class Round {
  public:
   Round(const Settings& settings, std::uint64_t seed) : settings_(settings), seed_(seed), random_(seed) {}
+
   /// Throws Failure with what is wrong.
-  Account run(milliseconds time);
+  Account run(milliseconds time) {
+    if (!board_ || ::pipe2(lifeline_, O_CLOEXEC) != 0) throw Failure{"no board or pipe"};
+    ::fcntl(lifeline_[0], F_SETFD, 0);
+    start_daemon();
+    descriptors_at_start_ = descriptors();
+    mib_at_start_ = resident_mib();
+    for (int i = 0; i < settings_.members; i++) clients_.push_back(start_client("member"));
+    for (int i = 0; i < settings_.subscribers; i++) clients_.push_back(start_client("subscriber"));
+    clients_.push_back(start_client("deaf"));
+    const auto end = Clock::now() + time;
+    while (Clock::now() < end) {
+      step();
+      pause_for(milliseconds(upto(120)));
+    }
+    rally();
+    end_clients();
+    end_daemon();
+    const std::string errors = zn::content_of(folder_.path() + "/errors");
+    if (!errors.empty()) throw Failure{"a client wrote to standard error:\n" + errors};
+    check_daemon_log();
+    return storm::judge(logs());
+  }
+
   /// Moves what the processes wrote to where it stays, and says where that is.
-  std::string keep() const;
+  std::string keep() const {
+    const std::string kept = folder_.path() + "-kept";
+    std::error_code error;
+    std::filesystem::rename(folder_.path(), kept, error);
+    return error ? "could not be kept: " + error.message() : kept;
+  }
 
  private:
   struct Client {
@@ -89,26 +122,201 @@ class Round {
   };
 
   int upto(int n) { return static_cast<int>(random_() % static_cast<unsigned>(n + 1)); }
-  Client start_client(const std::string& role);
-  void start_daemon();
-  void kill_daemon();
-  void step();
-  void kill(Client& victim);
-  void stop(Client& victim);
-  void resume_those_due();
-  void rally();
-  bool at_rest(std::string* stands);
-  void end_clients();
-  void end_daemon();
-  void check_daemon_log() const;
-  std::vector<std::string> logs() const;
-  std::size_t descriptors() const;
-  double resident_mib() const;
+
+  Client start_client(const std::string& role) {
+    const int serial = ++started_;
+    std::vector<std::string> command{zn::program("storm"), "--role=" + role, "--folder=" + folder_.path()};
+    command.push_back("--serial=" + std::to_string(serial));
+    command.push_back("--seed=" + std::to_string(seed_ * 10007 + static_cast<std::uint64_t>(serial)));
+    command.push_back("--lifeline=" + std::to_string(lifeline_[0]));
+    const Process::Environment environment{{"GSD_ENDPOINT", "unix:" + socket_}};
+    Client client{role, std::make_unique<Process>(command, environment, folder_.path() + "/errors"), {}};
+    if (role == "deaf") excused_.insert(client.process->pid());
+    return client;
+  }
+
+  void start_daemon() {
+    ++board_->life;
+    const std::vector<std::string> command{zn::program("gsd"), "--socket-path=" + socket_, "--ready-fd=1",
+                                           "--queue-bound=" + std::to_string(1 << 20)};
+    daemon_ = std::make_unique<Process>(command, Process::Environment{}, folder_.path() + "/gsd.log");
+    daemon_->wait_line(Clock::now() + kHang);
+  }
+
+  void kill_daemon() {
+    daemon_->signal(SIGKILL);
+    daemon_->wait_end(Clock::now() + kHang);
+    start_daemon();
+  }
+
+  void step() {
+    if (has_ended(daemon_->pid())) throw Failure{"the daemon has ended by itself"};
+    for (const Client& client : clients_) {
+      if (has_ended(client.process->pid())) throw Failure{"a " + client.role + " has ended by itself"};
+    }
+    resume_those_due();
+    Client& client = clients_[static_cast<std::size_t>(upto(static_cast<int>(clients_.size()) - 1))];
+    const int dice = upto(99);
+    if (dice < 25) return kill(client);
+    if (dice < 35) return stop(client);
+    if (dice < 39) {
+      daemon_->signal(SIGSTOP);
+      pause_for(milliseconds(10 + upto(200)));
+      return daemon_->signal(SIGCONT);
+    }
+    if (dice < 41 && seed_ % 3 != 0) return kill_daemon();
+    if (dice < 44 && left_behind_ < kLeftBehind) {
+      left_behind_++;
+      return client.process->write_line(settings_.inherit ? "fork all" : "fork");
+    }
+    if (dice < 47 && client.resumes == Clock::time_point{}) {
+      client.process->write_line("quit");
+      await_good_end(*client.process, client.role);
+      kill(client);
+    }
+  }
+
+  void kill(Client& victim) {
+    const std::string role = victim.role;
+    killed_.insert(victim.process->pid());
+    victim = start_client(role);  // the old one is killed with its object
+  }
+
+  void stop(Client& victim) {
+    if (victim.resumes != Clock::time_point{}) return;
+    excused_.insert(victim.process->pid());
+    victim.process->signal(SIGSTOP);
+    victim.resumes = Clock::now() + milliseconds(20 + upto(700));
+  }
+
+  void resume_those_due() {
+    for (Client& client : clients_) {
+      if (client.resumes == Clock::time_point{} || client.resumes > Clock::now()) continue;
+      client.process->signal(SIGCONT);
+      client.resumes = {};
+    }
+  }
+
+  /// Nothing is disturbed any more; everybody joins everything and says where it stands, until all say the same.
+  void rally() {
+    std::erase_if(clients_, [](const Client& client) { return client.role == "deaf"; });
+    for (Client& client : clients_) {
+      client.process->signal(SIGCONT);
+      client.process->write_line("rally");
+    }
+    std::string stands;
+    const auto deadline = Clock::now() + kHang;
+    while (!at_rest(&stands)) {
+      if (Clock::now() > deadline) {
+        std::ofstream(folder_.path() + "/stands") << stands;
+        throw Failure{"those who live do not come to agree on who that is (see stands)"};
+      }
+      pause_for(milliseconds(50));
+    }
+  }
+
+  /// All providers are in, with nothing open; all have the same last event and members, which are the living ones.
+  bool at_rest(std::string* stands) {
+    struct Standing {
+      std::set<std::string> views;  // number and members
+      std::set<std::string> member_texts;
+      std::set<int> living;
+    };
+    std::map<int, Standing> groups;
+    bool rest = true;
+    stands->clear();
+    for (Client& client : clients_) {
+      client.process->write_line("report");
+      for (std::string line; (line = client.process->wait_line(Clock::now() + kHang)) != ".";) {
+        *stands += std::to_string(client.process->pid()) + ": " + line + "\n";
+        std::istringstream in(line);
+        char mark = 0;
+        int group = 0, instance = 0, open = 0;
+        std::string seqnum, members;
+        in >> mark >> group;
+        Standing& standing = groups[group];
+        if (mark == 'P') {
+          in >> instance >> seqnum >> members >> open;
+          rest = rest && instance != 0 && open == 0;
+          standing.living.insert(instance);
+          standing.views.insert(seqnum);
+        } else {
+          in >> members;
+        }
+        standing.member_texts.insert(members);
+      }
+    }
+    for (const auto& [group, standing] : groups) {
+      if (standing.views.size() != 1 || standing.member_texts.size() != 1) return false;
+      std::set<int> members;
+      std::istringstream in(*standing.member_texts.begin());
+      for (std::string id; std::getline(in, id, ',');) members.insert(std::atoi(id.c_str()));
+      rest = rest && members == standing.living;
+    }
+    return rest;
+  }
+
+  void end_clients() {
+    for (Client& client : clients_) client.process->write_line("quit");
+    for (Client& client : clients_) await_good_end(*client.process, client.role);
+    ::close(std::exchange(lifeline_[1], -1));
+    clients_.clear();
+  }
+
+  void end_daemon() {
+    wait_until("the daemon closes the descriptors of its clients",
+               [&] { return descriptors() <= descriptors_at_start_; });
+    const double growth = resident_mib() - mib_at_start_;
+    if (growth > settings_.growth) throw Failure{"the daemon has grown by " + std::to_string(growth) + " MiB"};
+    daemon_->signal(SIGTERM);
+    await_good_end(*daemon_, "daemon");
+    ::close(std::exchange(lifeline_[0], -1));
+    wait_until("those left behind by clients end", [] { return ::waitpid(-1, nullptr, WNOHANG) < 0; });
+    if (std::filesystem::exists(socket_)) throw Failure{"the daemon has left its socket"};
+  }
+
+  /// Nobody who reads and runs is closed.
+  void check_daemon_log() const {
+    std::ifstream log(folder_.path() + "/gsd.log");
+    for (std::string line; std::getline(log, line);) {
+      const auto reason = line.find(": closed: ");
+      if (reason == std::string::npos) continue;
+      const std::string why = line.substr(reason + 10);
+      const auto pid = line.find("pid ");
+      const int who = pid == std::string::npos ? 0 : std::atoi(line.c_str() + pid + 4);
+      if (excused_.contains(who) || why == "quit" || why.rfind("the peer is gone", 0) == 0) continue;
+      if (killed_.contains(who) && why.rfind("attaches", 0) == 0) continue;  // it was dead when that was read
+      throw Failure{"the daemon has closed a client that reads and runs: " + line};
+    }
+  }
+
+  std::vector<std::string> logs() const {
+    std::vector<std::string> all;
+    for (const auto& file : std::filesystem::directory_iterator(folder_.path())) {
+      if (file.path().extension() == ".log" && file.path().stem() != "gsd") all.push_back(file.path());
+    }
+    std::sort(all.begin(), all.end());
+    return all;
+  }
+
+  std::size_t descriptors() const {
+    const std::filesystem::directory_iterator all("/proc/" + std::to_string(daemon_->pid()) + "/fd");
+    return static_cast<std::size_t>(std::distance(begin(all), end(all)));
+  }
+
+  double resident_mib() const {
+    std::ifstream status("/proc/" + std::to_string(daemon_->pid()) + "/status");
+    for (std::string line; std::getline(status, line);) {
+      if (line.rfind("VmRSS:", 0) == 0) return std::stod(line.substr(6)) / 1024;
+    }
+    throw Failure{"the daemon is gone"};
+  }
 
   const Settings settings_;
   const std::uint64_t seed_;
   std::mt19937 random_;
   zn::TempFolder folder_;
+  const std::string socket_ = folder_.path() + "/gsd.sock";
   storm::Board* board_ = storm::map_board(folder_.path());
   int lifeline_[2] = {-1, -1};  // clients hold the reading end, this process alone the other
   std::unique_ptr<Process> daemon_;
@@ -120,247 +328,6 @@ class Round {
   int started_ = 0;
   int left_behind_ = 0;
 };
-
-// ------------------------------------------------------------------------------------------- starting and ending
-
-Round::Client Round::start_client(const std::string& role) {
-  const int serial = ++started_;
-  std::vector<std::string> command{zn::program("storm"),
-                                   "--role",
-                                   role,
-                                   "--folder",
-                                   folder_.path(),
-                                   "--serial",
-                                   std::to_string(serial),
-                                   "--seed",
-                                   std::to_string(seed_ * 10007 + static_cast<std::uint64_t>(serial)),
-                                   "--lifeline",
-                                   std::to_string(lifeline_[0])};
-  Client client{role,
-                std::make_unique<Process>(
-                    command, Process::Environment{{"GSD_ENDPOINT", "unix:" + folder_.path() + "/gsd.sock"}},
-                    folder_.path() + "/errors"),
-                {}};
-  if (role == "deaf") excused_.insert(client.process->pid());
-  return client;
-}
-
-void Round::start_daemon() {
-  ++board_->life;
-  const std::vector<std::string> command{
-      zn::program("gsd"), "--socket-path",        folder_.path() + "/gsd.sock", "--ready-fd", "1",
-      "--queue-bound",    std::to_string(1 << 20)};
-  daemon_ = std::make_unique<Process>(command, Process::Environment{}, folder_.path() + "/gsd.log");
-  daemon_->wait_line(Clock::now() + kHang);
-}
-
-void Round::kill_daemon() {
-  daemon_->signal(SIGKILL);
-  daemon_->wait_end(Clock::now() + kHang);
-  start_daemon();
-}
-
-std::size_t Round::descriptors() const {
-  const std::filesystem::directory_iterator all("/proc/" + std::to_string(daemon_->pid()) + "/fd");
-  return static_cast<std::size_t>(std::distance(begin(all), end(all)));
-}
-
-double Round::resident_mib() const {
-  std::ifstream status("/proc/" + std::to_string(daemon_->pid()) + "/status");
-  for (std::string line; std::getline(status, line);) {
-    if (line.rfind("VmRSS:", 0) == 0) return std::stod(line.substr(6)) / 1024;
-  }
-  throw Failure{"the daemon is gone"};
-}
-
-// ------------------------------------------------------------------------------------------------------ the storm
-
-void Round::kill(Client& victim) {
-  const std::string role = victim.role;
-  killed_.insert(victim.process->pid());
-  victim = start_client(role);  // the old one is killed with its object
-}
-
-void Round::stop(Client& victim) {
-  if (victim.resumes != Clock::time_point{}) return;
-  excused_.insert(victim.process->pid());
-  victim.process->signal(SIGSTOP);
-  victim.resumes = Clock::now() + milliseconds(20 + upto(700));
-}
-
-void Round::resume_those_due() {
-  for (Client& client : clients_) {
-    if (client.resumes == Clock::time_point{} || client.resumes > Clock::now()) continue;
-    client.process->signal(SIGCONT);
-    client.resumes = {};
-  }
-}
-
-void Round::step() {
-  if (has_ended(daemon_->pid())) throw Failure{"the daemon has ended by itself"};
-  for (const Client& client : clients_) {
-    if (has_ended(client.process->pid())) throw Failure{"a " + client.role + " has ended by itself"};
-  }
-  resume_those_due();
-  Client& client = clients_[static_cast<std::size_t>(upto(static_cast<int>(clients_.size()) - 1))];
-  const int dice = upto(99);
-  if (dice < 25) return kill(client);
-  if (dice < 35) return stop(client);
-  if (dice < 39) {
-    daemon_->signal(SIGSTOP);
-    pause_for(milliseconds(10 + upto(200)));
-    return daemon_->signal(SIGCONT);
-  }
-  if (dice < 41 && seed_ % 3 != 0) return kill_daemon();
-  if (dice < 44 && left_behind_ < kLeftBehind) {
-    left_behind_++;
-    return client.process->write_line(settings_.inherit ? "fork all" : "fork");
-  }
-  if (dice < 47 && client.resumes == Clock::time_point{}) {
-    client.process->write_line("quit");
-    const int status = client.process->wait_end(Clock::now() + kHang);
-    if (status != 0) throw Failure{"a " + client.role + " ended with wait status " + std::to_string(status)};
-    kill(client);
-  }
-}
-
-/// Nothing is disturbed any more; everybody joins everything and says where it stands, until all say the same.
-void Round::rally() {
-  std::erase_if(clients_, [](const Client& client) { return client.role == "deaf"; });
-  for (Client& client : clients_) {
-    client.process->signal(SIGCONT);
-    client.process->write_line("rally");
-  }
-  std::string stands;
-  const auto deadline = Clock::now() + kHang;
-  while (!at_rest(&stands)) {
-    if (Clock::now() > deadline) {
-      std::ofstream(folder_.path() + "/stands") << stands;
-      throw Failure{"those who live do not come to agree on who that is (see stands)"};
-    }
-    pause_for(milliseconds(50));
-  }
-}
-
-/// All providers are in, with nothing open; all have the same last event and members, which are the living ones.
-bool Round::at_rest(std::string* stands) {
-  struct Standing {
-    std::set<std::string> views;  // number and members
-    std::set<std::string> member_texts;
-    std::set<int> living;
-  };
-  std::map<int, Standing> groups;
-  bool rest = true;
-  stands->clear();
-  for (Client& client : clients_) {
-    client.process->write_line("report");
-    for (std::string line; (line = client.process->wait_line(Clock::now() + kHang)) != ".";) {
-      *stands += std::to_string(client.process->pid()) + ": " + line + "\n";
-      std::istringstream in(line);
-      char mark = 0;
-      int group = 0, instance = 0, open = 0;
-      std::string seqnum, members;
-      in >> mark >> group;
-      Standing& standing = groups[group];
-      if (mark == 'P') {
-        in >> instance >> seqnum >> members >> open;
-        rest = rest && instance != 0 && open == 0;
-        standing.living.insert(instance);
-        standing.views.insert(seqnum);
-      } else {
-        in >> members;
-      }
-      standing.member_texts.insert(members);
-    }
-  }
-  for (const auto& [group, standing] : groups) {
-    if (standing.views.size() != 1 || standing.member_texts.size() != 1) return false;
-    std::set<int> members;
-    std::istringstream in(*standing.member_texts.begin());
-    for (std::string id; std::getline(in, id, ',');) members.insert(std::atoi(id.c_str()));
-    rest = rest && members == standing.living;
-  }
-  return rest;
-}
-
-void Round::end_clients() {
-  for (Client& client : clients_) client.process->write_line("quit");
-  for (Client& client : clients_) {
-    const int status = client.process->wait_end(Clock::now() + kHang);
-    if (status != 0) throw Failure{"a " + client.role + " ended with wait status " + std::to_string(status)};
-  }
-  ::close(std::exchange(lifeline_[1], -1));
-  clients_.clear();
-}
-
-void Round::end_daemon() {
-  wait_until("the daemon closes the descriptors of its clients",
-             [&] { return descriptors() <= descriptors_at_start_; });
-  const double growth = resident_mib() - mib_at_start_;
-  if (growth > settings_.growth) throw Failure{"the daemon has grown by " + std::to_string(growth) + " MiB"};
-  daemon_->signal(SIGTERM);
-  const int status = daemon_->wait_end(Clock::now() + kHang);
-  if (status != 0) throw Failure{"the daemon ended with wait status " + std::to_string(status)};
-  ::close(std::exchange(lifeline_[0], -1));
-  wait_until("those left behind by clients end", [] { return ::waitpid(-1, nullptr, WNOHANG) < 0; });
-  if (std::filesystem::exists(folder_.path() + "/gsd.sock")) throw Failure{"the daemon has left its socket"};
-}
-
-// ------------------------------------------------------------------------------------------------------- judging
-
-/// Nobody who reads and runs is closed.
-void Round::check_daemon_log() const {
-  std::ifstream log(folder_.path() + "/gsd.log");
-  for (std::string line; std::getline(log, line);) {
-    const auto reason = line.find(": closed: ");
-    if (reason == std::string::npos) continue;
-    const std::string why = line.substr(reason + 10);
-    const auto pid = line.find("pid ");
-    const int who = pid == std::string::npos ? 0 : std::atoi(line.c_str() + pid + 4);
-    if (excused_.contains(who) || why == "quit" || why.rfind("the peer is gone", 0) == 0) continue;
-    if (killed_.contains(who) && why.rfind("attaches", 0) == 0) continue;  // it was dead when that was read
-    throw Failure{"the daemon has closed a client that reads and runs: " + line};
-  }
-}
-
-std::vector<std::string> Round::logs() const {
-  std::vector<std::string> all;
-  for (const auto& file : std::filesystem::directory_iterator(folder_.path())) {
-    if (file.path().extension() == ".log" && file.path().stem() != "gsd") all.push_back(file.path());
-  }
-  std::sort(all.begin(), all.end());
-  return all;
-}
-
-std::string Round::keep() const {
-  const std::string kept = folder_.path() + "-kept";
-  std::error_code error;
-  std::filesystem::rename(folder_.path(), kept, error);
-  return error ? "could not be kept: " + error.message() : kept;
-}
-
-Account Round::run(milliseconds time) {
-  if (!board_ || ::pipe2(lifeline_, O_CLOEXEC) != 0) throw Failure{"no board or pipe"};
-  ::fcntl(lifeline_[0], F_SETFD, 0);
-  start_daemon();
-  descriptors_at_start_ = descriptors();
-  mib_at_start_ = resident_mib();
-  for (int i = 0; i < settings_.members; i++) clients_.push_back(start_client("member"));
-  for (int i = 0; i < settings_.subscribers; i++) clients_.push_back(start_client("subscriber"));
-  clients_.push_back(start_client("deaf"));
-  const auto end = Clock::now() + time;
-  while (Clock::now() < end) {
-    step();
-    pause_for(milliseconds(upto(120)));
-  }
-  rally();
-  end_clients();
-  end_daemon();
-  const std::string errors = zn::content_of(folder_.path() + "/errors");
-  if (!errors.empty()) throw Failure{"a client wrote to standard error:\n" + errors};
-  check_daemon_log();
-  return storm::judge(logs());
-}
 
 int run_rounds(const Settings& settings) {
   ::prctl(PR_SET_CHILD_SUBREAPER, 1);  // what clients leave behind is waited for here
@@ -377,8 +344,9 @@ int run_rounds(const Settings& settings) {
           a.subscriptions);
       std::fflush(stdout);
     } catch (const Failure& failure) {
+      const std::string kept = failure.text == "interrupted" ? "none" : round.keep();
       std::fprintf(stderr, "storm: seed %llu: %s\nlogs: %s\n", static_cast<unsigned long long>(seed),
-                   failure.text.c_str(), round.keep().c_str());
+                   failure.text.c_str(), kept.c_str());
       return 1;
     }
   }
