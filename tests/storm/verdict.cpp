@@ -269,7 +269,7 @@ class Judge {
       if (event.kind == 'a' && event.protocol == WYX_JOIN) {
         expected.insert(expected.end(), event.changing.begin(), event.changing.end());
       } else if (event.kind == 'a') {
-        std::erase_if(expected, [&event](int id) { return has(event.changing, id); });
+        std::erase_if(expected, [&gone = event.changing](int id) { return has(gone, id); });
       }
       if (known && expected != event.members) contradiction("wrong members: " + event.content, *event.log);
       if (known && !event.updated && before != &none && event.state != before->state) {
