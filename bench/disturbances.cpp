@@ -111,9 +111,13 @@ void Scene::tell(int i, const char* what, int members, const std::vector<int>& t
       const bool grows = joins && told[who] == 0;
       targets[who] += static_cast<uint64_t>(grows ? member + 1 : told[who]);
     }
-    if (member % kAtOnce != kAtOnce - 1 && member != members - 1) continue;
+    if (told[0] == 1 && member % kAtOnce != kAtOnce - 1 && member != members - 1) continue;  // a crowd: each alone
     for (size_t who = 0; who < told.size(); who++) {
-      await("everybody is told", [&] { return slot(static_cast<int>(who)).count >= targets[who]; });
+      const zn::Slot& slot_of = slot(static_cast<int>(who));
+      await("everybody is told", [&] {
+        if (slot_of.ready == 0) throw Failure{"a reader was closed while its groups were set up"};
+        return slot_of.count >= targets[who];
+      });
     }
   }
   if (slot(i).errors != 0) throw Failure{std::string("a request was refused: ") + what};

@@ -121,6 +121,20 @@ class Round {
     Clock::time_point resumes{};  // while it is stopped
   };
 
+  /// What the clients say of one group.
+  struct Standing {
+    std::set<std::string> seqnums, members;  // each as it was said
+    std::set<int> living;
+
+    bool agrees() const {
+      if (seqnums.size() != 1 || members.size() != 1) return false;
+      std::set<int> ids;
+      std::istringstream in(*members.begin());
+      for (std::string id; std::getline(in, id, ',');) ids.insert(std::atoi(id.c_str()));
+      return ids == living;
+    }
+  };
+
   int upto(int n) { return static_cast<int>(random_() % static_cast<unsigned>(n + 1)); }
 
   Client start_client(const std::string& role) {
@@ -215,13 +229,24 @@ class Round {
     }
   }
 
+  /// Takes in a line of a client's report; false: that one is out, or has a request open.
+  static bool take_report(const std::string& line, std::map<int, Standing>& groups) {
+    std::istringstream in(line);
+    char mark = 0;
+    int group = 0, instance = -1, open = 0;
+    std::string seqnum, members;
+    in >> mark >> group;
+    if (mark == 'P') in >> instance >> seqnum;
+    in >> members >> open;
+    Standing& standing = groups[group];
+    standing.members.insert(members);
+    if (mark == 'P') standing.living.insert(instance);
+    if (mark == 'P') standing.seqnums.insert(seqnum);
+    return instance != 0 && open == 0;
+  }
+
   /// All providers are in, with nothing open; all have the same last event and members, which are the living ones.
   bool at_rest(std::string* stands) {
-    struct Standing {
-      std::set<std::string> views;  // number and members
-      std::set<std::string> member_texts;
-      std::set<int> living;
-    };
     std::map<int, Standing> groups;
     bool rest = true;
     stands->clear();
@@ -229,31 +254,10 @@ class Round {
       client.process->write_line("report");
       for (std::string line; (line = client.process->wait_line(Clock::now() + kHang)) != ".";) {
         *stands += std::to_string(client.process->pid()) + ": " + line + "\n";
-        std::istringstream in(line);
-        char mark = 0;
-        int group = 0, instance = 0, open = 0;
-        std::string seqnum, members;
-        in >> mark >> group;
-        Standing& standing = groups[group];
-        if (mark == 'P') {
-          in >> instance >> seqnum >> members >> open;
-          rest = rest && instance != 0 && open == 0;
-          standing.living.insert(instance);
-          standing.views.insert(seqnum);
-        } else {
-          in >> members;
-        }
-        standing.member_texts.insert(members);
+        rest = take_report(line, groups) && rest;
       }
     }
-    for (const auto& [group, standing] : groups) {
-      if (standing.views.size() != 1 || standing.member_texts.size() != 1) return false;
-      std::set<int> members;
-      std::istringstream in(*standing.member_texts.begin());
-      for (std::string id; std::getline(in, id, ',');) members.insert(std::atoi(id.c_str()));
-      rest = rest && members == standing.living;
-    }
-    return rest;
+    return rest && std::all_of(groups.begin(), groups.end(), [](const auto& g) { return g.second.agrees(); });
   }
 
   void end_clients() {
