@@ -2,6 +2,7 @@
 #include <stdlib.h>
 #include <sys/ipc.h>
 #include <sys/sem.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include "dae/dae_failure_internal.h"
@@ -22,6 +23,21 @@ int take_semaphore() {
   return result;
 }
 
+/// Whether nobody but root and this process's user can change the set or take it away. False with errno 0 when
+/// somebody can.
+bool is_ours() {
+  semid_ds set;
+  union {
+    int val;
+    semid_ds* buf;
+  } argument = {};
+  argument.buf = &set;
+  if (semctl(sem_ID, 0, IPC_STAT, argument) != 0) return false;
+  errno = 0;
+  const auto is_trusted = [](uid_t user) { return user == 0 || user == geteuid(); };
+  return is_trusted(set.sem_perm.uid) && is_trusted(set.sem_perm.cuid) && (set.sem_perm.mode & S_IWOTH) == 0;
+}
+
 }  // namespace
 
 int dae_exclusive__INTERNAL__(const char* excl_path, char excl_ID) {
@@ -33,10 +49,12 @@ int dae_exclusive__INTERNAL__(const char* excl_path, char excl_ID) {
   for (int attempt = 1;; ++attempt) {
     sem_ID = semget(key, 1, IPC_CREAT | 0664);
     if (sem_ID == -1) return dae::fail_call(DAE_E_EXCLFAILED, "semget");
-    if (take_semaphore() == 0) break;
+    const bool ours = is_ours();
+    if (!ours && errno == 0) return dae::fail(DAE_E_EXCLFAILED, "DAE_EM_EXCLFOREIGN");
+    if (ours && take_semaphore() == 0) break;
     if (errno == EAGAIN) return dae::fail(DAE_E_EXCLBUSY, "DAE_EM_EXCLBUSY");
     const bool removed = errno == EINVAL || errno == EIDRM;
-    if (!removed || attempt == kAttempts) return dae::fail_call(DAE_E_EXCLFAILED, "semop");
+    if (!removed || attempt == kAttempts) return dae::fail_call(DAE_E_EXCLFAILED, ours ? "semop" : "semctl");
   }
   atexit(dae_release);
   return DAE_OK;

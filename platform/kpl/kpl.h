@@ -5,14 +5,15 @@
 // descriptor 0, or a System V message queue. A request is a `kplreq`: on the socket the bytes from `kplreq.kplhdr`
 // on (156 of them, then extra data), on the queue the type word first. Whoever asks, the master itself or a
 // command for which it forwards, waits on a local datagram socket and names it in the header as the return
-// address. The subsystem answers straight to that address, with any number of interim packets and one last one.
+// address. The subsystem answers straight to that address, with any number of interim packets and one last one. The
+// master keeps the address until the subsystem has answered or ended, so that nobody else gets what comes late.
 //
 // The return address (`kplhdr.retaddr`) is a local-socket address that needs no length beside it:
 //   - `sun_family` is AF_UNIX; any other value means that no answer is wanted;
-//   - a path: the text up to the first NUL, or all 108 bytes when there is none;
 //   - an abstract name: a NUL in `sun_path[0]`, then the name up to the next NUL or the end of the array. Abstract
 //     names that hold a NUL cannot be used; the names that the kernel chooses (binding with the family alone) can.
 //   - a NUL in the first two bytes: no address, no answer wanted.
+//   - a path is not answered: whoever may write in its folders could lead the answer elsewhere.
 // `retaddr` is trusted as the request channel is: who may write into that channel is the master's business.
 //
 // Reply packets, each one datagram that begins with a `kplhdr`. Its `retaddr` and `dversion` are the request's,
@@ -48,6 +49,7 @@ enum {
 
 /// `subreq.action`
 enum {
+  KPL_ACTION_PING = 0,        ///< asks for nothing: whatever the answer, the subsystem serves its requests
   KPL_ACTION_STOP = 1,        ///< `parm1`: 0 normal, 1 forced
   KPL_ACTION_STATUS = 2,      ///< `parm1`: 0 short (answered by the master), 1 long
   KPL_ACTION_TRACE = 4,       ///< `parm2`: 1 on, 0 off; `parm1`: 1 long trace
@@ -157,7 +159,7 @@ KPL_EXPORT struct kplhdr* kplrrqs(char* request_header);
 /// requester counts as gone, and this and all later packets of the answer are dropped at no cost.
 ///
 /// Returns 0 when the packet was handed over, -1 otherwise, with `errno`: EINVAL for a `reply_len` under 118,
-/// EDESTADDRREQ without return address, ETIMEDOUT or the socket's error when the requester is gone.
+/// EDESTADDRREQ without return address or for a path, ETIMEDOUT or the socket's error when the requester is gone.
 KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int cont);
 
 /// Asks the master for short status: a heading line, then a line for each subsystem that matches, whose margin
@@ -169,12 +171,13 @@ KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int co
 /// `*cont` to KPL_CONT_END with the last records, to KPL_CONT_STATUS before. The first call asks and waits for the
 /// whole answer, 5 seconds in all; the others only hand out what came, and free it with the last.
 ///
-/// On the wire it is a request to the master's socket with KPL_ACTION_STATUS, `parm1` 0, `objname` the subsystem
-/// (at most 29 characters) and, as extra data, `pid` as a 32-bit integer; the answer is status packets and a last
-/// one.
+/// On the wire it is a connection to the master's SOCK_SEQPACKET socket and one packet in it: a request with
+/// KPL_ACTION_STATUS, no return address, `parm1` 0, `objname` the subsystem (at most 29 characters) and, as extra
+/// data, `pid` as a 32-bit integer. The answer comes back in the connection: status packets and a last one.
 ///
-/// Returns 0; -1 with `errno` when the master could not be asked (EINVAL for the arguments, ETIMEDOUT, EBADMSG for
-/// an answer that makes no sense, or the socket's error); otherwise the result code of the master's answer. After
+/// Returns 0; -1 with `errno` when the master could not be asked (EINVAL for the arguments, ETIMEDOUT, EPERM when
+/// who listens there is neither root nor this process's user, EBADMSG for an answer that makes no sense, or the
+/// socket's error); otherwise the result code of the master's answer. After
 /// a failure the query is over.
 KPL_EXPORT int kplstat(char* host, char* subsystem, pid_t pid, short* reply_len, char* reply, int* cont);
 

@@ -5,8 +5,8 @@
 
 namespace kpl {
 
-platform::Descriptor open_datagram_socket() {
-  return platform::Descriptor(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+platform::Descriptor open_local_socket(int type) {
+  return platform::Descriptor(socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
 }
 
 socklen_t address_length(const sockaddr_un& address) {

@@ -1,4 +1,4 @@
-// Local datagram sockets as the KPL library uses them, and addresses without a length.
+// Local sockets as the KPL library uses them, and addresses without a length.
 #ifndef KPL_LOCAL_SOCKET_H
 #define KPL_LOCAL_SOCKET_H
 
@@ -9,8 +9,8 @@
 
 namespace kpl {
 
-/// A new local datagram socket, closed on exec; holds nothing, with errno, when there is none to be had.
-platform::Descriptor open_datagram_socket();
+/// A new local socket of that type, closed on exec; holds nothing, with errno, when there is none to be had.
+platform::Descriptor open_local_socket(int type);
 
 /// The length that the kernel wants for a return address, 0 when it names nobody. See kpl.h for what it may hold.
 socklen_t address_length(const sockaddr_un& address);

@@ -32,10 +32,12 @@ struct Answer {
 
 thread_local Answer answer;
 
+/// Not to a path: where that leads is up to whoever may write in its folders, and the answer would go there with
+/// this process's rights. Whoever holds an abstract name keeps it for as long as it lives.
 int connect_to(const sockaddr_un& retaddr) {
   const socklen_t length = kpl::address_length(retaddr);
-  if (length == 0) return EDESTADDRREQ;
-  answer.socket = kpl::open_datagram_socket();
+  if (length == 0 || retaddr.sun_path[0] != '\0') return EDESTADDRREQ;
+  answer.socket = kpl::open_local_socket(SOCK_DGRAM);
   if (!answer.socket) return errno;
   const auto* address = reinterpret_cast<const sockaddr*>(&retaddr);
   return connect(answer.socket.get(), address, length) == 0 ? 0 : errno;

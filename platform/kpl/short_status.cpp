@@ -1,6 +1,5 @@
 // The subsystem's side: asking the master for short status.
 #include <errno.h>
-#include <poll.h>
 #include <stdint.h>
 #include <stdlib.h>
 #include <string.h>
@@ -44,75 +43,62 @@ struct Question {
 };
 static_assert(sizeof(Question) == 160);
 
-/// Sends the question, which waits while the master's queue is full; returns an error number.
-int send_question(int fd, const Question& question, const sockaddr_un& master, Clock::time_point deadline) {
-  const auto* to = reinterpret_cast<const sockaddr*>(&master);
+/// What is left of the time for a call that waits; false: nothing.
+bool set_patience(int fd, int option, Clock::time_point deadline) {
+  const auto left = std::chrono::ceil<std::chrono::microseconds>(deadline - Clock::now()).count();
+  const timeval patience = {left / 1000000, left % 1000000};
+  return left > 0 && setsockopt(fd, SOL_SOCKET, option, &patience, sizeof patience) == 0;
+}
+
+/// An interrupted call is made again; one whose time is over says so.
+template <class Call>
+ssize_t in_time(int fd, int option, Clock::time_point deadline, Call call) {
   for (;;) {
-    const auto left = std::chrono::ceil<std::chrono::microseconds>(deadline - Clock::now()).count();
-    if (left <= 0) return ETIMEDOUT;
-    const timeval patience = {left / 1000000, left % 1000000};
-    if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience) != 0) return errno;
-    if (sendto(fd, &question, sizeof question, MSG_NOSIGNAL, to, kpl::address_length(master)) >= 0) return 0;
-    if (errno != EINTR && errno != EAGAIN) return errno;
+    if (!set_patience(fd, option, deadline)) return -ETIMEDOUT;
+    const ssize_t result = call();
+    if (result >= 0) return result;
+    if (errno != EINTR && errno != EAGAIN) return -errno;
   }
 }
 
-/// Opens a socket with an address that the kernel chooses and asks from it; returns an error number.
+/// Whether root or this process's own user answers there: anybody may take the address of a master that is gone.
+bool is_trusted(int fd) {
+  ucred peer;
+  socklen_t length = sizeof peer;
+  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) return false;
+  return peer.uid == 0 || peer.uid == geteuid();
+}
+
+/// Connects to the master and asks; returns an error number.
 int ask(const char* subsystem, pid_t pid, Clock::time_point deadline, platform::Descriptor* socket) {
   sockaddr_un master;
   const char* place = getenv(KPL_MASTER_ENV);
   if (!kpl::address_from_text(place != nullptr ? place : KPL_MASTER_DEFAULT, &master)) return EINVAL;
-  *socket = kpl::open_datagram_socket();
+  *socket = kpl::open_local_socket(SOCK_SEQPACKET);
   if (!*socket) return errno;
+  const int fd = socket->get();
+  const auto* to = reinterpret_cast<const sockaddr*>(&master);
+  const ssize_t connected =
+      in_time(fd, SO_SNDTIMEO, deadline, [&] { return connect(fd, to, kpl::address_length(master)); });
+  if (connected < 0) return static_cast<int>(-connected);
+  if (!is_trusted(fd)) return EPERM;
 
-  const int on = 1;
-  if (setsockopt(socket->get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0) return errno;
   Question question = {};
-  socklen_t own_length = sizeof question.header.retaddr;
-  question.header.retaddr.sun_family = AF_UNIX;
-  auto* own = reinterpret_cast<sockaddr*>(&question.header.retaddr);
-  if (bind(socket->get(), own, sizeof(sa_family_t)) != 0) return errno;
-  if (getsockname(socket->get(), own, &own_length) != 0) return errno;
-
   question.header.dversion = KPL_VERSION;
   question.request.object = KPL_OBJECT_SUBSYSTEM;
   question.request.action = KPL_ACTION_STATUS;
   strncpy(question.request.objname, subsystem, sizeof question.request.objname - 1);
   question.pid = pid;
-  return send_question(socket->get(), question, master, deadline);
-}
-
-/// Whether the datagram came from root or from this process's own user: anybody may write to the socket's address.
-bool is_trusted(msghdr* message) {
-  for (cmsghdr* c = CMSG_FIRSTHDR(message); c != nullptr; c = CMSG_NXTHDR(message, c)) {
-    if (c->cmsg_level != SOL_SOCKET || c->cmsg_type != SCM_CREDENTIALS) continue;
-    ucred sender;
-    memcpy(&sender, CMSG_DATA(c), sizeof sender);
-    return sender.uid == 0 || sender.uid == geteuid();
-  }
-  return false;
+  const ssize_t sent =
+      in_time(fd, SO_SNDTIMEO, deadline, [&] { return send(fd, &question, sizeof question, MSG_NOSIGNAL); });
+  return sent < 0 ? static_cast<int>(-sent) : 0;
 }
 
 /// Receives one packet of the answer; returns its length, or the negative of an error number.
 ssize_t receive(int fd, Clock::time_point deadline, char* packet) {
-  for (;;) {
-    const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
-    if (left.count() <= 0) return -ETIMEDOUT;
-    pollfd entry = {fd, POLLIN, 0};
-    if (poll(&entry, 1, static_cast<int>(left.count())) < 0 && errno != EINTR) return -errno;
-
-    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(ucred))];
-    iovec part = {packet, kMaxPacket};
-    msghdr message = {};
-    message.msg_iov = &part;
-    message.msg_iovlen = 1;
-    message.msg_control = control;
-    message.msg_controllen = sizeof control;
-    const ssize_t got = recvmsg(fd, &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
-    if (got < 0 && errno != EAGAIN && errno != EINTR) return -errno;
-    if (got < 0 || !is_trusted(&message)) continue;
-    return (message.msg_flags & MSG_TRUNC) != 0 ? -EBADMSG : got;
-  }
+  const ssize_t got = in_time(fd, SO_RCVTIMEO, deadline, [&] { return recv(fd, packet, kMaxPacket, MSG_TRUNC); });
+  if (got == 0) return -ECONNRESET;
+  return got > static_cast<ssize_t>(kMaxPacket) ? -EBADMSG : got;
 }
 
 int add_lines(const char* packet, size_t length) {

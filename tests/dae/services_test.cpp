@@ -129,6 +129,16 @@ TEST(Lock, Failures_are_named_and_a_set_that_goes_is_made_again) {
   EXPECT_EQ(take("/no/such/file", 'z'), "16 ftok failed: No such file or directory");
   EXPECT_EQ(take(path, 'z', 2), "0 ");
   EXPECT_EQ(take(path, 'z', 3), "16 semop failed: Invalid argument");
+  for (const mode_t mode : {0664, 0666}) {  // one that another user may take away, or change
+    const int set = semget(ftok(path, 'y'), 1, IPC_CREAT | IPC_EXCL | 0664);
+    semid_ds state = {};
+    semctl(set, 0, IPC_STAT, &state);
+    state.sem_perm.mode = mode;
+    if (mode == 0664 && geteuid() == 0) state.sem_perm.uid = 65534;
+    semctl(set, 0, IPC_SET, &state);
+    if (mode == 0666 || geteuid() == 0) EXPECT_EQ(take(path, 'y'), "16 DAE_EM_EXCLFOREIGN");
+    semctl(set, 0, IPC_RMID);
+  }
   unlink(path);
 }
 
