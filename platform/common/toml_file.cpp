@@ -43,8 +43,9 @@ void check_bounds(const std::string& path, const std::string& content) {
 
 }  // namespace
 
-toml::value parse_toml_file(const std::string& path) {
-  const std::string text = content_of(path);
+toml::value parse_toml_file(const std::string& path) { return parse_toml(content_of(path), path); }
+
+toml::value parse_toml(const std::string& text, const std::string& path) {
   check_bounds(path, text);
   std::istringstream content(text);
   try {

@@ -10,6 +10,8 @@ namespace platform {
 
 /// Throws SettingError, "FILE:LINE: what", or "FILE: what" when it cannot be read.
 toml::value parse_toml_file(const std::string& path);
+/// The same of a file's content.
+toml::value parse_toml(const std::string& text, const std::string& path);
 
 /// "FILE:LINE" of a value.
 std::string place_of(const toml::value& value);

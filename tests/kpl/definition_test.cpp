@@ -1,6 +1,8 @@
 // Definition files and control packets, by themselves.
 #include "master/definition.h"
 
+#include <sys/stat.h>
+
 #include <fstream>
 
 #include "control/control.h"
@@ -38,6 +40,10 @@ TEST(DefinitionFile, Mistakes_AreToldWithTheirLine) {
       {"queue-key = 5", "x.toml:3: queue-key: is for transport = \"queue\" only"},
       {"normal-signal = \"SIGUSR1\"", "x.toml:3: normal-signal: is for transport = \"signals\" only"},
       {"transport = \"signals\"\nforced-signal = \"SIGRTMIN\"", "x.toml:4: forced-signal: must be the name"},
+      {"environment = { \"A B\" = \"x\" }", "x.toml:3: environment: names are made of letters"},
+      {"pass-environment = [\"KPL_SUBSYSTEM\"]", "pass-environment: 'KPL_SUBSYSTEM' is set by kplmstr"},
+      {"ping-limit = 1", "x.toml:3: ping-limit: needs a 'ping-interval' too"},
+      {"ping-interval = 1\ntransport = \"signals\"", "x.toml:3: ping-interval: signals carry no pings"},
       {"restart-delay-max = 86400\nuser = \"\xc3\xa9\"", "none"},
   };
   for (const auto& [line, problem] : lines) EXPECT_THAT(problem_of(good + line + "\n"), HasSubstr(problem));
@@ -50,14 +56,19 @@ TEST(DefinitionFile, Mistakes_AreToldWithTheirLine) {
   std::ofstream(dir / "x.toml") << "name = \"x\"\n" + queue;
   std::ofstream(dir / "y.toml") << "name = \"y\"\n" + queue;
   const auto folder = master::read_folder(dir / "");
+  chmod((dir / "x.toml").c_str(), 0646);  // what others could change would run as root
+  EXPECT_THAT(master::read_folder(dir / "").skipped.at(0).problem, HasSubstr("x.toml: can be written by others"));
+  chmod((dir / "").c_str(), 0777);
+  EXPECT_THROW(master::read_folder(dir / ""), platform::SettingError);
   ASSERT_EQ(folder.skipped.size(), 1u);
   EXPECT_THAT(folder.skipped[0].problem, HasSubstr("y.toml: queue-key: 5 is taken by "));
 }
 
 TEST(ControlPacket, WhatMakesNoSense_IsMalformed) {
-  for (const char* packet : {"", "{", "null", "{}", "{\"end\":1}", "{\"end\":\"fine\"}", "{\"lines\":{}}",
-                             "{\"lines\":[[\"a\"]]}", "{\"lines\":[[1,2]]}", "{\"wait\":\"x\"}", "{\"message\":2}",
-                             "{\"entry\":[]}", "{\"end\":\"ok\",\"code\":1e9}"}) {
+  for (const char* packet :
+       {"", "{", "null", "{}", "{\"end\":1}", "{\"end\":\"fine\"}", "{\"lines\":{}}", "{\"lines\":[[\"a\"]]}",
+        "{\"lines\":[[1,2]]}", "{\"wait\":\"x\"}", "{\"message\":2}", "{\"entry\":{\"a\":[[[[[[[[]]]]]]]]}}",
+        "{\"entry\":[]}", "{\"end\":\"ok\",\"code\":1e9}"}) {
     EXPECT_THROW(control::decode_answer(packet), control::Malformed) << packet;
   }
   for (const char* packet :

@@ -115,6 +115,13 @@ TEST_P(KplmstrMessages, OwnRequestsAndLongStatus_CarryTheirDataOrFail) {
   for (int i = 1; i < 200; ++i) expected += "        line " + std::to_string(i) + "\n";
   EXPECT_EQ(status.out, expected);
 
+  ASSERT_EQ(ctl({"request", "probe", "300", "--parm1", "2"}).status, kOk);
+  const json told = json::parse(ctl({"--json", "status", "--long", "probe"}).out)["results"][0];
+  EXPECT_EQ(told["fields"], json::parse(R"([{"name": "lines", "value": "2 are 100%\nline 1"}])"));
+  EXPECT_EQ(told["entry"]["state"], "active");
+  EXPECT_THAT(ctl({"restart", "probe"}).out,
+              MatchesRegex("probe ended: exit status 0\nprobe started, pid [0-9]+\n"));
+
   const Outcome crashed = ctl({"request", "probe", "256"});
   EXPECT_EQ(crashed.status, kFailed);
   EXPECT_THAT(crashed.err, HasSubstr("probe ended before it answered"));
@@ -145,6 +152,44 @@ TEST_F(Kplmstr, ACrashedDaemon_IsStartedAgainEverMoreSlowlyAndAStoppedOneIsNot) 
   EXPECT_TRUE(master.wait_for_status("waiting"));
   EXPECT_THAT(ctl({"stop", "loop"}).status, testing::AnyOf(kOk, kWrongState));
   EXPECT_TRUE(wait_until([&] { return status_of("loop")["state"] == "inactive"; }));
+}
+
+TEST_F(Kplmstr, AHungDaemon_IsKilledAndStartedAgainWhereTheDefinitionAsksForPings) {
+  const std::string pings =
+      "restart = true\nping-interval = 0.05\nrestart-delay = 0.01\nstop-time = 0.2\nping-limit = ";
+  master.define_probe("hung", "socket", pings + "0.2\n", "silent");
+  master.define_probe("well", "socket", pings + "60\n");
+  master.start();
+  for (const char* name : {"hung", "well"}) ASSERT_EQ(ctl({"start", name}).status, kOk);
+  EXPECT_TRUE(master.wait_for_log("hung", "started as hung\ncancel\nstarted as hung\n"));
+  EXPECT_THAT(master.log("master"), HasSubstr("hung: hung (ping: hung has not answered within 0.2 s); SIGTERM"));
+  EXPECT_EQ(status_of("well")["restarts"], 0);
+}
+
+TEST_F(Kplmstr, WhatASubsystemWrites_IsLoggedSafelyAndItsEnvironmentIsItsOwn) {
+  const auto shell = [&](const std::string& name, const std::string& script, const std::string& more) {
+    master.define(
+        name, "program = \"/bin/sh\"\ntransport = \"signals\"\narguments = [\"-c\", '" + script + "']\n" + more);
+  };
+  shell("own",
+        "env; : > /dev/stderr; printf \"a\\033b%01000d\\n\" 0; ls /proc/self/fd | xargs echo descriptors; exec "
+        "sleep 999",
+        "environment = { COLOUR = \"red\" }\npass-environment = [\"TAKEN\"]\n");
+  shell("flood", "yes | head -100000", "");
+  setenv("TAKEN", "along", 1);
+  setenv("SECRET", "kept", 1);
+  master.start();
+  ASSERT_EQ(ctl({"start", "own"}).status, kOk);
+  ASSERT_EQ(ctl({"start", "flood"}).status, kOk);
+  EXPECT_TRUE(master.wait_for_log("master", "own says: descriptors 0 1 2 3\n"));  // 3: of ls itself
+  EXPECT_TRUE(master.wait_for_log("master", "lines of its output are left out"));
+  EXPECT_TRUE(wait_until([&] { return status_of("flood")["last_end"] == "exit status 0"; }));
+  const std::string log = master.log("master");
+  EXPECT_THAT(log, HasSubstr("serves"));  // nothing has truncated it
+  for (const char* line : {"own says: COLOUR=red\n", "own says: TAKEN=along\n", "own says: a?b000"}) {
+    EXPECT_THAT(log, HasSubstr(line));
+  }
+  EXPECT_THAT(log, Not(HasSubstr("SECRET")));
 }
 
 TEST_F(Kplmstr, StartThatCannotBe_IsAnsweredWithTheReason) {

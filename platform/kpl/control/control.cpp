@@ -10,6 +10,8 @@ namespace {
 
 using nlohmann::json;
 
+constexpr int kMaxDepth = 8;
+
 template <class Value>
 struct Named {
   Value value;
@@ -50,9 +52,15 @@ Value value_in(const Named<Value> (&table)[N], const std::string& name) {
   return found->value;
 }
 
+/// Depth costs stack where a value is written again.
+bool check_depth(int depth, json::parse_event_t, const json&) {
+  if (depth > kMaxDepth) throw Malformed("the packet is nested too deeply");
+  return true;
+}
+
 json parse(const std::string& packet) {
   if (packet.size() > kMaxPacket) throw Malformed("the packet is too long");
-  json message = json::parse(packet, nullptr, false);
+  json message = json::parse(packet, check_depth, false);
   if (!message.is_object()) throw Malformed("the packet is no JSON object");
   return message;
 }

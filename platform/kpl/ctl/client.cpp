@@ -15,7 +15,8 @@ using control::Answer;
 using control::End;
 using control::Result;
 
-constexpr double kMaxWait = 1e6;  // seconds
+constexpr double kMaxWait = 1e6;                        // seconds
+constexpr std::size_t kMaxAnswer = 16UL * 1024 * 1024;  // bytes, for one request
 
 bool is_readable(int fd, double seconds) {
   pollfd wanted{fd, POLLIN, 0};
@@ -68,6 +69,7 @@ End Client::exchange(const std::string& question, const Interim& interim, bool* 
     return not_reached();
   double patience = 0;
   std::string packet;
+  std::size_t bytes = 0;
   for (;;) {
     if (!is_readable(socket_.get(), patience + control::kPatience)) {
       return {Result::kNoAnswer, 0, "kplmstr does not answer"};
@@ -78,6 +80,8 @@ End Client::exchange(const std::string& question, const Interim& interim, bool* 
     if (length <= 0)
       return {Result::kNotReached, 0, "kplmstr has closed the connection: not permitted, too many, or it ended"};
     packet.resize(static_cast<std::size_t>(length));
+    bytes += packet.size();
+    if (bytes > kMaxAnswer) throw control::Malformed("its answer has no end");
     const Answer answer = control::decode_answer(packet);
     if (const End* end = std::get_if<End>(&answer)) {
       *ended = true;

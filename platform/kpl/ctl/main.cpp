@@ -1,7 +1,7 @@
 // kplctl: asks the KPL master.
-#include <algorithm>
 #include <cstdio>
 
+#include "common/printable.h"
 #include "ctl/client.h"
 #include "ctl/options.h"
 #include "ctl/output.h"
@@ -18,38 +18,26 @@ using nlohmann::json;
 constexpr int kExitFailure = 1;
 constexpr int kExitBadOption = 2;
 
-void print(FILE* to, const std::string& text) { fwrite(text.data(), 1, text.size(), to); }
-void print_json(const json& value) {
-  print(stdout, value.dump(2, ' ', false, json::error_handler_t::replace) + "\n");
+/// What subsystems say may come from their clients, and must not steer a terminal; nor must what claims to be the
+/// master.
+void print(FILE* to, const std::string& text) {
+  const std::string shown = platform::printable(text, "\n\t");
+  fwrite(shown.data(), 1, shown.size(), to);
 }
 
 Outcome ask(Client& client, const kpl::control::Request& request) {
   Outcome outcome;
   outcome.subsystem = request.subsystem;
-  outcome.end = client.ask(request, [&](const kpl::control::Answer& answer) {
-    if (const auto* message = std::get_if<kpl::control::Message>(&answer))
-      outcome.messages.push_back(message->text);
-    if (const auto* entry = std::get_if<kpl::control::Entry>(&answer)) outcome.entries.push_back(entry->subsystem);
-    const auto* lines = std::get_if<kpl::control::Lines>(&answer);
-    if (lines != nullptr) outcome.lines.insert(outcome.lines.end(), lines->lines.begin(), lines->lines.end());
-  });
+  outcome.end = client.ask(request, [&](const kpl::control::Answer& answer) { outcome.add(answer); });
   return outcome;
 }
 
-/// What subsystems say may come from their clients and must not steer a terminal.
-void print_text(FILE* to, std::string text) {
-  std::replace_if(
-      text.begin(), text.end(), [](unsigned char c) { return (c < 0x20 && c != '\n' && c != '\t') || c == 0x7f; },
-      '?');
-  print(to, text);
-}
-
 void print_for_people(const Outcome& outcome) {
-  for (const std::string& message : outcome.messages) print_text(stdout, message + "\n");
-  print_text(stdout, kpl::ctl::long_status(outcome.lines));
+  for (const std::string& message : outcome.messages) print(stdout, message + "\n");
+  print(stdout, kpl::ctl::long_status(outcome.lines));
   if (outcome.end.text.empty()) return;
   const bool good = outcome.end.result == Result::kOk;
-  print_text(good ? stdout : stderr, (good ? "" : "kplctl: ") + outcome.end.text + "\n");
+  print(good ? stdout : stderr, (good ? "" : "kplctl: ") + outcome.end.text + "\n");
 }
 
 kpl::control::End no_such_group(const std::string& group) {
@@ -60,7 +48,7 @@ kpl::control::End no_such_group(const std::string& group) {
 int tell_subsystems(Client& client, const Options& options) {
   Outcome outcome = ask(client, options.request);
   const auto in_other_group = [&](const json& entry) {
-    return !options.group.empty() && entry.value("group", "") != options.group;
+    return !options.group.empty() && kpl::ctl::name_of(entry, "group") != options.group;
   };
   std::erase_if(outcome.entries, in_other_group);
   if (!options.group.empty() && outcome.entries.empty() && outcome.end.result == Result::kOk) {
@@ -70,8 +58,8 @@ int tell_subsystems(Client& client, const Options& options) {
   if (options.json) {
     json answer = kpl::ctl::to_json(outcome);
     answer["subsystems"] = outcome.entries;
-    for (const char* unused : {"subsystem", "lines", "code"}) answer.erase(unused);
-    print_json(answer);
+    for (const char* unused : {"subsystem", "code"}) answer.erase(unused);
+    print(stdout, kpl::ctl::json_text(answer));
   } else if (outcome.end.result == Result::kOk) {
     print(stdout, list ? kpl::ctl::definition_table(outcome.entries) : kpl::ctl::status_table(outcome.entries));
   }
@@ -88,7 +76,7 @@ std::vector<std::string> names_of(Client& client, const Options& options, kpl::c
   const Outcome all = ask(client, list);
   std::vector<std::string> names;
   for (const json& entry : all.entries) {
-    if (entry.value("group", "") == options.group) names.push_back(entry.value("name", ""));
+    if (kpl::ctl::name_of(entry, "group") == options.group) names.push_back(kpl::ctl::name_of(entry, "name"));
   }
   *end = all.end;
   if (names.empty() && end->result == Result::kOk) {
@@ -97,27 +85,53 @@ std::vector<std::string> names_of(Client& client, const Options& options, kpl::c
   return names;
 }
 
+/// A stop and a start. One that does not run is just started; one that cannot be stopped is left alone.
+Outcome restart(Client& client, kpl::control::Request request) {
+  const Outcome stopped = ask(client, request);
+  if (stopped.end.result != Result::kOk && stopped.end.result != Result::kWrongState) {
+    Outcome failed = stopped;
+    failed.end.text = "not stopped, so not started: " + failed.end.text;
+    return failed;
+  }
+  request.action = Action::kStart;
+  Outcome started = ask(client, request);
+  if (stopped.end.result == Result::kOk) started.messages.insert(started.messages.begin(), stopped.end.text);
+  if (started.end.result == Result::kOk) return started;
+  started.end.text = "not started: " + started.end.text;
+  return started;
+}
+
+Outcome ask_one(Client& client, const Options& options, const std::string& name) {
+  kpl::control::Request request = options.request;
+  request.subsystem = name;
+  if (options.restart) return restart(client, request);
+  Outcome outcome = ask(client, request);
+  outcome.long_form = request.action == Action::kStatus;
+  if (!outcome.long_form || !options.json) return outcome;
+  request.long_form = false;
+  outcome.entries = ask(client, request).entries;
+  return outcome;
+}
+
 /// Asks one after the other; the first failure is the exit status.
 int ask_subsystems(Client& client, const Options& options) {
   kpl::control::End end;
   const std::vector<std::string> names = names_of(client, options, &end);
   std::vector<Outcome> outcomes;
   for (const std::string& name : names) {
-    kpl::control::Request request = options.request;
-    request.subsystem = name;
-    outcomes.push_back(ask(client, request));
+    outcomes.push_back(ask_one(client, options, name));
     if (end.result == Result::kOk) end.result = outcomes.back().end.result;
     if (!options.group.empty() && !options.json) print(stdout, name + ":\n");
     if (!options.json) print_for_people(outcomes.back());
   }
   if (names.empty()) {
-    outcomes.push_back({options.group, end, {}, {}, {}});
+    outcomes.push_back({options.group, end, {}, {}, {}, false});
     if (!options.json) print_for_people(outcomes.back());
   }
   if (!options.json) return static_cast<int>(end.result);
   json results = json::array();
   for (const Outcome& outcome : outcomes) results.push_back(kpl::ctl::to_json(outcome));
-  print_json({{"results", std::move(results)}});
+  print(stdout, kpl::ctl::json_text({{"results", std::move(results)}}));
   return static_cast<int>(end.result);
 }
 

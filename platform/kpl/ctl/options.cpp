@@ -29,14 +29,15 @@ void add_subsystem(CLI::App* command, Options& options) {
       ->excludes(name);
 }
 
-void add_stop(CLI::App& app, Options& options) {
-  CLI::App* stop = add_command(app, options, "stop", "Stop a subsystem and wait for its end", Action::kStop);
+CLI::App* add_stop(CLI::App& app, Options& options, const char* name, const char* help) {
+  CLI::App* stop = add_command(app, options, name, help, Action::kStop);
   CLI::Option* forced = stop->add_flag_callback(
       "--forced", [&options] { options.request.stop = StopKind::kForced; }, "Without its usual care");
   stop->add_flag_callback(
           "--cancel", [&options] { options.request.stop = StopKind::kCancel; }, "By SIGTERM, then SIGKILL")
       ->excludes(forced);
   add_subsystem(stop, options);
+  return stop;
 }
 
 void add_trace(CLI::App& app, Options& options) {
@@ -96,7 +97,9 @@ std::optional<Options> parse_options(int argc, const char* const* argv) {
   app.fallthrough();
   app.footer(kFooter);
   add_subsystem(add_command(app, options, "start", "Start a subsystem", Action::kStart), options);
-  add_stop(app, options);
+  add_stop(app, options, "stop", "Stop a subsystem and wait for its end");
+  add_stop(app, options, "restart", "Stop a subsystem if it runs, and start it")
+      ->parse_complete_callback([&options] { options.restart = true; });
   CLI::App* status =
       add_command(app, options, "status", "Tell the state of all subsystems, or of one", Action::kStatus);
   status->add_flag("--long", options.request.long_form, "What the subsystem itself tells");

@@ -13,7 +13,8 @@ struct Options {
   std::string socket_path = control::kDefaultSocketPath;
   bool json = false;
   control::Request request;
-  std::string group;  // of subsystems, in place of request.subsystem
+  bool restart = false;  // request is the stop before it
+  std::string group;     // of subsystems, in place of request.subsystem
 };
 
 /// Nothing: --help or --version was asked for and is answered on standard output. Throws platform::SettingError.

@@ -9,6 +9,9 @@ namespace {
 using nlohmann::json;
 using Row = std::vector<std::string>;
 
+constexpr double kMaxShownSeconds = 1e12;
+constexpr std::size_t kFullBody = 64;  // a body that fills its record goes on in the next one
+
 std::string padded(const std::string& text, std::size_t width) {
   return text + std::string(width > text.size() ? width - text.size() : 0, ' ');
 }
@@ -32,7 +35,7 @@ std::string text_of(const json& entry, const char* name) {
   const auto found = entry.find(name);
   if (found == entry.end()) return "-";
   if (found->is_boolean()) return found->get<bool>() ? "yes" : "no";
-  if (!found->is_string()) return found->dump();
+  if (!found->is_string()) return found->dump(-1, ' ', true, json::error_handler_t::replace);
   const auto text = found->get<std::string>();
   return text.empty() ? "-" : text;
 }
@@ -40,7 +43,7 @@ std::string text_of(const json& entry, const char* name) {
 std::string duration_of(const json& entry) {
   const auto found = entry.find("seconds");
   if (found == entry.end() || !found->is_number()) return "-";
-  const auto seconds = static_cast<std::int64_t>(found->get<double>());
+  const auto seconds = static_cast<std::int64_t>(std::clamp(found->get<double>(), 0.0, kMaxShownSeconds));
   const auto two = [](std::int64_t number) {
     return std::string(number < 10 ? "0" : "") + std::to_string(number);
   };
@@ -50,14 +53,52 @@ std::string duration_of(const json& entry) {
 
 std::string command_of(const json& entry) {
   std::string text = text_of(entry, "program");
-  const json arguments = entry.value("arguments", json::array());
-  for (const json& argument : arguments) {
+  const auto arguments = entry.find("arguments");
+  if (arguments == entry.end() || !arguments->is_array()) return text;
+  for (const json& argument : *arguments) {
     if (argument.is_string()) text += " " + argument.get<std::string>();
   }
   return text;
 }
 
+std::string trimmed(const std::string& text) {
+  const std::size_t first = text.find_first_not_of(' ');
+  return first == std::string::npos ? "" : text.substr(first, text.find_last_not_of(' ') - first + 1);
+}
+
+/// Lines without a margin belong to the field before them, and indented margins to the one that is not.
+json fields_of(const std::vector<control::Line>& lines) {
+  json fields = json::array();
+  json* last = nullptr;
+  bool full = false;
+  for (const control::Line& line : lines) {
+    const std::string name = trimmed(line.margin);
+    if (last != nullptr && name.empty()) {
+      (*last)["value"].get_ref<std::string&>() += (full ? "" : "\n") + line.body;
+    } else {
+      const bool inner = line.margin.starts_with(' ') && !fields.empty() && !name.empty();
+      json& list = inner ? fields.back()["fields"] : fields;
+      list.push_back({{"name", name}, {"value", line.body}});
+      last = &list.back();
+    }
+    full = line.body.size() == kFullBody;
+  }
+  return fields;
+}
+
 }  // namespace
+
+void Outcome::add(const control::Answer& answer) {
+  if (const auto* message = std::get_if<control::Message>(&answer)) messages.push_back(message->text);
+  if (const auto* entry = std::get_if<control::Entry>(&answer)) entries.push_back(entry->subsystem);
+  const auto* more = std::get_if<control::Lines>(&answer);
+  if (more != nullptr) lines.insert(lines.end(), more->lines.begin(), more->lines.end());
+}
+
+std::string name_of(const json& entry, const char* member) {
+  const auto found = entry.find(member);
+  return found != entry.end() && found->is_string() ? found->get<std::string>() : "";
+}
 
 std::string status_table(const std::vector<json>& entries) {
   std::vector<Row> rows = {{"Subsystem", "Group", "PID", "State", "Time", "Restarts", "Last end"}};
@@ -88,11 +129,19 @@ std::string long_status(const std::vector<control::Line>& lines) {
 }
 
 json to_json(const Outcome& outcome) {
-  json lines = json::array();
-  for (const control::Line& line : outcome.lines) lines.push_back({{"margin", line.margin}, {"body", line.body}});
-  return {{"subsystem", outcome.subsystem}, {"result", control::name_of(outcome.end.result)},
-          {"code", outcome.end.code},       {"text", outcome.end.text},
-          {"messages", outcome.messages},   {"lines", std::move(lines)}};
+  json result = {{"subsystem", outcome.subsystem},
+                 {"result", control::name_of(outcome.end.result)},
+                 {"code", outcome.end.code},
+                 {"text", outcome.end.text},
+                 {"messages", outcome.messages}};
+  if (!outcome.long_form) return result;
+  result["fields"] = fields_of(outcome.lines);
+  if (!outcome.entries.empty()) result["entry"] = outcome.entries.front();
+  return result;
+}
+
+std::string json_text(const json& value) {
+  return value.dump(2, ' ', true, json::error_handler_t::replace) + "\n";
 }
 
 }  // namespace kpl::ctl

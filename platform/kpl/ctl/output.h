@@ -16,7 +16,14 @@ struct Outcome {
   std::vector<std::string> messages;
   std::vector<control::Line> lines;
   std::vector<nlohmann::json> entries;
+  bool long_form = false;  // of a long status
+
+  /// An answer before the last one.
+  void add(const control::Answer& answer);
 };
+
+/// A member of an entry; empty when it is no text.
+std::string name_of(const nlohmann::json& entry, const char* member);
 
 /// Of `status` without --long: one line a subsystem.
 std::string status_table(const std::vector<nlohmann::json>& entries);
@@ -26,5 +33,7 @@ std::string definition_table(const std::vector<nlohmann::json>& entries);
 std::string long_status(const std::vector<control::Line>& lines);
 
 nlohmann::json to_json(const Outcome& outcome);
+/// In ASCII: nothing in it steers a terminal.
+std::string json_text(const nlohmann::json& value);
 
 }  // namespace kpl::ctl

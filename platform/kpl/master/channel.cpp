@@ -84,7 +84,7 @@ class QueueChannel : public Channel {
     const int found = msgget(key, 0);
     msqid_ds state{};
     if (found < 0 || msgctl(found, IPC_STAT, &state) != 0) return -1;
-    if (state.msg_perm.cuid != 0 || (state.msg_perm.mode & 0777) != kMode) {
+    if (state.msg_perm.cuid != 0 || state.msg_perm.uid != 0 || (state.msg_perm.mode & 0777) != kMode) {
       throw ChannelError("the message queue " + name(key) + " is in use by user " +
                          std::to_string(state.msg_perm.cuid));
     }

@@ -1,5 +1,8 @@
 #include "master/definition.h"
 
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <cctype>
 #include <cstring>
@@ -81,13 +84,40 @@ Problem set_signal(const toml::value& value, int* signal) {
   return "must be the name of a signal, such as \"SIGUSR1\"";
 }
 
-Problem set_arguments(const toml::value& value, std::vector<std::string>* arguments) {
+Problem set_texts(const toml::value& value, std::vector<std::string>* texts) {
   if (!value.is_array()) return "must be a list of texts in quotes";
   for (const toml::value& one : value.as_array()) {
-    Problem problem = set_text(one, &arguments->emplace_back());
+    Problem problem = set_text(one, &texts->emplace_back());
     if (!problem.empty()) return "each " + problem;
   }
   return {};
+}
+
+/// KPL's own say what the subsystem is to the next master, and where it asks this one.
+Problem variable_problem(const std::string& name) {
+  const auto allowed = [](unsigned char c) { return std::isalnum(c) || c == '_'; };
+  const bool fine = !name.empty() && !std::isdigit(static_cast<unsigned char>(name[0])) &&
+                    std::all_of(name.begin(), name.end(), allowed);
+  if (!fine) return "names are made of letters, digits and '_'";
+  return name.starts_with("KPL_") ? "'" + name + "' is set by kplmstr" : "";
+}
+
+Problem set_environment(const toml::value& value, std::map<std::string, std::string>* environment) {
+  if (!value.is_table()) return "must be a table of names and texts in quotes";
+  for (const auto& [name, text] : value.as_table()) {
+    Problem problem = variable_problem(name);
+    if (problem.empty()) problem = set_text(text, &(*environment)[name]);
+    if (!problem.empty()) return problem;
+  }
+  return {};
+}
+
+Problem set_pass_environment(const toml::value& value, std::vector<std::string>* names) {
+  Problem problem = set_texts(value, names);
+  for (auto name = names->begin(); problem.empty() && name != names->end(); ++name) {
+    problem = variable_problem(*name);
+  }
+  return problem;
 }
 
 Problem set_transport(const toml::value& value, Transport* transport) {
@@ -112,9 +142,11 @@ constexpr Setting kSettings[] = {
     {"name", [](Definition& d, Value v) { return set_name(v, &d.name); }},
     {"group", [](Definition& d, Value v) { return set_name(v, &d.group); }},
     {"program", [](Definition& d, Value v) { return set_path(v, &d.program); }},
-    {"arguments", [](Definition& d, Value v) { return set_arguments(v, &d.arguments); }},
+    {"arguments", [](Definition& d, Value v) { return set_texts(v, &d.arguments); }},
     {"user", [](Definition& d, Value v) { return set_text(v, &d.user); }},
     {"output", [](Definition& d, Value v) { return set_path(v, &d.output); }},
+    {"environment", [](Definition& d, Value v) { return set_environment(v, &d.environment); }},
+    {"pass-environment", [](Definition& d, Value v) { return set_pass_environment(v, &d.pass_environment); }},
     {"autostart", [](Definition& d, Value v) { return set_truth(v, &d.autostart); }},
     {"restart", [](Definition& d, Value v) { return set_truth(v, &d.restart); }},
     {"transport", [](Definition& d, Value v) { return set_transport(v, &d.transport); }},
@@ -126,6 +158,8 @@ constexpr Setting kSettings[] = {
     {"stop-time", [](Definition& d, Value v) { return set_seconds(v, &d.stop_time); }},
     {"restart-delay", [](Definition& d, Value v) { return set_seconds(v, &d.restart_delay); }},
     {"restart-delay-max", [](Definition& d, Value v) { return set_seconds(v, &d.restart_delay_max); }},
+    {"ping-interval", [](Definition& d, Value v) { return set_seconds(v, &d.ping_interval.emplace()); }},
+    {"ping-limit", [](Definition& d, Value v) { return set_seconds(v, &d.ping_limit); }},
 };
 
 void apply(const std::string& name, const toml::value& value, Definition& definition) {
@@ -157,6 +191,12 @@ void check(const toml::value& file, const Definition& definition) {
     refuse("normal-signal", "signals");
     refuse("forced-signal", "signals");
   }
+  if (!definition.ping_interval && file.contains("ping-limit")) {
+    throw SettingError(place_of(file.at("ping-limit")) + ": ping-limit: needs a 'ping-interval' too");
+  }
+  if (definition.ping_interval && definition.transport == Transport::kSignals) {
+    throw SettingError(place_of(file.at("ping-interval")) + ": ping-interval: signals carry no pings");
+  }
 }
 
 /// What no two subsystems may have: each makes its queue anew when it starts.
@@ -168,6 +208,24 @@ void check_shared(const Definition& definition, const Definition& other) {
   if (definition.queue_key != 0 && definition.queue_key == other.queue_key) {
     refuse("queue-key: " + std::to_string(definition.queue_key));
   }
+}
+
+Definition definition_of(const toml::value& content, const std::string& file) {
+  Definition definition;
+  definition.file = file;
+  for (const auto& [name, value] : content.as_table()) apply(name, value, definition);
+  check(content, definition);
+  return definition;
+}
+
+/// What others could change would run as root at their word.
+void check_owner(const std::string& path) {
+  struct stat found {};
+  if (stat(path.c_str(), &found) != 0) return;  // told where it is read
+  const bool trusted = found.st_uid == 0 || found.st_uid == geteuid();
+  if (!trusted) throw SettingError(path + ": belongs to user " + std::to_string(found.st_uid) + ", not to root");
+  if ((found.st_mode & (S_IWGRP | S_IWOTH)) == 0) return;
+  throw SettingError(path + ": can be written by others than root (chmod go-w)");
 }
 
 std::vector<std::string> toml_files(const std::string& folder) {
@@ -202,18 +260,19 @@ Definition read_definition(const std::string& file) {
   if (std::filesystem::exists(std::filesystem::file_status(type)) && type != std::filesystem::file_type::regular) {
     throw SettingError(file + ": is no regular file");  // to read a pipe might never end
   }
-  const toml::value content = platform::parse_toml_file(file);
-  Definition definition;
-  definition.file = file;
-  for (const auto& [name, value] : content.as_table()) apply(name, value, definition);
-  check(content, definition);
-  return definition;
+  return definition_of(platform::parse_toml_file(file), file);
+}
+
+Definition parse_definition(const std::string& content, const std::string& file) {
+  return definition_of(platform::parse_toml(content, file), file);
 }
 
 Folder read_folder(const std::string& folder) {
   Folder result;
+  check_owner(folder);
   for (const std::string& file : toml_files(folder)) {
     try {
+      check_owner(file);
       Definition definition = read_definition(file);
       for (const Definition& other : result.definitions) check_shared(definition, other);
       result.definitions.push_back(std::move(definition));

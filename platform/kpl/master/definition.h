@@ -4,6 +4,8 @@
 
 #include <chrono>
 #include <csignal>
+#include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -24,7 +26,9 @@ struct Definition {
   std::string program;
   std::vector<std::string> arguments;
   std::string user = "root";  // name or number
-  std::string output;         // file for what it writes; empty: the master's standard error
+  std::string output;         // file for what it writes; empty: the master's log
+  std::map<std::string, std::string> environment;
+  std::vector<std::string> pass_environment;  // names; the values are the master's
   bool autostart = false;
   bool restart = false;  // after an end that nobody asked for
   Transport transport = Transport::kSocket;
@@ -36,10 +40,14 @@ struct Definition {
   Duration stop_time{20'000};     // for the end after a stop request
   Duration restart_delay{1'000};  // before the first restart; doubles with each crash
   Duration restart_delay_max{60'000};
+  std::optional<Duration> ping_interval;  // nothing: no pings
+  Duration ping_limit{10'000};            // for its answer; after that it counts as hung
 };
 
 /// Throws platform::SettingError: "FILE:LINE: what", or "FILE: what".
 Definition read_definition(const std::string& file);
+/// The same of a file's content.
+Definition parse_definition(const std::string& content, const std::string& file);
 
 struct Folder {
   struct Skipped {
@@ -51,7 +59,8 @@ struct Folder {
 };
 
 /// All files *.toml of the folder. A broken one, or one whose name or queue was taken before it, is skipped.
-/// Throws platform::SettingError: the folder cannot be read.
+/// Throws platform::SettingError: the folder cannot be read. Folder and files are to be root's, or this user's,
+/// alone.
 Folder read_folder(const std::string& folder);
 
 }  // namespace kpl::master

@@ -11,13 +11,11 @@
 #include <charconv>
 #include <csignal>
 #include <cstring>
-#include <string_view>
+#include <set>
 #include <vector>
 
 #include "kpl.h"
 #include "master/left_behind.h"
-
-extern char** environ;
 
 namespace kpl::master {
 namespace {
@@ -35,7 +33,8 @@ struct Failure {
 
 /// Made before the fork: between fork and exec nothing may allocate.
 struct Plan {
-  std::vector<std::string> texts;
+  std::vector<std::string> arguments;
+  std::vector<std::string> environment;
   std::vector<char*> argv;
   std::vector<char*> envp;
   char* pid_text = nullptr;  // where the new process puts its id
@@ -44,7 +43,7 @@ struct Plan {
   gid_t gid = 0;
   std::vector<gid_t> groups;
   Descriptor null;
-  Descriptor output;  // empty: the master's own
+  Descriptor output;  // the definition's file
 };
 
 /// Null: there is none. Good until the next call.
@@ -69,22 +68,34 @@ void plan_user(const Definition& definition, Plan& plan) {
   plan.groups.resize(static_cast<std::size_t>(count));
 }
 
-void plan_texts(const Definition& definition, const std::string& status_socket, Plan& plan) {
-  const std::string master = KPL_MASTER_ENV "=";
-  const std::string identity = std::string(kIdentityVariable) + "=";
-  plan.texts = {master + status_socket, identity + definition.name + ":", definition.program};
-  plan.texts.insert(plan.texts.end(), definition.arguments.begin(), definition.arguments.end());
-  plan.texts[1].append(kPidDigits, '\0');
-  for (std::size_t i = 2; i < plan.texts.size(); ++i) plan.argv.push_back(plan.texts[i].data());
-  plan.argv.push_back(nullptr);
-  for (char** one = environ; *one != nullptr; ++one) {
-    const std::string_view text = *one;
-    if (!text.starts_with(master) && !text.starts_with(identity)) plan.envp.push_back(*one);
+/// PATH and LANG are the master's, unless the definition says otherwise.
+std::vector<std::string> environment_of(const Definition& definition) {
+  std::vector<std::string> texts;
+  for (const auto& [name, value] : definition.environment) texts.push_back(name + "=" + value);
+  std::vector<std::string> passed = definition.pass_environment;
+  passed.insert(passed.end(), {"PATH", "LANG"});
+  std::set<std::string> done;
+  for (const std::string& name : passed) {
+    const char* value = getenv(name.c_str());
+    if (value == nullptr || definition.environment.contains(name) || !done.insert(name).second) continue;
+    texts.push_back(name + "=" + value);
   }
-  plan.envp.push_back(plan.texts[0].data());
-  plan.envp.push_back(plan.texts[1].data());
+  return texts;
+}
+
+void plan_texts(const Definition& definition, const std::string& status_socket, Plan& plan) {
+  plan.environment = environment_of(definition);
+  plan.environment.push_back(KPL_MASTER_ENV "=" + status_socket);
+  plan.environment.push_back(std::string(kIdentityVariable) + "=" + definition.name + ":");
+  std::string& identity = plan.environment.back();
+  identity.append(kPidDigits, '\0');
+  for (std::string& text : plan.environment) plan.envp.push_back(text.data());
   plan.envp.push_back(nullptr);
-  plan.pid_text = plan.texts[1].data() + plan.texts[1].size() - kPidDigits;
+  plan.pid_text = identity.data() + identity.size() - kPidDigits;
+  plan.arguments = definition.arguments;
+  plan.arguments.insert(plan.arguments.begin(), definition.program);
+  for (std::string& text : plan.arguments) plan.argv.push_back(text.data());
+  plan.argv.push_back(nullptr);
 }
 
 void plan_files(const Definition& definition, Plan& plan) {
@@ -116,12 +127,13 @@ void reset_signals(const sigset_t& mask) {
   sigprocmask(SIG_SETMASK, &mask, nullptr);
 }
 
-[[noreturn]] void become(const Plan& plan, int request_end, int report, const sigset_t& mask) {
+[[noreturn]] void become(const Plan& plan, const Given& given, int report, const sigset_t& mask) {
   std::to_chars(plan.pid_text, plan.pid_text + kPidDigits - 1, getpid());
   if (setsid() < 0) give_up(report, Failure::kSession);
-  const int output = plan.output ? plan.output.get() : STDERR_FILENO;
-  if (dup2(request_end >= 0 ? request_end : plan.null.get(), STDIN_FILENO) < 0 ||
-      dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0) {
+  const int output = plan.output ? plan.output.get() : given.output_end;
+  if (dup2(given.request_end >= 0 ? given.request_end : plan.null.get(), STDIN_FILENO) < 0 ||
+      dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0 ||
+      close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC) != 0) {
     give_up(report, Failure::kDescriptors);
   }
   if (plan.change_user &&
@@ -141,10 +153,10 @@ std::optional<uid_t> user_id(const Definition& definition) {
   return user->pw_uid;
 }
 
-Launched launch(const Definition& definition, int request_end, const std::string& status_socket) {
+Launched launch(const Definition& definition, const Given& given) {
   Plan plan;
   plan_user(definition, plan);
-  plan_texts(definition, status_socket, plan);
+  plan_texts(definition, given.status_socket, plan);
   plan_files(definition, plan);
   std::array<int, 2> report{};
   if (pipe2(report.data(), O_CLOEXEC) != 0)
@@ -158,7 +170,7 @@ Launched launch(const Definition& definition, int request_end, const std::string
   sigfillset(&all);
   sigprocmask(SIG_SETMASK, &all, &before);
   const pid_t pid = fork();
-  if (pid == 0) become(plan, request_end, writer.get(), before);
+  if (pid == 0) become(plan, given, writer.get(), before);
   const int error = errno;
   sigprocmask(SIG_SETMASK, &before, nullptr);
   if (pid < 0) throw LaunchError(std::string("cannot make a process: ") + strerror(error));

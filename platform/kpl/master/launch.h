@@ -27,11 +27,18 @@ struct Launched {
 /// The definition's user; nothing: there is none of that name.
 std::optional<uid_t> user_id(const Definition& definition);
 
-/// Forks a process that leads a session of its own, has `request_end` (-1: /dev/null) on descriptor 0, the
-/// definition's user, and the master's environment with KPL_MASTER_SOCKET, and becomes the definition's program.
+/// What a subsystem's process is given of its master.
+struct Given {
+  int request_end = -1;  // becomes descriptor 0; -1: /dev/null does
+  int output_end = -1;   // becomes descriptors 1 and 2; -1: the definition's file does
+  const std::string& status_socket;
+};
+
+/// Forks a process that leads a session of its own, has the definition's user, environment and output, and no
+/// descriptors but 0 to 2, and becomes the definition's program.
 /// With a request channel a user other than root gets 0 as its group, which the channel demands of a subsystem.
 /// Throws LaunchError. Other threads may run: the new process calls nothing that waits for them.
-Launched launch(const Definition& definition, int request_end, const std::string& status_socket);
+Launched launch(const Definition& definition, const Given& given);
 
 /// How it went: nothing while that is not known, empty text when the program runs, else why it does not.
 std::optional<std::string> launch_result(const Definition& definition, int report);

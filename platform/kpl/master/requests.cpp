@@ -16,10 +16,11 @@ using control::Result;
 using platform::Descriptor;
 
 constexpr std::size_t kMaxWaiting = 100;
+constexpr std::size_t kMaxLate = 64;
 constexpr std::size_t kMaxPacket = sizeof(kplhdr) + 80 * sizeof(statcode);
 constexpr int kPacketsAtOnce = 32;  // before others are served again
 
-/// A socket with an address that the kernel chooses, for one answer: what comes late finds nobody.
+/// A socket with an address that the kernel chooses, for one answer.
 Descriptor open_reply_socket(sockaddr_un* address) {
   Descriptor made(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   const int on = 1;
@@ -104,6 +105,7 @@ struct Requests::Pending {
   Question question;
   Reply reply;
   Event late;
+  std::optional<Duration> once_sent;  // the limit, where it counts from then
   bool sent = false;
   Descriptor socket;
   std::optional<Event> readable;  // goes before the socket
@@ -118,12 +120,26 @@ void Requests::ask(const Question& question, Duration limit, Reply reply) {
   if (waiting_.size() >= kMaxWaiting) {
     return reply(End{Result::kNoAnswer, 0, "too many requests wait for " + name_});
   }
+  const auto place = add(question, limit, std::move(reply));
+  (*place)->late.arm(limit);
+  if (waiting_.size() == 1) send_first();
+}
+
+void Requests::ping(Duration limit, std::function<void(const End&)> told) {
+  const auto place =
+      add({KPL_ACTION_PING, 0, 0, {}}, limit, [told = std::move(told)](const control::Answer& answer) {
+        if (const End* end = std::get_if<End>(&answer)) told(*end);
+      });
+  (*place)->once_sent = limit;
+  if (waiting_.size() == 1) send_first();
+}
+
+Requests::Place Requests::add(const Question& question, Duration limit, Reply reply) {
   const auto place = waiting_.emplace(waiting_.end());
   *place = std::make_unique<Pending>(loop_, question, std::move(reply), [this, place, limit] {
     finish(place, End{Result::kNoAnswer, 0, name_ + " has not answered within " + in_seconds(limit)});
   });
-  (*place)->late.arm(limit);
-  if (waiting_.size() == 1) send_first();
+  return place;
 }
 
 void Requests::end_all() {
@@ -140,7 +156,9 @@ void Requests::end_all() {
 void Requests::send_first() {
   while (!ended_ && !waiting_.empty() && !waiting_.front()->sent) {
     const std::string problem = send(*waiting_.front());
-    if (!problem.empty()) drop(waiting_.begin(), End{Result::kNoAnswer, 0, problem});
+    if (problem.empty()) return;
+    waiting_.front()->sent = false;
+    drop(waiting_.begin(), End{Result::kNoAnswer, 0, problem});
   }
 }
 
@@ -156,6 +174,7 @@ std::string Requests::send(Pending& first) {
   name_.copy(request.subreq.objname, sizeof request.subreq.objname);
   first.readable.emplace(loop_, first.socket.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
   first.sent = true;
+  if (first.once_sent) first.late.arm(*first.once_sent);
   switch (channel_.send(request, first.question.data)) {
     case Channel::Sent::kDone:
       return {};
@@ -194,6 +213,9 @@ bool Requests::on_packet(const char* packet, std::size_t length) {
   if (header.cont == KPL_CONT_STATUS) first.reply(lines_in(packet, length));
   if (header.cont == KPL_CONT_MESSAGE) first.reply(control::Message{message_in(packet, length)});
   if (header.cont != KPL_CONT_END || length < sizeof(kplhdr) + sizeof(short)) return false;
+  late_.clear();  // it answers in order: what was asked before it has done with
+  first.readable.reset();
+  first.socket = Descriptor();
   finish(waiting_.begin(), end_in(name_, packet, length));
   return true;
 }
@@ -203,9 +225,17 @@ void Requests::finish(Place which, const End& end) {
   send_first();
 }
 
+/// The socket of a request that was sent and not answered keeps its address, or a stranger could take it and be
+/// told what comes late.
 void Requests::drop(Place which, const End& end) {
   const auto dropped = std::move(*which);
   waiting_.erase(which);
+  dropped->readable.reset();
+  if (dropped->sent && dropped->socket) {
+    shutdown(dropped->socket.get(), SHUT_RD);                  // the subsystem is told at once that nobody reads
+    if (late_.size() == kMaxLate) late_.erase(late_.begin());  // it reads its requests and never answers
+    late_.push_back(std::move(dropped->socket));
+  }
   dropped->reply(end);
 }
 

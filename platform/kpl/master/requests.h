@@ -6,7 +6,9 @@
 #include <functional>
 #include <list>
 #include <memory>
+#include <optional>
 #include <string>
+#include <vector>
 
 #include "control/control.h"
 #include "master/channel.h"
@@ -35,6 +37,9 @@ class Requests {
 
   /// `limit`: for the last answer, waiting for other requests included.
   void ask(const Question& question, Duration limit, Reply reply);
+  /// Asks for nothing, after the requests that wait. Told the End of the answer; Result::kNoAnswer says why the
+  /// subsystem is taken for hung. `limit` counts from when it is sent: a request before it may take its own time.
+  void ping(Duration limit, std::function<void(const control::End&)> told);
   /// Answers all that wait: the subsystem is gone, and nothing is asked any more.
   void end_all();
 
@@ -42,6 +47,7 @@ class Requests {
   struct Pending;
   using Place = std::list<std::unique_ptr<Pending>>::iterator;
 
+  Place add(const Question& question, Duration limit, Reply reply);
   void send_first();
   /// Empty text: done.
   std::string send(Pending& first);
@@ -57,6 +63,7 @@ class Requests {
   const pid_t pid_;
   bool ended_ = false;
   std::list<std::unique_ptr<Pending>> waiting_;  // only the first one has been sent
+  std::vector<platform::Descriptor> late_;       // sockets whose answers may still come, but count no more
 };
 
 }  // namespace kpl::master

@@ -74,8 +74,9 @@ void Subsystem::take_definition() {
 std::string Subsystem::try_launch() try {
   auto process = std::make_unique<Process>();
   process->channel = open_channel(definition_);
-  const int end = process->channel ? process->channel->subsystem_end() : -1;
-  Launched launched = launch(definition_, end, around_.status_socket);
+  const platform::Descriptor output = definition_.output.empty() ? open_output() : platform::Descriptor();
+  const int request_end = process->channel ? process->channel->subsystem_end() : -1;
+  Launched launched = launch(definition_, {request_end, output.get(), around_.status_socket});
   process->pid = launched.pid;
   process->since = Clock::now();
   process->report = std::move(launched.report);
@@ -94,6 +95,13 @@ std::string Subsystem::try_launch() try {
   return error.what();
 }
 
+platform::Descriptor Subsystem::open_output() {
+  OutputLog& made = outputs_.emplace_back(around_.loop, around_.log, definition_.name, [this] {
+    outputs_.remove_if([](const OutputLog& output) { return output.is_over(); });
+  });
+  return made.take_subsystem_end();
+}
+
 void Subsystem::on_report() {
   const std::optional<std::string> problem = launch_result(definition_, process_->report.get());
   if (!problem) return;
@@ -101,11 +109,37 @@ void Subsystem::on_report() {
   launch_problem_ = *problem;
   if (!launch_problem_.empty()) return;  // the process ends now
   if (state_ == State::kStarting) state_ = State::kActive;
+  if (definition_.ping_interval) ping_later();
   around_.log.info("{}: started, pid {}", definition_.name, process_->pid);
   if (!starter_) return;
   const Reply reply = std::move(*starter_);
   starter_.reset();
   reply(End{Result::kOk, 0, definition_.name + " started, pid " + std::to_string(pid())});
+}
+
+// ------------------------------------------------------------------------------------------------------ pings
+
+void Subsystem::ping_later() {
+  process_->next_ping.emplace(around_.loop, [this] { on_ping_time(); });
+  process_->next_ping->arm(*definition_.ping_interval);
+}
+
+void Subsystem::on_ping_time() {
+  if (state_ != State::kActive) return ping_later();
+  process_->requests->ping(definition_.ping_limit, [this](const End& end) { on_ping_answer(end); });
+}
+
+void Subsystem::on_ping_answer(const End& end) {
+  if (!process_) return;  // it has ended meanwhile
+  if (end.result != Result::kNoAnswer) return ping_later();
+  process_->hung = "hung (ping: " + end.text + ")";
+  around_.log.error("{}: {}; SIGTERM", definition_.name, process_->hung);
+  kill(pid(), SIGTERM);
+  process_->kill_late.emplace(around_.loop, [this] {
+    around_.log.warn("{} has not ended within its stop-time; SIGKILL", definition_.name);
+    kill(pid(), SIGKILL);
+  });
+  process_->kill_late->arm(definition_.stop_time);
 }
 
 // --------------------------------------------------------------------------------------------------- its end
@@ -117,6 +151,7 @@ void Subsystem::ended(int status) {
   const bool stable = Clock::now() - process->since > definition_.restart_delay_max;
   if (stable) next_delay_ = definition_.restart_delay;
   last_end_ = launch_problem_.empty() ? text_of_end(status) : launch_problem_;
+  if (!process->hung.empty()) last_end_ = process->hung + ", " + last_end_;
   state_ = State::kInactive;
   if (process->requests) process->requests->end_all();
   while (!stops_.empty()) {

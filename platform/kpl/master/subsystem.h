@@ -6,6 +6,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <list>
 #include <map>
 #include <memory>
 #include <optional>
@@ -16,6 +17,7 @@
 #include "master/definition.h"
 #include "master/launch.h"
 #include "master/loop.h"
+#include "master/output_log.h"
 #include "master/requests.h"
 
 namespace kpl::master {
@@ -37,6 +39,7 @@ struct Surroundings {
 ///   waiting  | -> starting  | -            | -                    | inactive | -                     | starting
 ///
 /// (1) The process says why and ends; only its end counts. A first start that fails is not tried again.
+/// One that does not answer a ping in its time is killed; that it was counts as any other crash.
 /// (2) Waiting where the definition says restart and is still there. The delay doubles from crash to crash; a run
 ///     that was longer than the longest delay starts over with the shortest.
 /// A stop that the subsystem refuses leads back to active.
@@ -77,6 +80,9 @@ class Subsystem {
   struct Process {
     pid_t pid;
     Clock::time_point since;
+    std::optional<Event> next_ping;  // goes after the requests, which end the ping under way
+    std::string hung;                // why it is being killed; empty: it is not
+    std::optional<Event> kill_late;
     std::unique_ptr<Channel> channel;
     std::unique_ptr<Requests> requests;  // null: signals
     platform::Descriptor report;
@@ -93,7 +99,12 @@ class Subsystem {
   void take_definition();
   /// Empty text: the process is made.
   std::string try_launch();
+  /// A pipe for what it writes.
+  platform::Descriptor open_output();
   void on_report();
+  void ping_later();
+  void on_ping_time();
+  void on_ping_answer(const control::End& end);
   void on_delay_over();
   void on_stop_late(StopId which, control::StopKind kind);
   void send_stop(control::StopKind kind, StopId which);
@@ -108,6 +119,7 @@ class Subsystem {
   Surroundings around_;
   State state_ = State::kInactive;
   std::unique_ptr<Process> process_;
+  std::list<OutputLog> outputs_;  // each until nobody can write there, which may be after the process's end
   std::string launch_problem_;    // of the process that could not become the program
   std::optional<Reply> starter_;  // waits for the program to run
   std::map<StopId, Stop> stops_;  // wait for the end
