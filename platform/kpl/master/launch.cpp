@@ -132,10 +132,11 @@ void reset_signals(const sigset_t& mask) {
   if (setsid() < 0) give_up(report, Failure::kSession);
   const int output = plan.output ? plan.output.get() : given.output_end;
   if (dup2(given.request_end >= 0 ? given.request_end : plan.null.get(), STDIN_FILENO) < 0 ||
-      dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0 ||
-      close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC) != 0) {
+      dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0) {
     give_up(report, Failure::kDescriptors);
   }
+  // For what the master itself was given; its own are closed on exec anyway, so a kernel without this is no obstacle.
+  close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);
   if (plan.change_user &&
       (setgroups(plan.groups.size(), plan.groups.data()) != 0 || setgid(plan.gid) != 0 || setuid(plan.uid) != 0)) {
     give_up(report, Failure::kUser);
