@@ -54,9 +54,10 @@ class MemoryTransport : public Transport {
 };
 
 struct MemoryDaemon {
-  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20)
-      : layer({1, queue_bound},
-              {transport, ordering, [this] { return time; }, [this] { return ++last_random; }, logger}) {
+  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20, const Limits& limits = {})
+      : layer({.node_number = 1, .queue_bound = queue_bound, .engine = limits},
+              {transport, ordering, [this] { return time; }, [this] { return ++last_random; }, logger,
+               [this] { work_left = true; }}) {
     logger->set_level(spdlog::level::trace);
   }
 
@@ -77,6 +78,12 @@ struct MemoryDaemon {
     }
     time = end;
   }
+  /// One round of the loop in which nothing else is ready. False: nothing was left to do.
+  bool continue_work() {
+    if (!std::exchange(work_left, false)) return false;
+    layer.continue_work();
+    return true;
+  }
   bool closed(ConnectionId id) const { return transport.wires.at(id).closed; }
   bool logged(const std::string& text) const { return log.str().find(text) != std::string::npos; }
 
@@ -88,6 +95,7 @@ struct MemoryDaemon {
   Time time{1'000'000};
   std::uint64_t last_random = 0;
   ConnectionId last_connection = 0;
+  bool work_left = false;
   SessionLayer layer;
 };
 

@@ -207,7 +207,8 @@ class DaemonConfig : public testing::Test {
     return path_;
   }
   static auto values(const Options& o) {
-    return std::tuple(o.socket_path, o.access_group, o.node_number, o.queue_bound, o.log_level, o.log_file);
+    return std::tuple(o.socket_path, o.access_group, o.node_number, o.queue_bound, o.log_level, o.log_file,
+                      o.engine.session_bytes, o.engine.user_bytes, o.engine.total_bytes, o.engine.max_phase_time);
   }
 
   TempDir dir_;
@@ -247,11 +248,13 @@ TEST_F(DaemonConfig, WrongOptionOrFile_IsOneLineAndStatusTwo) {
 TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const std::string path = write(
       "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\n"
-      "log-level = \"debug\"\nlog-file = \"/tmp/log\"\n");
+      "log-level = \"debug\"\nlog-file = \"/tmp/log\"\nsession-state-bound = 2_000_000\n"
+      "user-state-bound = 3_000_000\nstate-bound = 4_000_000\nmax-phase-time = 300\n");
   const char* argv[] = {"gsd", "--config", path.c_str(), "--node-number", "13"};
   const auto options = parse_options(5, argv);
   ASSERT_TRUE(options);
-  EXPECT_EQ(values(*options), std::tuple("/tmp/x", "0", 13u, 100'000u, spdlog::level::debug, "/tmp/log"));
+  EXPECT_EQ(values(*options), std::tuple("/tmp/x", "0", 13u, 100'000u, spdlog::level::debug, "/tmp/log",
+                                         2'000'000u, 3'000'000u, 4'000'000u, 300));
 }
 
 TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
@@ -259,6 +262,7 @@ TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
   changed.socket_path = changed.access_group = changed.log_file = "changed";
   changed.node_number = 99;
   changed.queue_bound = 0;
+  changed.engine = {1, 1, 1, 1, 1};
   changed.log_level = spdlog::level::off;
   const Options defaults;
   EXPECT_EQ(values(read_config(SAMPLE_CONFIG, changed)), values(defaults));
@@ -273,6 +277,10 @@ TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
       {"access\\-group", "Default: none"},
       {"node\\-number", "Default: " + std::to_string(defaults.node_number) + "."},
       {"queue\\-bound", "Default: " + std::to_string(defaults.queue_bound) + "."},
+      {"session\\-state\\-bound", "Default: " + std::to_string(defaults.engine.session_bytes) + "."},
+      {"user\\-state\\-bound", "Default: " + std::to_string(defaults.engine.user_bytes) + "."},
+      {"state\\-bound", "Default: " + std::to_string(defaults.engine.total_bytes) + "."},
+      {"max\\-phase\\-time", "Default: " + std::to_string(defaults.engine.max_phase_time) + ";"},
       {"log\\-file", "Default: none"},
       {"log\\-level", "Default: " + level + "."}};
   for (const auto& [option, text] : entries) {

@@ -249,6 +249,36 @@ TEST_F(DaemonSession, GroupsThatAreGoneLongBeforeTheirTimeLimit_LeaveNoTimersBeh
   EXPECT_LT(daemon_.layer.phase_timers(), 100u);
 }
 
+TEST_F(DaemonSession, PhaseThatWaitsAMinute_IsWarnedOfOnceWithTheFirstOfThoseWhoAreMissing) {
+  MemoryClient client(daemon_);
+  for (std::int16_t i = 1; i <= 11; ++i) ASSERT_EQ(client.join(i, i), WYX_OK);
+  ASSERT_EQ(client.call(MessageRequest{1, {WYX_N_PHASE, 0}, "m"}), WYX_OK);
+  ASSERT_EQ(client.call(VoteRequest{1, WYX_VOTE_APPROVE, {}, {}}), WYX_OK);
+  daemon_.pass(59s);
+  EXPECT_FALSE(daemon_.logged("has waited"));
+  daemon_.pass(3600s);
+  const std::string warning = "group \"group\": phase 1 of a message protocol has waited 60 s for the votes of ";
+  EXPECT_TRUE(daemon_.logged(warning + "\"\" (2@1, session 1 (\"client\", pid 4711, uid 1000)), \"\" (3@1"));
+  EXPECT_TRUE(daemon_.logged("and 2 more\n"));
+  EXPECT_EQ(daemon_.log.str().find(warning), daemon_.log.str().rfind(warning));
+}
+
+TEST_F(DaemonSession, ClientWithProvidersInManyGroupsDies_OthersAreServedBeforeAllIsTold) {
+  MemoryClient survivor(daemon_), dying(daemon_);
+  for (std::int16_t i = 1; i <= 1000; ++i) {
+    ASSERT_EQ(survivor.join(i, 1, "g" + std::to_string(i)), WYX_OK);
+    ASSERT_EQ(dying.join(i, 2, "g" + std::to_string(i)), WYX_OK);
+  }
+  told(survivor);
+  daemon_.layer.lost(dying.event, "gone");
+  std::size_t heard = told(survivor).size();
+  EXPECT_LT(heard, 1000u);
+  ASSERT_EQ(survivor.call(SubscribeRequest{5000, WYX_SUBSCRIBE_STATE, "g1"}), WYX_OK);
+  EXPECT_EQ(told(survivor).size(), 1u);
+  while (daemon_.continue_work()) heard += told(survivor).size();
+  EXPECT_EQ(heard, 1000u);
+}
+
 TEST(DaemonAccess, OwnerRootAndGroupMembers_AreAllowedAndNobodyElse) {
   const platform::AccessRule owner_only{1000, std::nullopt};
   const platform::AccessRule with_group{1000, 50};

@@ -45,6 +45,7 @@ struct GroupModel {
   const ProtocolNotification* event = nullptr;  // the last of this step
   // The phase that is being voted on, and what its votes have come to.
   bool open = false;
+  bool unfinished = false;  // work is left for a ContinueEvent
   wyx_request_t protocol = WYX_JOIN;
   std::vector<LeaveCode> leave_codes;
   bool any_continue = false;
@@ -169,9 +170,10 @@ class Model {
   }
   void before(const HostCameEvent& event, const Outcome&) { gone_hosts_.erase(event.node); }
   void before(const ResponsivenessEvent& event, const Outcome&) { announced_ = event.session; }
+  void before(const ContinueEvent&, const Outcome&) {}
   void before(const TimerExpiredEvent& event, const Outcome& outcome) {
     const std::string& name = event.timer.group;
-    const bool awaited = groups_.contains(name) && groups_[name].timer == event.timer;
+    const bool awaited = groups_.contains(name) && groups_[name].timer == event.timer && !groups_[name].unfinished;
     if (awaited == outcome.deliveries.empty())
       errors_ += name + (awaited ? ": the end of its time is ignored\n" : ": obeys a timer that is over\n");
     for (auto& [endpoint, view] : providers_)
@@ -184,8 +186,8 @@ class Model {
     for (auto& [name, group] : groups_) {
       if (!group.event || group.event->type != WYX_N_PHASE_NOTIFICATION) continue;
       const TimerRequest* timer = wanted[name];
-      if (timer) group.timer = timer->id;
-      if (group.event->time_limit != (timer ? timer->seconds : 0))
+      if (timer && timer->seconds != 0) group.timer = timer->id;
+      if (!timer || group.event->time_limit != timer->seconds)
         errors_ += name + ": the phase has another time limit than its timer\n";
     }
   }
@@ -445,7 +447,7 @@ class Model {
     std::set<std::string> names;
     for (const Engine::GroupStatus& status : engine.status()) {
       names.insert(status.name);
-      check_group(status, groups_[status.name]);
+      check_group(engine, status, groups_[status.name]);
     }
     std::erase_if(groups_, [&](const auto& g) { return !names.contains(g.first); });
     for (const auto& [endpoint, view] : providers_)
@@ -456,10 +458,12 @@ class Model {
   }
 
   /// While a protocol runs it waits for somebody; at rest nothing is owed and only the living are members.
-  void check_group(const Engine::GroupStatus& status, GroupModel& group) {
+  void check_group(const Engine& engine, const Engine::GroupStatus& status, GroupModel& group) {
     bool waits = false;
     std::set<ProviderId> alive;
-    const bool at_rest = status.running_protocol.empty();
+    group.unfinished = status.unfinished;
+    if (status.unfinished && !engine.busy()) errors_ += status.name + ": has work that nobody asks for\n";
+    const bool at_rest = status.running_protocol.empty() && !status.unfinished;
     for (const auto& [endpoint, view] : providers_) {
       if (view.group != status.name) continue;
       waits |= view.asked;
@@ -471,7 +475,8 @@ class Model {
     if (status.members.empty()) group.members.clear();  // nobody was left to be told
     if (!alive.empty() && (status.members != group.members || status.state_length != group.value.size()))
       errors_ += status.name + ": is not what its members believe\n";
-    if (!at_rest && !waits) errors_ += status.name + ": runs a protocol and waits for nobody\n";
+    if (!at_rest && !waits && !status.unfinished)
+      errors_ += status.name + ": runs a protocol and waits for nobody\n";
     if (at_rest && std::set<ProviderId>(status.members.begin(), status.members.end()) != alive)
       errors_ += status.name + ": is at rest with members that are not alive\n";
   }

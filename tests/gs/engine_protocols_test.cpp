@@ -108,8 +108,62 @@ TEST_F(EngineProtocols, Vote_results_of_many_large_values_are_bounded_and_hold_e
   EXPECT_EQ(results.size(), kVoters);
   std::size_t bytes = 0;
   for (const VoteResult& r : results)
-    bytes += r.proposed_state.value_or("").size() + r.message.value_or("").size();
+    bytes += (r.proposed_state ? r.proposed_state->size() : 0) + (r.message ? r.message->size() : 0);
   EXPECT_EQ(bytes, kMaxCollected);
+}
+
+class EngineSlices : public Script {
+ protected:
+  static constexpr std::size_t kSlice = 100, kMembers = 60;
+  EngineSlices() : Script(Limits{.slice = kSlice}) {}
+
+  JoinRequest provider(Token token, std::int16_t instance, const std::string& group) const {
+    JoinRequest join{token, attributes, instance, "p"};
+    join.attributes.group_name = group;
+    return join;
+  }
+};
+
+TEST_F(EngineSlices, Many_failures_of_one_death_are_told_in_parts_and_others_are_served_between_them) {
+  for (std::int16_t i = 0; i < 2 * static_cast<int>(kMembers); ++i)
+    ASSERT_EQ(request(1 + i % 2, provider(i, i, "g")), WYX_OK);
+  for (std::int16_t i = 0; i < 50; ++i)
+    ASSERT_EQ(request(1, provider(500 + i, 1, "h" + std::to_string(i))), WYX_OK);
+  ASSERT_EQ(request(3, provider(1, 1, "other")), WYX_OK);
+  const std::size_t before = engine.status().size();
+  dies(1);
+  std::size_t parts = 1, told = last.deliveries.size();
+  for (; engine.busy(); ++parts) {
+    EXPECT_LE(last.deliveries.size(), kSlice + kMembers);
+    EXPECT_EQ(request(2, StateChangeRequest{1, kOnePhase, "x"}), WYX_COLLIDE);
+    EXPECT_EQ(request(3, StateChangeRequest{1, kOnePhase, "x"}), WYX_OK);
+    EXPECT_EQ(last.deliveries.size(), 1u);
+    apply(ContinueEvent{});
+    told += last.deliveries.size();
+  }
+  EXPECT_EQ(told, kMembers * kMembers);
+  EXPECT_GE(parts, told / (kSlice + kMembers));
+  EXPECT_EQ(engine.status().size(), before - 50);
+  EXPECT_EQ(request(2, StateChangeRequest{1, kOnePhase, "x"}), WYX_OK);
+}
+
+class EngineLongestPhase : public Script {
+ protected:
+  EngineLongestPhase() : Script(Limits{.max_phase_time = 30}) {}
+};
+
+TEST_F(EngineLongestPhase, Phase_without_a_limit_or_with_a_longer_one_gets_the_longest) {
+  group_of({1, 2});
+  for (const std::uint16_t asked : {0, 31, 30, 7}) {
+    change_state(1, "x", {WYX_N_PHASE, asked});
+    EXPECT_EQ(last.timers.at(0).seconds, asked == 7 ? 7 : 30);
+    approve({1});
+    const MissingVotes missing = engine.missing_votes("g", 8);
+    EXPECT_EQ(missing.count, 1u);
+    EXPECT_EQ(missing.voters.at(0).id, id(2));
+    apply(TimerExpiredEvent{timers.back().id});
+    EXPECT_EQ(engine.missing_votes("g", 8).protocol, "");
+  }
 }
 
 }  // namespace

@@ -132,6 +132,43 @@ TEST_F(EngineRequests, Proposals_collide_while_a_protocol_runs_and_want_a_member
   expect_refused(1, UnsubscribeRequest{77}, WYX_BAD_MEMBER_TOKEN);
 }
 
+TEST_F(EngineRequests, What_is_kept_is_bounded_by_session_user_and_in_all_whoever_shares_the_groups) {
+  Engine small(Limits{.session_bytes = 70'000, .user_bytes = 130'000, .total_bytes = 240'000});
+  const auto ask = [&](int who, std::uint32_t of, Request r) {
+    return small.apply(RequestEvent{session(who), std::move(r), false, of}).rc;
+  };
+  const auto join_own = [&](int who, std::uint32_t of) {
+    JoinRequest own = join_request(1, static_cast<std::int16_t>(who));
+    own.attributes.group_name = "of " + std::to_string(who);
+    ASSERT_EQ(ask(who, of, own), WYX_OK);
+  };
+  const auto change = [](std::size_t bytes, ProtocolTerms terms = kOnePhase) {
+    return StateChangeRequest{1, terms, Bytes(bytes, 'x')};
+  };
+  for (const std::int16_t who : {1, 2, 3, 4}) ASSERT_EQ(ask(who, who < 4 ? 7 : 0, join_request(1, who)), WYX_OK);
+  ASSERT_EQ(ask(1, 7, change(60'000)), WYX_OK);
+  const std::uint64_t before = small.digest();
+  EXPECT_EQ(ask(1, 7, change(60'000)), WYX_NO_MEMORY) << "the session's room, for the old value and the new one";
+  EXPECT_EQ(small.digest(), before);
+  EXPECT_EQ(ask(2, 7, change(60'000, kPhases)), WYX_OK) << "another session of the user, in the same group";
+  for (const int who : {1, 2, 3}) ASSERT_EQ(ask(who, 7, VoteRequest{1, WYX_VOTE_APPROVE, {}, {}}), WYX_OK);
+  const Bytes voted(60'000, 'v');
+  EXPECT_EQ(ask(4, 0, VoteRequest{1, WYX_VOTE_APPROVE, voted, voted}), WYX_NO_MEMORY);
+  EXPECT_EQ(ask(4, 0, VoteRequest{1, WYX_VOTE_APPROVE, voted, {}}), WYX_OK);
+  EXPECT_EQ(ask(1, 7, change(60'000)), WYX_OK) << "the vote's value has replaced its own";
+
+  small.apply(SessionGoneEvent{session(1)});
+  EXPECT_EQ(ask(2, 7, MessageRequest{1, kPhases, Bytes(60'000, 'm')}), WYX_OK);
+  join_own(6, 7);
+  EXPECT_EQ(ask(6, 7, change(60'000)), WYX_NO_MEMORY) << "the user's room: the value of a dead session counts on";
+  join_own(8, 8);
+  EXPECT_EQ(ask(8, 8, change(60'000)), WYX_OK) << "another user's";
+  join_own(9, 9);
+  join_own(10, 0);
+  EXPECT_EQ(ask(9, 9, change(40'000)), WYX_NO_MEMORY) << "the last eighth of all";
+  EXPECT_EQ(ask(10, 0, change(40'000)), WYX_OK) << "is root's";
+}
+
 class EngineSubscribers : public EngineRequests {};
 
 TEST_F(EngineSubscribers, Each_gets_what_its_flags_ask_for_first_as_it_is_then_each_change) {

@@ -15,7 +15,7 @@ inline constexpr ProtocolTerms kPhases{WYX_N_PHASE, 0};
 /// The fixture of all engine tests; the model's promises are checked at the end of each.
 class Script : public ::testing::Test {
  protected:
-  Script() { attributes.group_name = "g"; }
+  explicit Script(const Limits& limits = {}) : engine(limits) { attributes.group_name = "g"; }
   void TearDown() override { EXPECT_EQ(model.errors(), ""); }
 
   GroupAttributes attributes;  // of the joins that follow

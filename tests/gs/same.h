@@ -9,6 +9,9 @@
 
 namespace gs {
 
+inline auto fields(const VoteResult& r) {
+  return std::tie(r.voter, r.vote, r.summary, r.leave_code, r.proposed_state, r.message);
+}
 inline auto fields(const Proposal& p) {
   return std::tie(p.num_phases, p.phase, p.proposed_by, p.whats_changed, p.current_providers, p.changing_providers,
                   p.leave_codes, p.expel_info, p.current_state, p.proposed_state, p.message, p.new_attributes,

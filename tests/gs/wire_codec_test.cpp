@@ -123,7 +123,8 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
         << n.index();
 
   N huge = samples::full_protocol();
-  const VoteResult large{{1, 1}, WYX_VOTE_APPROVE, 0, 0, Bytes(kMaxStateValue, 's'), Bytes(kMaxStateValue, 'm')};
+  const auto value = std::make_shared<const Bytes>(kMaxStateValue, 'v');
+  const VoteResult large{{1, 1}, WYX_VOTE_APPROVE, 0, 0, value, value};
   huge.proposal.current_vote_results.assign(kMaxServerMessage / (2 * kMaxStateValue), large);
   EXPECT_FALSE(encode(ServerMessage(Notify{1, std::make_shared<const Notification>(huge)})));
 }

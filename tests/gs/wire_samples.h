@@ -75,10 +75,9 @@ inline ProtocolNotification full_protocol(std::size_t state_size = 5) {
   p.proposed_state = bytes(Bytes(state_size, 't'));
   p.message = bytes("message");
   p.new_attributes = std::make_shared<const GroupAttributes>(attributes());
-  p.current_vote_results = {
-      {{1, 2}, WYX_VOTE_APPROVE, WYX_EXPLICIT_APPROVE, 0, Bytes("x"), std::nullopt},
-      {{3, 4}, WYX_VOTE_REJECT, WYX_PROVIDER_FAILED, WYX_HOST_FAILURE, std::nullopt, Bytes()}};
-  p.changing_vote_results = {{{5, 6}, WYX_VOTE_CONTINUE, 0, 0, std::nullopt, std::nullopt}};
+  p.current_vote_results = {{{1, 2}, WYX_VOTE_APPROVE, WYX_EXPLICIT_APPROVE, 0, bytes("x"), nullptr},
+                            {{3, 4}, WYX_VOTE_REJECT, WYX_PROVIDER_FAILED, WYX_HOST_FAILURE, nullptr, bytes("")}};
+  p.changing_vote_results = {{{5, 6}, WYX_VOTE_CONTINUE, 0, 0, nullptr, nullptr}};
   return n;
 }
 

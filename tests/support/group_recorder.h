@@ -103,10 +103,6 @@ auto shared(const Record* record) {
   using Value = decltype(value(*record));
   return record ? std::make_shared<const Value>(value(*record)) : nullptr;
 }
-template <typename Record>
-std::optional<gs::Bytes> optional(const Record* record) {
-  return record ? std::optional(value(*record)) : std::nullopt;
-}
 inline std::vector<gs::LeaveCode> value(const wyx_leave_code_entry_t* codes, std::size_t count) {
   std::vector<gs::LeaveCode> all;
   for (std::size_t i = 0; codes != nullptr && i < count; ++i)
@@ -118,8 +114,8 @@ inline std::vector<gs::VoteResult> value(const wyx_vote_results_t* results) {
   for (unsigned i = 0; results != nullptr && i < results->gs_count; ++i) {
     const wyx_vote_result_t& r = *results->gs_vote_results[i];
     all.push_back({value(r.gs_voter), r.gs_vote_value, static_cast<std::uint32_t>(r.gs_summary_code),
-                   static_cast<std::uint32_t>(r.gs_leave_code), optional(r.gs_proposed_state_value),
-                   optional(r.gs_provider_message)});
+                   static_cast<std::uint32_t>(r.gs_leave_code), shared(r.gs_proposed_state_value),
+                   shared(r.gs_provider_message)});
   }
   return all;
 }

@@ -137,13 +137,21 @@ void EmbeddedTransport::quit() {
   show_queue();
 }
 
+/// Nobody else waits for this engine: what an event leaves to do is done at once.
 wyx_rc_t EmbeddedTransport::apply(const Event& event) {
+  const wyx_rc_t rc = apply_one(event);
+  while (engine_.busy()) apply_one(ContinueEvent{});
+  return rc;
+}
+
+wyx_rc_t EmbeddedTransport::apply_one(const Event& event) {
   Outcome outcome = engine_.apply(event);
   for (Delivery& delivery : outcome.deliveries) {
     queue_.push_back({Incoming::Kind::kNotification, delivery.to.token, std::move(delivery.what), 0});
   }
   const auto now = Clock::now();
   for (TimerRequest& timer : outcome.timers) {
+    if (timer.seconds == 0) continue;
     timers_.push_back({now + std::chrono::seconds(timer.seconds), std::move(timer.id)});
   }
   // A phase that has ended early must not make the descriptor readable when its time comes.

@@ -43,6 +43,7 @@ class EmbeddedTransport : public Transport {
   EmbeddedTransport();
   bool ready() const;
   wyx_rc_t apply(const Event& event) GS_REQUIRES(mutex_);
+  wyx_rc_t apply_one(const Event& event) GS_REQUIRES(mutex_);
   void run_due_timers() GS_REQUIRES(mutex_);
   void run_due_ping(Clock::time_point now) GS_REQUIRES(mutex_);
   void set_responding(bool responding) GS_REQUIRES(mutex_);

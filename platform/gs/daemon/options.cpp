@@ -21,6 +21,8 @@ using platform::set_number;
 constexpr std::uint64_t kMaxNode = 32767;
 constexpr std::uint64_t kMinQueueBound = 64 * 1024;
 constexpr std::uint64_t kMaxQueueBound = std::uint64_t{1} << 40;
+constexpr std::uint64_t kMinStateBound = 1024 * 1024;
+constexpr std::uint64_t kMaxStateBound = std::uint64_t{1} << 40;
 
 Problem set_socket_path(Options& options, const std::string& text) {
   constexpr std::size_t kLongest = sizeof(sockaddr_un::sun_path) - 1;
@@ -51,6 +53,19 @@ Problem set_queue_bound(Options& options, const std::string& text) {
   if (problem.empty()) options.queue_bound = value;
   return problem;
 }
+template <std::size_t Limits::*Bound>
+Problem set_state_bound(Options& options, const std::string& text) {
+  std::uint64_t value = 0;
+  Problem problem = set_number(text, kMinStateBound, kMaxStateBound, &value);
+  if (problem.empty()) options.engine.*Bound = value;
+  return problem;
+}
+Problem set_max_phase_time(Options& options, const std::string& text) {
+  std::uint64_t value = 0;
+  Problem problem = set_number(text, 0, UINT16_MAX, &value);
+  if (problem.empty()) options.engine.max_phase_time = static_cast<std::uint16_t>(value);
+  return problem;
+}
 Problem set_log_level(Options& options, const std::string& text) {
   const auto level = platform::log_level(text);
   if (!level) return "must be error, warning, info or debug, not '" + text + "'";
@@ -77,6 +92,13 @@ constexpr Setting kSettings[] = {
      set_access_group},
     {"node-number", "N", true, "Number of this node, 0 to 32767", set_node_number},
     {"queue-bound", "BYTES", true, "Bytes that may wait for a client before it is closed", set_queue_bound},
+    {"session-state-bound", "BYTES", true, "Bytes that one client may have in groups",
+     set_state_bound<&Limits::session_bytes>},
+    {"user-state-bound", "BYTES", true, "Bytes that all clients of a user but root may have in groups",
+     set_state_bound<&Limits::user_bytes>},
+    {"state-bound", "BYTES", true, "Bytes of all groups, the last eighth for root only",
+     set_state_bound<&Limits::total_bytes>},
+    {"max-phase-time", "SECONDS", true, "Longest time that a phase waits for votes (0: none)", set_max_phase_time},
     {"log-level", "LEVEL", false, "error, warning, info or debug", set_log_level},
     {"log-file", "FILE", false, "File to append the log to (none: standard error)", set_log_file},
 };

@@ -9,6 +9,7 @@
 #include <string>
 
 #include "common/settings.h"
+#include "engine/limits.h"
 #include "wire/endpoint.h"
 
 namespace gs::daemon {
@@ -18,6 +19,7 @@ struct Options {
   std::string access_group;                    // name or number of a unix group; empty: the owner alone
   std::uint32_t node_number = 1;               // 0 to 32767
   std::size_t queue_bound = 16 * 1024 * 1024;  // bytes that may wait for each channel of a client
+  Limits engine;
   spdlog::level::level_enum log_level = spdlog::level::info;
   std::string log_file;  // empty: standard error
   bool daemon = false;

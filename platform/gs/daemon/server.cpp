@@ -13,7 +13,8 @@
 namespace gs::daemon {
 namespace {
 
-constexpr int kSendBuffer = 1024 * 1024;          // bytes; the system may give less
+constexpr int kSendBuffer = 1024 * 1024;  // bytes; the system may give less
+constexpr timeval kAtOnce = {0, 0};       // after the descriptors that are ready, before the next are looked at
 constexpr timeval kAcceptPause = {0, 100'000};    // when descriptors have run out
 constexpr timeval kFarewellLimit = {0, 500'000};  // for clients to take what waits for them
 constexpr int kAcceptsAtOnce = 64;                // before the connected are served again
@@ -66,7 +67,8 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       access_{geteuid(), platform::group_id(options.access_group)},
       base_(event_base_new()),
       listener_("gsd", prepared(options.socket_path), access_.group),
-      sessions_({options.node_number, options.queue_bound}, {*this, ordering_, now, random_number, log_}),
+      sessions_({.node_number = options.node_number, .queue_bound = options.queue_bound, .engine = options.engine},
+                {*this, ordering_, now, random_number, log_, [this] { event_add(continue_.get(), &kAtOnce); }}),
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
   const auto on_stop = [](evutil_socket_t signal, short, void* self) {
@@ -79,6 +81,7 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       },
       this);
   deadline_ = make_event(-1, 0, call<&Server::on_deadline>, this);
+  continue_ = make_event(-1, 0, call<&Server::on_continue>, this);
   farewell_over_ = make_event(
       -1, 0,
       [](evutil_socket_t, short, void* self) { event_base_loopbreak(static_cast<Server*>(self)->base_.get()); },
@@ -246,6 +249,7 @@ void Server::stop(const std::string& why) {
   event_del(acceptable_.get());
   event_del(accept_again_.get());
   event_del(deadline_.get());
+  event_del(continue_.get());
   listener_.close();
   for (auto& [id, connection] : connections_) event_del(connection.readable.get());
   sessions_.say_farewell();

@@ -89,6 +89,7 @@ class Server : private Transport {
   void on_readable(ConnectionId id);
   void on_writable(ConnectionId id);
   void on_deadline();
+  void on_continue() { sessions_.continue_work(); }
 
   void look_at_path();
   void start_accepting();
@@ -114,6 +115,7 @@ class Server : private Transport {
   EventPtr acceptable_;
   EventPtr accept_again_;
   EventPtr deadline_;
+  EventPtr continue_;
   EventPtr terminated_;
   EventPtr interrupted_;
   EventPtr farewell_over_;

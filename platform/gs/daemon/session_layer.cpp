@@ -8,7 +8,7 @@
 namespace gs::daemon {
 
 SessionLayer::SessionLayer(const Settings& settings, Environment environment)
-    : settings_(settings), env_(std::move(environment)), client_log_(*env_.log) {
+    : settings_(settings), env_(std::move(environment)), client_log_(*env_.log), engine_(settings.engine) {
   for (std::size_t rc = 0; rc < answers_.size(); ++rc) {
     answers_[rc] = wire::encode(wire::Answer{static_cast<wyx_rc_t>(rc)});
   }
@@ -149,7 +149,7 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, const wire::
   if (session->event == 0) return end(id, End::kFault, "out of order: a request before its event channel");
   if (session->answer_due) return end(id, End::kFault, "out of order: a request before the answer to the last");
   session->answer_due = true;
-  env_.ordering.submit(RequestEvent{id_of(connection.session), call.request, false});
+  env_.ordering.submit(RequestEvent{id_of(connection.session), call.request, false, connection.peer.uid});
 }
 
 void SessionLayer::on_query_node(ConnectionId id) {
@@ -194,6 +194,14 @@ void SessionLayer::ordered(const Event& event) {
   }
   encoded_.clear();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
+  if (!engine_.busy() || continue_due_) return;
+  continue_due_ = true;
+  env_.continue_soon();
+}
+
+void SessionLayer::continue_work() {
+  continue_due_ = false;
+  env_.ordering.submit(ContinueEvent{});
 }
 
 void SessionLayer::trace(const Event& event, const Outcome& outcome) {
@@ -226,11 +234,38 @@ void SessionLayer::arm(const TimerRequest& timer) {
   if (phase_timers_.size() >= sweep_timers_at_) drop_stale_timers();
   PhaseTimer& of_group = phase_timers_[timer.id.group];
   timers_.cancel(of_group.timer);
+  timers_.cancel(of_group.warning);
   of_group.phase = timer.id;
-  of_group.timer = timers_.arm(env_.now() + std::chrono::seconds(timer.seconds), [this, id = timer.id] {
+  const std::chrono::seconds limit(timer.seconds);
+  if (limit.count() == 0 || limit > kLongPhase) {
+    of_group.warning = timers_.arm(env_.now() + kLongPhase, [this, id = timer.id] { warn_of_missing_votes(id); });
+  }
+  if (limit.count() == 0) return;
+  of_group.timer = timers_.arm(env_.now() + limit, [this, id = timer.id] {
     phase_timers_.erase(id.group);
     env_.ordering.submit(TimerExpiredEvent{id});
   });
+}
+
+void SessionLayer::warn_of_missing_votes(const TimerId& phase) {
+  if (!engine_.awaits(phase)) return;
+  const MissingVotes missing = engine_.missing_votes(phase.group, kNamedVoters);
+  if (missing.count == 0) return;
+  std::string names;
+  for (const MissingVoter& voter : missing.voters) names += (names.empty() ? "" : ", ") + describe(voter);
+  if (missing.count > missing.voters.size()) {
+    names += " and " + std::to_string(missing.count - missing.voters.size()) + " more";
+  }
+  env_.log->warn("group \"{}\": phase {} of a {} protocol has waited {} s for the votes of {}",
+                 printable(phase.group), missing.phase, missing.protocol, kLongPhase.count(), names);
+}
+
+std::string SessionLayer::describe(const MissingVoter& voter) {
+  const std::string provider = "\"" + printable(voter.local_name) + "\" (" + std::to_string(voter.id.instance) +
+                               "@" + std::to_string(voter.id.node);
+  const Session* session = find_session(voter.to.session.number);
+  if (voter.to.session.node != settings_.node_number || session == nullptr) return provider + ")";
+  return provider + ", " + describe(*find(session->request)) + ")";
 }
 
 /// A phase may end hours before its limit: without this, groups that come and go would leave their timers behind.
@@ -239,6 +274,7 @@ void SessionLayer::drop_stale_timers() {
     PhaseTimer ended = of_group.second;
     if (engine_.awaits(ended.phase)) return false;
     timers_.cancel(ended.timer);
+    timers_.cancel(ended.warning);
     return true;
   });
   sweep_timers_at_ = std::max(kFewTimers, 2 * phase_timers_.size());

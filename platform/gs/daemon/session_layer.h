@@ -42,6 +42,7 @@ class SessionLayer : private PingSink {
     std::uint32_t node_number = 0;
     std::size_t queue_bound = 0;       // bytes that may wait for each of a client's channels
     Duration handshake_limit{10'000};  // to say Hello or Attach, and to attach after Hello
+    Limits engine;
   };
   /// What it is given of the outside world.
   struct Environment {
@@ -50,6 +51,7 @@ class SessionLayer : private PingSink {
     std::function<Time()> now;
     std::function<std::uint64_t()> random;  // not to be guessed by a client
     std::shared_ptr<spdlog::logger> log;
+    std::function<void()> continue_soon;  // asks for one call of continue_work, after what else is ready
   };
 
   SessionLayer(const Settings& settings, Environment environment);
@@ -66,6 +68,9 @@ class SessionLayer : private PingSink {
   /// When run_timers is to be called next.
   std::optional<Time> next_deadline() const { return timers_.next(); }
   void run_timers() { timers_.run(env_.now()); }
+
+  /// Does the next part of what earlier events have left to do.
+  void continue_work();
 
   /// Tells every client that the daemon is going away; what waits for them still goes out, nothing new does.
   void say_farewell();
@@ -117,6 +122,8 @@ class SessionLayer : private PingSink {
   };
   enum class End { kQuit, kGone, kFault };
   static constexpr std::size_t kFewTimers = 64;
+  static constexpr std::chrono::seconds kLongPhase{60};  // after which the log names those who have not voted
+  static constexpr std::size_t kNamedVoters = 8;
 
   // One message of a client; each may close the connection it came on.
   void on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
@@ -139,6 +146,8 @@ class SessionLayer : private PingSink {
   void deliver(const Delivery& delivery);
   void arm(const TimerRequest& timer);
   void drop_stale_timers();
+  void warn_of_missing_votes(const TimerId& phase);
+  std::string describe(const MissingVoter& voter);
   SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
 
   void send(ConnectionId to, const wire::Encoded& message, Token token = -1);
@@ -163,6 +172,7 @@ class SessionLayer : private PingSink {
   struct PhaseTimer {
     TimerId phase;
     Timers::Id timer;
+    Timers::Id warning;
   };
   std::unordered_map<std::string, PhaseTimer> phase_timers_;        // by group, which runs one protocol at a time
   std::size_t sweep_timers_at_ = kFewTimers;                        // phase timers, those of ended phases included
@@ -170,6 +180,7 @@ class SessionLayer : private PingSink {
   std::array<wire::Encoded, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
   std::uint64_t last_session_ = 0;
   bool said_farewell_ = false;  // nothing is sent after it
+  bool continue_due_ = false;   // was asked for
 };
 
 }  // namespace gs::daemon

@@ -93,4 +93,18 @@ wyx_rc_t check_values(const SubscribeRequest& request) {
   return request.control & kWanted ? WYX_OK : WYX_BAD_PARAMETER;
 }
 
+std::size_t room_for(const JoinRequest& request) {
+  constexpr std::size_t kProvider = 1024;  // with its place in every table, and a group that may be its own
+  return kProvider + request.local_name.size();
+}
+std::size_t room_for(const StateChangeRequest& request) { return request.new_state.size(); }
+std::size_t room_for(const MessageRequest& request) { return request.message.size(); }
+std::size_t room_for(const ExpelRequest& request) {
+  return request.deactivate_flag.size() + request.expelled.size() * (sizeof(ProviderId) + sizeof(LeaveCode));
+}
+std::size_t room_for(const VoteRequest& request) {
+  return (request.proposed_state ? request.proposed_state->size() : 0) +
+         (request.message ? request.message->size() : 0);
+}
+
 }  // namespace gs

@@ -19,4 +19,11 @@ wyx_rc_t check_values(const AttributeChangeRequest& request);
 wyx_rc_t check_values(const VoteRequest& request);
 wyx_rc_t check_values(const SubscribeRequest& request);
 
+/// Bytes that the engine keeps on the request's account.
+std::size_t room_for(const JoinRequest& request);
+std::size_t room_for(const StateChangeRequest& request);
+std::size_t room_for(const MessageRequest& request);
+std::size_t room_for(const ExpelRequest& request);
+std::size_t room_for(const VoteRequest& request);
+
 }  // namespace gs

@@ -1,5 +1,7 @@
 #include "engine/engine.h"
 
+#include <algorithm>
+#include <deque>
 #include <limits>
 #include <map>
 #include <set>
@@ -12,51 +14,55 @@
 namespace gs {
 
 struct Engine::State {
+  explicit State(const Limits& wanted) : limits(wanted) {}
+
+  const Limits limits;
+  Ledger ledger{limits};  // before all that is charged
   std::map<std::string, Group> groups;
+  std::deque<std::string> line;  // the unfinished groups, in the order in which they are gone on with
   SubscriberTable subscribers;
   ClientTable clients;
   std::set<std::uint32_t> gone_hosts;
   std::uint64_t last_protocol = 0;
+  std::size_t work_left = 0;  // of the event that is being applied
 
   Surroundings surroundings(Outcome& out) {
-    return {out.deliveries, out.timers, subscribers, clients, last_protocol};
+    return {out.deliveries, out.timers, subscribers, clients, last_protocol, ledger, limits, work_left};
   }
 
   const Group* find_group(const std::string& name) const {
     auto it = groups.find(name);
     return it == groups.end() ? nullptr : &it->second;
   }
-  const Client* find(SessionId session, Token token) const {
-    auto it = clients.find({session, token});
-    return it == clients.end() ? nullptr : &it->second;
-  }
-  const Client* find_provider(SessionId session, Token token) const {
-    const Client* client = find(session, token);
+  const Client* find_provider(const Payer& from, Token token) const {
+    const Client* client = clients.find({from.session, token});
     return client && client->provider ? client : nullptr;
   }
 
-  wyx_rc_t check(SessionId session, const Request& request) const;
-  wyx_rc_t check(SessionId session, const JoinRequest& request) const;
-  wyx_rc_t check(SessionId session, const StateChangeRequest& request) const;
-  wyx_rc_t check(SessionId session, const MessageRequest& request) const;
-  wyx_rc_t check(SessionId session, const LeaveRequest& request) const;
-  wyx_rc_t check(SessionId session, const ExpelRequest& request) const;
-  wyx_rc_t check(SessionId session, const AttributeChangeRequest& request) const;
-  wyx_rc_t check(SessionId session, const GoodbyeRequest& request) const;
-  wyx_rc_t check(SessionId session, const VoteRequest& request) const;
-  wyx_rc_t check(SessionId session, const SubscribeRequest& request) const;
-  wyx_rc_t check(SessionId session, const UnsubscribeRequest& request) const;
-  wyx_rc_t check_new_token(SessionId session, Token token) const;
-  wyx_rc_t check_room(SessionId session) const;
+  wyx_rc_t check(const Payer& from, const Request& request) const;
+  wyx_rc_t check(const Payer& from, const JoinRequest& request) const;
+  wyx_rc_t check(const Payer& from, const StateChangeRequest& request) const;
+  wyx_rc_t check(const Payer& from, const MessageRequest& request) const;
+  wyx_rc_t check(const Payer& from, const LeaveRequest& request) const;
+  wyx_rc_t check(const Payer& from, const ExpelRequest& request) const;
+  wyx_rc_t check(const Payer& from, const AttributeChangeRequest& request) const;
+  wyx_rc_t check(const Payer& from, const GoodbyeRequest& request) const;
+  wyx_rc_t check(const Payer& from, const VoteRequest& request) const;
+  wyx_rc_t check(const Payer& from, const SubscribeRequest& request) const;
+  wyx_rc_t check(const Payer& from, const UnsubscribeRequest& request) const;
+  wyx_rc_t check_new_token(const Payer& from, Token token) const;
+  wyx_rc_t check_new_client(const Payer& from) const;
+  template <typename R>
+  wyx_rc_t check_room(const Payer& from, const R& request) const;
 
-  void perform(SessionId session, const JoinRequest& request, Outcome& out);
-  void perform(SessionId session, const LeaveRequest& request, Outcome& out);
-  void perform(SessionId session, const GoodbyeRequest& request, Outcome& out);
-  void perform(SessionId session, const VoteRequest& request, Outcome& out);
-  void perform(SessionId session, const SubscribeRequest& request, Outcome& out);
-  void perform(SessionId session, const UnsubscribeRequest& request, Outcome& out);
+  void perform(const Payer& from, const JoinRequest& request, Outcome& out);
+  void perform(const Payer& from, const LeaveRequest& request, Outcome& out);
+  void perform(const Payer& from, const GoodbyeRequest& request, Outcome& out);
+  void perform(const Payer& from, const VoteRequest& request, Outcome& out);
+  void perform(const Payer& from, const SubscribeRequest& request, Outcome& out);
+  void perform(const Payer& from, const UnsubscribeRequest& request, Outcome& out);
   template <typename Proposal>
-  void perform(SessionId session, const Proposal& request, Outcome& out);
+  void perform(const Payer& from, const Proposal& request, Outcome& out);
 
   void apply(const RequestEvent& event, Outcome& out);
   void apply(const SessionGoneEvent& event, Outcome& out);
@@ -64,71 +70,80 @@ struct Engine::State {
   void apply(const HostCameEvent& event, Outcome& out);
   void apply(const TimerExpiredEvent& event, Outcome& out);
   void apply(const ResponsivenessEvent& event, Outcome& out);
+  void apply(const ContinueEvent& event, Outcome& out);
 
   void lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out);
   void settle(const std::string& group, Outcome& out);
+  void stand_in_line(const std::string& group);
+  void go_on(Outcome& out);
 };
 
 // ------------------------------------------------------------------------------------------------------ checks
 
-wyx_rc_t Engine::State::check(SessionId session, const Request& request) const {
-  if (gone_hosts.contains(session.node)) return WYX_NO_INIT;
-  return std::visit([&](const auto& r) { return check(session, r); }, request);
+wyx_rc_t Engine::State::check(const Payer& from, const Request& request) const {
+  if (gone_hosts.contains(from.session.node)) return WYX_NO_INIT;
+  return std::visit([&](const auto& r) { return check(from, r); }, request);
 }
 
-wyx_rc_t Engine::State::check_new_token(SessionId session, Token token) const {
-  return token >= 0 && !find(session, token) ? WYX_OK : WYX_BAD_MEMBER_TOKEN;
+wyx_rc_t Engine::State::check_new_token(const Payer& from, Token token) const {
+  return token >= 0 && !clients.find({from.session, token}) ? WYX_OK : WYX_BAD_MEMBER_TOKEN;
 }
 
-/// No session makes the daemon's memory grow without bound.
-wyx_rc_t Engine::State::check_room(SessionId session) const {
-  std::size_t count = 0;
-  auto it = clients.lower_bound({session, 0});
-  for (; it != clients.end() && it->first.session == session && count < kMaxSessionClients; ++it) ++count;
-  return count < kMaxSessionClients ? WYX_OK : WYX_NO_MEMORY;
+/// No session makes the daemon's memory grow without bound; nor does what it brings (see ledger.h).
+wyx_rc_t Engine::State::check_new_client(const Payer& from) const {
+  return clients.of(from.session).size() < kMaxSessionClients ? WYX_OK : WYX_NO_MEMORY;
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const JoinRequest& request) const {
-  if (wyx_rc_t rc = check_new_token(session, request.token); rc != WYX_OK) return rc;
+template <typename R>
+wyx_rc_t Engine::State::check_room(const Payer& from, const R& request) const {
+  return ledger.has_room(from, room_for(request)) ? WYX_OK : WYX_NO_MEMORY;
+}
+
+wyx_rc_t Engine::State::check(const Payer& from, const JoinRequest& request) const {
+  if (wyx_rc_t rc = check_new_token(from, request.token); rc != WYX_OK) return rc;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   const Group* group = find_group(request.attributes.group_name);
-  const ProviderId id{request.instance, static_cast<std::int16_t>(session.node)};
+  const ProviderId id{request.instance, static_cast<std::int16_t>(from.session.node)};
   if (wyx_rc_t rc = group ? group->check_join(request.attributes, id) : WYX_OK; rc != WYX_OK) return rc;
-  return check_room(session);
+  if (wyx_rc_t rc = check_new_client(from); rc != WYX_OK) return rc;
+  return check_room(from, request);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const StateChangeRequest& request) const {
-  const Client* client = find_provider(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const StateChangeRequest& request) const {
+  const Client* client = find_provider(from, request.token);
   if (!client) return WYX_BAD_MEMBER_TOKEN;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
-  return find_group(client->group)->check_proposal(*client->provider);
+  if (wyx_rc_t rc = find_group(client->group)->check_proposal(*client->provider); rc != WYX_OK) return rc;
+  return check_room(from, request);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const MessageRequest& request) const {
-  const Client* client = find_provider(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const MessageRequest& request) const {
+  const Client* client = find_provider(from, request.token);
   if (!client) return WYX_BAD_MEMBER_TOKEN;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
-  return find_group(client->group)->check_proposal(*client->provider);
+  if (wyx_rc_t rc = find_group(client->group)->check_proposal(*client->provider); rc != WYX_OK) return rc;
+  return check_room(from, request);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const LeaveRequest& request) const {
-  const Client* client = find_provider(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const LeaveRequest& request) const {
+  const Client* client = find_provider(from, request.token);
   if (!client) return WYX_BAD_MEMBER_TOKEN;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   return find_group(client->group)->check_leave(*client->provider);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const ExpelRequest& request) const {
-  const Client* client = find_provider(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const ExpelRequest& request) const {
+  const Client* client = find_provider(from, request.token);
   if (!client) return WYX_BAD_MEMBER_TOKEN;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   const Group& group = *find_group(client->group);
   if (wyx_rc_t rc = group.check_expel(request.expelled); rc != WYX_OK) return rc;
-  return group.check_proposal(*client->provider);
+  if (wyx_rc_t rc = group.check_proposal(*client->provider); rc != WYX_OK) return rc;
+  return check_room(from, request);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const AttributeChangeRequest& request) const {
-  const Client* client = find_provider(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const AttributeChangeRequest& request) const {
+  const Client* client = find_provider(from, request.token);
   if (!client) return WYX_BAD_MEMBER_TOKEN;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   const Group& group = *find_group(client->group);
@@ -136,37 +151,39 @@ wyx_rc_t Engine::State::check(SessionId session, const AttributeChangeRequest& r
   return group.check_proposal(*client->provider);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const GoodbyeRequest& request) const {
-  return find_provider(session, request.token) ? WYX_OK : WYX_BAD_MEMBER_TOKEN;
+wyx_rc_t Engine::State::check(const Payer& from, const GoodbyeRequest& request) const {
+  return find_provider(from, request.token) ? WYX_OK : WYX_BAD_MEMBER_TOKEN;
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const VoteRequest& request) const {
-  const Client* client = find_provider(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const VoteRequest& request) const {
+  const Client* client = find_provider(from, request.token);
   if (!client) return WYX_BAD_MEMBER_TOKEN;
   if (wyx_rc_t rc = find_group(client->group)->check_vote(*client->provider); rc != WYX_OK) return rc;
-  return check_values(request);
+  if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
+  return check_room(from, request);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const SubscribeRequest& request) const {
-  if (wyx_rc_t rc = check_new_token(session, request.token); rc != WYX_OK) return rc;
+wyx_rc_t Engine::State::check(const Payer& from, const SubscribeRequest& request) const {
+  if (wyx_rc_t rc = check_new_token(from, request.token); rc != WYX_OK) return rc;
   if (wyx_rc_t rc = check_values(request); rc != WYX_OK) return rc;
   const Group* group = find_group(request.group_name);
   const bool waits = request.control & WYX_SUBSCRIBE_PERSISTENCE;
   if (!waits && !(group && group->born())) return WYX_UNKNOWN_GROUP;
-  return check_room(session);
+  return check_new_client(from);
 }
 
-wyx_rc_t Engine::State::check(SessionId session, const UnsubscribeRequest& request) const {
-  const Client* client = find(session, request.token);
+wyx_rc_t Engine::State::check(const Payer& from, const UnsubscribeRequest& request) const {
+  const Client* client = clients.find({from.session, request.token});
   return client && !client->provider ? WYX_OK : WYX_BAD_MEMBER_TOKEN;
 }
 
 // ---------------------------------------------------------------------------------------------------- requests
 
 void Engine::State::apply(const RequestEvent& event, Outcome& out) {
-  out.rc = check(event.session, event.request);
+  const Payer from{event.session, event.user};
+  out.rc = check(from, event.request);
   if (out.rc == WYX_OK) {
-    std::visit([&](const auto& r) { perform(event.session, r, out); }, event.request);
+    std::visit([&](const auto& r) { perform(from, r, out); }, event.request);
     return;
   }
   if (!event.answered || gone_hosts.contains(event.session.node)) return;
@@ -180,53 +197,56 @@ void Engine::State::apply(const RequestEvent& event, Outcome& out) {
   out.deliveries.push_back(delayed_error({event.session, token}, event.request, out.rc, std::move(reason)));
 }
 
-void Engine::State::perform(SessionId session, const JoinRequest& request, Outcome& out) {
+void Engine::State::perform(const Payer& from, const JoinRequest& request, Outcome& out) {
   const std::string& name = request.attributes.group_name;
   auto joiner = std::make_shared<Member>();
-  joiner->to = {session, request.token};
-  joiner->id = {request.instance, static_cast<std::int16_t>(session.node)};
+  joiner->to = {from.session, request.token};
+  joiner->user = from.user;
+  joiner->id = {request.instance, static_cast<std::int16_t>(from.session.node)};
   joiner->local_name = request.local_name;
-  clients[joiner->to] = {name, joiner};
+  joiner->charge = Ledger::Charge(ledger, from, room_for(request));
+  clients.add(joiner->to, {name, joiner});
   groups.try_emplace(name, name).first->second.join(std::move(joiner), request);
   settle(name, out);
 }
 
-void Engine::State::perform(SessionId session, const LeaveRequest& request, Outcome& out) {
-  const Client client = *find(session, request.token);
+void Engine::State::perform(const Payer& from, const LeaveRequest& request, Outcome& out) {
+  const Client client = *find_provider(from, request.token);
   groups.at(client.group).leave(client.provider, request);
   settle(client.group, out);
 }
 
-void Engine::State::perform(SessionId session, const GoodbyeRequest& request, Outcome& out) {
-  const Client client = *find(session, request.token);
-  clients.erase({session, request.token});
+void Engine::State::perform(const Payer& from, const GoodbyeRequest& request, Outcome& out) {
+  const Client client = *find_provider(from, request.token);
+  clients.erase({from.session, request.token});
   groups.at(client.group).lose(client.provider, WYX_PROVIDER_SAID_GOODBYE);
   settle(client.group, out);
 }
 
-void Engine::State::perform(SessionId session, const VoteRequest& request, Outcome& out) {
-  const Client client = *find(session, request.token);
-  groups.at(client.group).vote(*client.provider, request);
+void Engine::State::perform(const Payer& from, const VoteRequest& request, Outcome& out) {
+  const Client client = *find_provider(from, request.token);
+  Surroundings env = surroundings(out);
+  groups.at(client.group).vote(*client.provider, request, env);
   settle(client.group, out);
 }
 
-void Engine::State::perform(SessionId session, const SubscribeRequest& request, Outcome& out) {
-  const Subscriber subscriber{{session, request.token}, request.control};
-  clients[subscriber.to] = {request.group_name, nullptr};
-  subscribers.add(request.group_name, subscriber);
+void Engine::State::perform(const Payer& from, const SubscribeRequest& request, Outcome& out) {
+  const Subscriber subscriber{{from.session, request.token}, request.control};
+  clients.add(subscriber.to, {request.group_name, nullptr, subscribers.add(request.group_name, subscriber)});
   const Group* group = find_group(request.group_name);
   if (group && group->born()) SubscriberTable::greet(subscriber, group->view(), out.deliveries);
 }
 
-void Engine::State::perform(SessionId session, const UnsubscribeRequest& request, Outcome&) {
-  const Endpoint endpoint{session, request.token};
-  subscribers.remove(clients.at(endpoint).group, endpoint);
+void Engine::State::perform(const Payer& from, const UnsubscribeRequest& request, Outcome&) {
+  const Endpoint endpoint{from.session, request.token};
+  const Client& client = *clients.find(endpoint);
+  subscribers.remove(client.group, client.subscription);
   clients.erase(endpoint);
 }
 
 template <typename Proposal>
-void Engine::State::perform(SessionId session, const Proposal& request, Outcome& out) {
-  const Client client = *find(session, request.token);
+void Engine::State::perform(const Payer& from, const Proposal& request, Outcome& out) {
+  const Client client = *find_provider(from, request.token);
   Surroundings env = surroundings(out);
   groups.at(client.group).propose(*client.provider, request, env);
   settle(client.group, out);
@@ -255,9 +275,7 @@ void Engine::State::apply(const TimerExpiredEvent& event, Outcome& out) {
 
 void Engine::State::apply(const ResponsivenessEvent& event, Outcome& out) {
   std::map<std::string, Membership> concerned;
-  for (auto it = clients.lower_bound({event.session, 0}); it != clients.end(); ++it) {
-    const auto& [endpoint, client] = *it;
-    if (endpoint.session != event.session) break;
+  for (const auto& [token, client] : clients.of(event.session)) {
     if (client.provider && client.provider->stage == Member::Stage::kJoined)
       concerned[client.group].push_back(client.provider->id);
   }
@@ -266,48 +284,78 @@ void Engine::State::apply(const ResponsivenessEvent& event, Outcome& out) {
   for (const auto& [name, ids] : concerned) groups.at(name).announce(summary, ids, env);
 }
 
+void Engine::State::apply(const ContinueEvent&, Outcome& out) { go_on(out); }
+
 /// All are taken out before any group is told, so that nobody who is lost in this event is sent anything.
 void Engine::State::lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out) {
-  std::set<std::string> concerned;
-  auto it = clients.lower_bound({first, 0});
-  while (it != clients.end() && it->first.session <= last) {
-    const auto& [endpoint, client] = *it;
-    if (client.provider) {
+  while (const auto session = clients.take_session(first, last)) {
+    for (const auto& [token, client] : session.mapped()) {
+      if (!client.provider) {
+        subscribers.remove(client.group, client.subscription);
+        continue;
+      }
       groups.at(client.group).lose(client.provider, leave_code);
-      concerned.insert(client.group);
-    } else {
-      subscribers.remove(client.group, endpoint);
+      stand_in_line(client.group);
     }
-    it = clients.erase(it);
   }
-  for (const std::string& name : concerned) settle(name, out);
+  go_on(out);
 }
 
+/// A group in line waits for its turn, so that what it has left comes before what came later.
 void Engine::State::settle(const std::string& name, Outcome& out) {
   auto it = groups.find(name);
+  if (it->second.in_line()) return;
   Surroundings env = surroundings(out);
   it->second.settle(env);
+  if (it->second.unfinished()) stand_in_line(name);
   if (it->second.finished()) groups.erase(it);
+}
+
+void Engine::State::stand_in_line(const std::string& name) {
+  Group& group = groups.at(name);
+  if (group.in_line()) return;
+  group.set_in_line(true);
+  line.push_back(name);
+}
+
+/// One that uses up the event's work goes to the end of the line.
+void Engine::State::go_on(Outcome& out) {
+  while (!line.empty() && work_left > 0) {
+    const std::string name = std::move(line.front());
+    line.pop_front();
+    groups.at(name).set_in_line(false);
+    settle(name, out);
+  }
 }
 
 // -------------------------------------------------------------------------------------------------- the engine
 
-Engine::Engine() : state_(std::make_unique<State>()) {}
+Engine::Engine(const Limits& limits) : state_(std::make_unique<State>(limits)) {}
 Engine::~Engine() = default;
 
 Outcome Engine::apply(const Event& event) {
   Outcome out;
+  state_->work_left = std::max<std::size_t>(state_->limits.slice, 1);
   std::visit([&](const auto& e) { state_->apply(e, out); }, event);
   return out;
 }
 
-wyx_rc_t Engine::precheck(SessionId session, const Request& request) const {
-  return state_->check(session, request);
+bool Engine::busy() const { return !state_->line.empty(); }
+
+wyx_rc_t Engine::precheck(SessionId session, const Request& request, std::uint32_t user) const {
+  return state_->check({session, user}, request);
 }
 
 bool Engine::awaits(const TimerId& timer) const {
   const Group* group = state_->find_group(timer.group);
   return group && group->awaits(timer);
+}
+
+MissingVotes Engine::missing_votes(const std::string& name, std::size_t at_most) const {
+  const Group* group = state_->find_group(name);
+  if (!group) return {};
+  return {group->running_protocol(), group->running_phase(), group->missing_votes(),
+          group->missing_voters(at_most)};
 }
 
 std::vector<Engine::GroupStatus> Engine::status() const {
@@ -319,6 +367,7 @@ std::vector<Engine::GroupStatus> Engine::status() const {
     status.state_length = group.state_length();
     status.seqnum = group.seqnum();
     status.running_protocol = group.running_protocol();
+    status.unfinished = group.unfinished();
     status.subscribers = state_->subscribers.count(name);
     all.push_back(std::move(status));
   }
@@ -329,11 +378,14 @@ std::uint64_t Engine::digest() const {
   Digest digest;
   digest.add(state_->last_protocol);
   for (std::uint32_t node : state_->gone_hosts) digest.add(node);
-  digest.add(state_->clients.size());
-  for (const auto& [endpoint, client] : state_->clients) {
-    digest.add(endpoint);
-    digest.add(client.group);
-    digest.add(client.provider != nullptr);
+  digest.add(state_->ledger.total());
+  for (const std::string& name : state_->line) digest.add(name);
+  for (const auto& [session, clients] : state_->clients.sessions()) {
+    for (const auto& [token, client] : clients) {
+      digest.add(Endpoint{session, token});
+      digest.add(client.group);
+      digest.add(client.provider != nullptr);
+    }
   }
   state_->subscribers.add_to(digest);
   digest.add(state_->groups.size());

@@ -4,21 +4,26 @@
 // endpoints and timers to arm. Engines that are given the same events in the same order stay the same and say the
 // same. Not safe for concurrent use; the caller brings the order, and with it the exclusion.
 //
+// An event makes it do a bounded amount of work (Limits::slice; one step of one protocol in any case). What is
+// left, such as the many failure leaves of one death, waits in its state until ContinueEvents are ordered; events
+// may be applied between them.
+//
 // What the protocols promise is said in docs/group-services.md; the state machine and the differences between the
-// protocols stand in protocols.h, what a subscriber hears in subscribers.h, the limits in types.h.
+// protocols stand in protocols.h, what a subscriber hears in subscribers.h, the limits in types.h and limits.h.
 #pragma once
 
 #include <memory>
 #include <string>
 #include <vector>
 
+#include "engine/limits.h"
 #include "engine/types.h"
 
 namespace gs {
 
 class Engine {
  public:
-  Engine();
+  explicit Engine(const Limits& limits = {});
   ~Engine();
   Engine(const Engine&) = delete;
   Engine& operator=(const Engine&) = delete;
@@ -26,13 +31,18 @@ class Engine {
   /// Applies the next ordered event.
   Outcome apply(const Event& event);
 
+  /// Work is left: a ContinueEvent is to be ordered.
+  bool busy() const;
+
   /// What `apply` would answer to this request now, changing nothing: lets a daemon refuse at once what it knows
   /// to be wrong before it gives the request to the ordering.
-  wyx_rc_t precheck(SessionId session, const Request& request) const;
+  wyx_rc_t precheck(SessionId session, const Request& request, std::uint32_t user = 0) const;
 
-  /// Whether the expiry of this timer would still change anything: its phase runs. A timer that is not awaited
-  /// need not be kept.
+  /// Whether this timer's phase still runs. A timer that is not awaited need not be kept.
   bool awaits(const TimerId& timer) const;
+
+  /// For people and tools: whom a group's protocol waits for, at most so many by name.
+  MissingVotes missing_votes(const std::string& group, std::size_t at_most) const;
 
   /// For people and tools: a group as it stands.
   struct GroupStatus {
@@ -42,6 +52,7 @@ class Engine {
     std::uint64_t seqnum = 0;
     std::string running_protocol;  // printable name; empty: none
     std::size_t subscribers = 0;
+    bool unfinished = false;  // a ContinueEvent goes on with it
   };
   std::vector<GroupStatus> status() const;
 

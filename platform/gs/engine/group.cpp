@@ -2,6 +2,9 @@
 
 #include <algorithm>
 
+#include "engine/checks.h"
+#include "engine/work.h"
+
 namespace gs {
 namespace {
 
@@ -30,18 +33,14 @@ Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
 Group::Group(std::string name)
     : name_(std::move(name)),
       member_ids_(std::make_shared<const Membership>()),
-      state_value_(std::make_shared<const Bytes>()) {}
+      state_value_{std::make_shared<const Bytes>(), nullptr} {}
 
 // ------------------------------------------------------------------------------------------------------ checks
 
 wyx_rc_t Group::check_join(const GroupAttributes& attributes, ProviderId id) const {
   if (attributes_ && attributes != *attributes_) return WYX_BAD_GROUP_ATTRIBUTES;
   // The id of a provider that is gone is free: its failure leave comes before any join that waits.
-  auto holds_id = [&](const MemberPtr& m) { return m->id == id && !m->gone(); };
-  const bool taken = std::any_of(members_.begin(), members_.end(), holds_id) ||
-                     (run_ && std::any_of(run_->changing.begin(), run_->changing.end(), holds_id)) ||
-                     std::any_of(queue_.begin(), queue_.end(), [&](const Queued& q) { return holds_id(q.who); });
-  return taken ? WYX_DUPLICATE_INSTANCE_NUMBER : WYX_OK;
+  return taken_ids_.contains(id) ? WYX_DUPLICATE_INSTANCE_NUMBER : WYX_OK;
 }
 
 wyx_rc_t Group::check_leave(const Member& member) const {
@@ -51,7 +50,7 @@ wyx_rc_t Group::check_leave(const Member& member) const {
 
 wyx_rc_t Group::check_proposal(const Member& member) const {
   if (member.stage != Member::Stage::kJoined) return WYX_NOT_A_MEMBER;
-  return run_ ? WYX_COLLIDE : WYX_OK;
+  return run_ || unfinished() ? WYX_COLLIDE : WYX_OK;
 }
 
 wyx_rc_t Group::check_expel(const Membership& expelled) const {
@@ -73,28 +72,32 @@ wyx_rc_t Group::check_vote(const Member& member) const {
 
 // ---------------------------------------------------------------------------------------------------- requests
 
-void Group::join(MemberPtr joiner, const JoinRequest& request) { queue_.push_back({std::move(joiner), request}); }
+void Group::join(MemberPtr joiner, const JoinRequest& request) {
+  taken_ids_.insert(joiner->id);
+  enqueue(std::move(joiner), request);
+}
 
 void Group::leave(const MemberPtr& member, const LeaveRequest& request) {
   member->leaving = true;
-  queue_.push_back({member, request});
+  enqueue(member, request);
 }
 
 void Group::propose(const Member& proposer, const StateChangeRequest& request, Surroundings& env) {
   Run run = new_run(WYX_STATE_VALUE_CHANGE, request.terms, proposer.id);
-  run.proposed_state = std::make_shared<const Bytes>(request.new_state);
+  run.proposed_state = env.keep(proposer, request.new_state);
   start(std::move(run), env);
 }
 
 void Group::propose(const Member& proposer, const MessageRequest& request, Surroundings& env) {
   Run run = new_run(WYX_PROVIDER_MESSAGE, request.terms, proposer.id);
-  run.message = std::make_shared<const Bytes>(request.message);
+  run.message = env.keep(proposer, request.message);
   start(std::move(run), env);
 }
 
 void Group::propose(const Member& proposer, const ExpelRequest& request, Surroundings& env) {
   Run run = new_run(WYX_EXPEL, request.terms, proposer.id);
   run.expel_info = ExpelInfo{request.deactivate_phase, request.deactivate_flag};
+  run.charge = Ledger::Charge(env.ledger, proposer.payer(), room_for(request));
   Membership listed = request.expelled;
   std::sort(listed.begin(), listed.end());
   for (const MemberPtr& m : members_)
@@ -110,7 +113,8 @@ void Group::propose(const Member& proposer, const AttributeChangeRequest& reques
 
 void Group::lose(const MemberPtr& member, std::uint32_t leave_code) {
   member->gone_code = leave_code;
-  std::erase_if(queue_, [&](const Queued& q) { return q.who == member; });
+  taken_ids_.erase(member->id);
+  if (auto waiting = queue_.find(member->place); waiting != queue_.end()) dequeue(waiting);
   if (member->ballot.open) cast_default(*member, WYX_PROVIDER_FAILED);
   if (member->stage == Member::Stage::kQueued)
     member->stage = Member::Stage::kOut;
@@ -128,51 +132,73 @@ void Group::announce(std::uint32_t summary, const Membership& about, Surrounding
 // --------------------------------------------------------------------------------------------------- the queue
 
 void Group::settle(Surroundings& env) {
-  for (;;) {
-    if (run_ && run_->missing > 0) return;
+  while (unfinished() && env.work_left > 0) {
+    const std::size_t told = env.deliveries.size();
+    const std::size_t looked_at = members_.size() + queue_.size();
     if (run_)
       end_phase(env);
-    else if (!start_next(env))
-      return;
+    else
+      start_next(env);
+    const std::size_t work = work_of_looking_at(looked_at) + work_of(std::span(env.deliveries).subspan(told));
+    env.work_left -= std::min(work, env.work_left);
   }
 }
 
-bool Group::start_next(Surroundings& env) {
-  if (start_failure_leave(env)) return true;
-  if (queue_.empty()) return false;
-  if (std::holds_alternative<LeaveRequest>(queue_.front().request))
+void Group::start_next(Surroundings& env) {
+  if (start_failure_leave(env) || queue_.empty()) return;
+  if (std::holds_alternative<LeaveRequest>(queue_.begin()->second.request))
     start_leave(env);
   else
     start_join(env);
-  return true;
 }
 
 bool Group::start_failure_leave(Surroundings& env) {
-  std::erase_if(failures_, [](const MemberPtr& m) { return m->stage == Member::Stage::kOut; });
-  if (failures_.empty()) return false;
-  const std::size_t count = batches(WYX_BATCH_LEAVES) ? failures_.size() : 1;
-  const ProtocolTerms terms{attributes_->num_phases, attributes_->time_limit};
-  Run run = new_run(WYX_FAILURE_LEAVE, terms, failures_.front()->id);
-  for (std::size_t i = 0; i < count; ++i) {
-    add_changing(run, failures_.front(), {failures_.front()->gone_code, 0});
+  std::optional<Run> run;
+  while (!failures_.empty()) {
+    const MemberPtr failed = std::move(failures_.front());
     failures_.pop_front();
+    if (failed->stage == Member::Stage::kOut) continue;
+    if (!run) run = new_run(WYX_FAILURE_LEAVE, {attributes_->num_phases, attributes_->time_limit}, failed->id);
+    add_changing(*run, failed, {failed->gone_code, 0});
+    if (!batches(WYX_BATCH_LEAVES)) break;
   }
-  start(std::move(run), env);
+  if (!run) return false;
+  start(std::move(*run), env);
   return true;
+}
+
+void Group::enqueue(MemberPtr who, std::variant<JoinRequest, LeaveRequest> request) {
+  who->place = ++last_place_;
+  queue_.emplace(last_place_, Queued{std::move(who), std::move(request)});
+}
+
+/// Takes it out and goes on to the next one.
+Group::Queued Group::dequeue(Queue::iterator& entry) {
+  Queued queued = std::move(entry->second);
+  entry = queue_.erase(entry);
+  queued.who->place = 0;
+  return queued;
+}
+
+/// It is a client no longer; its token and id are free.
+void Group::release(const Member& member, Surroundings& env) {
+  taken_ids_.erase(member.id);
+  env.clients.erase(member.to);
 }
 
 // A batch takes the leaves that ask for the same phases and time limit as the first.
 void Group::start_leave(Surroundings& env) {
-  const ProtocolTerms terms = std::get<LeaveRequest>(queue_.front().request).terms;
-  Run run = new_run(WYX_LEAVE, terms, queue_.front().who->id);
+  const Queued& first = queue_.begin()->second;
+  const ProtocolTerms terms = std::get<LeaveRequest>(first.request).terms;
+  Run run = new_run(WYX_LEAVE, terms, first.who->id);
   for (auto it = queue_.begin(); it != queue_.end();) {
-    const auto* leave = std::get_if<LeaveRequest>(&it->request);
+    const auto* leave = std::get_if<LeaveRequest>(&it->second.request);
     if (!leave || leave->terms != terms) {
       ++it;
       continue;
     }
-    add_changing(run, it->who, {run.traits->leave_code, leave->leave_code});
-    it = queue_.erase(it);
+    const LeaveCode code{run.traits->leave_code, leave->leave_code};
+    add_changing(run, dequeue(it).who, code);
     if (!batches(WYX_BATCH_LEAVES)) break;
   }
   start(std::move(run), env);
@@ -183,18 +209,17 @@ void Group::start_leave(Surroundings& env) {
 void Group::start_join(Surroundings& env) {
   std::optional<Run> run;
   for (auto it = queue_.begin(); it != queue_.end();) {
-    if (!std::holds_alternative<JoinRequest>(it->request)) {
+    if (!std::holds_alternative<JoinRequest>(it->second.request)) {
       ++it;
       continue;
     }
-    const Queued queued = std::move(*it);
-    it = queue_.erase(it);
+    const Queued queued = dequeue(it);
     const JoinRequest& join = std::get<JoinRequest>(queued.request);
     if (members_.empty() && !run) attributes_ = std::make_shared<const GroupAttributes>(join.attributes);
-    if (wyx_rc_t rc = check_join(join.attributes, queued.who->id); rc != WYX_OK) {
+    if (join.attributes != *attributes_) {
       queued.who->stage = Member::Stage::kOut;
-      env.clients.erase(queued.who->to);
-      env.deliveries.push_back(delayed_error(queued.who->to, join, rc, attributes_));
+      release(*queued.who, env);
+      env.deliveries.push_back(delayed_error(queued.who->to, join, WYX_BAD_GROUP_ATTRIBUTES, attributes_));
       continue;
     }
     if (!run) run = new_run(WYX_JOIN, {attributes_->num_phases, attributes_->time_limit}, queued.who->id);
@@ -223,14 +248,14 @@ void Group::add_changing(Run& run, MemberPtr member, LeaveCode code) const {
 GroupView Group::view() const {
   GroupView view;
   view.seqnum = seqnum_;
-  view.state = state_value_;
+  view.state = state_value_.bytes;
   view.members = member_ids_;
   return view;
 }
 
 void Group::forget_values() {
   attributes_ = nullptr;
-  state_value_ = std::make_shared<const Bytes>();
+  state_value_ = {std::make_shared<const Bytes>(), nullptr};
   seqnum_ = 0;
 }
 
@@ -247,8 +272,8 @@ void add_member(Digest& digest, const Member& m) {
   digest.add(m.ballot.vote);
   digest.add(m.ballot.default_vote);
   digest.add(m.ballot.summary);
-  digest.add(m.ballot.proposed_state.value_or(""));
-  digest.add(m.ballot.message.value_or(""));
+  digest.add(m.ballot.proposed_state.bytes);
+  digest.add(m.ballot.message.bytes);
 }
 
 template <typename List>
@@ -264,11 +289,11 @@ void Group::add_to(Digest& digest) const {
   digest.add(attributes_ != nullptr);
   if (attributes_) digest.add(*attributes_);
   add_members(digest, members_);
-  digest.add(state_value_);
+  digest.add(state_value_.bytes);
   digest.add(seqnum_);
   add_members(digest, failures_);
   digest.add(queue_.size());
-  for (const Queued& q : queue_) {
+  for (const auto& [place, q] : queue_) {
     add_member(digest, *q.who);
     digest.add(q.request.index());
     if (const auto* join = std::get_if<JoinRequest>(&q.request)) {
@@ -297,9 +322,9 @@ void Group::add_to(Digest& digest, const Run& run) {
   digest.add(run.expel_info ? run.expel_info->flag : Bytes());
   digest.add(run.new_attributes != nullptr);
   if (run.new_attributes) digest.add(*run.new_attributes);
-  digest.add(run.proposed_state);
-  digest.add(run.message);
-  digest.add(run.voted_message);
+  digest.add(run.proposed_state.bytes);
+  digest.add(run.message.bytes);
+  digest.add(run.voted_message.bytes);
   digest.add(run.voters.size());
   for (const MemberPtr& m : run.voters) digest.add(m->to);
   digest.add(run.missing);

@@ -2,12 +2,14 @@
 #pragma once
 
 #include <deque>
+#include <map>
 #include <optional>
+#include <set>
 #include <string>
 #include <variant>
 #include <vector>
 
-#include "engine/member.h"
+#include "engine/clients.h"
 #include "engine/protocols.h"
 #include "engine/subscribers.h"
 
@@ -20,6 +22,14 @@ struct Surroundings {
   SubscriberTable& subscribers;
   ClientTable& clients;
   std::uint64_t& last_protocol;  // numbers are never used twice, so a timer of a dead group's protocol finds none
+  Ledger& ledger;
+  const Limits& limits;
+  std::size_t& work_left;  // units, of this event
+
+  Value keep(const Member& whose, const Bytes& bytes) const {
+    return {std::make_shared<const Bytes>(bytes),
+            std::make_shared<const Ledger::Charge>(ledger, whose.payer(), bytes.size())};
+  }
 };
 
 /// The error that reaches a client after it has been told WYX_OK.
@@ -29,8 +39,10 @@ Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
 /// Lives from the first join's request until it has neither members nor work. Members that have died or said
 /// goodbye stay in the membership until their failure leave is approved, and are sent nothing.
 ///
-/// Every call but `settle` only takes note; `settle` then runs what can run. The check_ functions say what the
-/// request of the same name is answered; a request is made only when its check says WYX_OK.
+/// Every call but `settle` only takes note; `settle` then runs what can run. What it leaves when the event's work
+/// is used up makes the group unfinished: until it is gone on with, it answers as one whose protocol runs. The
+/// check_ functions say what the request of the same name is answered; a request is made only when its check says
+/// WYX_OK.
 class Group {
  public:
   explicit Group(std::string name);
@@ -48,27 +60,36 @@ class Group {
   void propose(const Member& proposer, const MessageRequest& request, Surroundings& env);
   void propose(const Member& proposer, const ExpelRequest& request, Surroundings& env);
   void propose(const Member& proposer, const AttributeChangeRequest& request, Surroundings& env);
-  void vote(Member& voter, const VoteRequest& request);
+  void vote(Member& voter, const VoteRequest& request, Surroundings& env);
 
   /// The provider is dead or has said goodbye. The caller has taken it out of the client table.
   void lose(const MemberPtr& member, std::uint32_t leave_code);
-  /// Whether this is the time limit of the phase that runs.
+  /// Whether this is the phase that runs.
   bool awaits(const TimerId& timer) const;
-  /// Ignored unless it is awaited.
+  /// Ignored unless that phase runs and has a time limit.
   void expire(const TimerId& timer);
   void announce(std::uint32_t summary, const Membership& about, Surroundings& env) const;
 
-  /// Runs the protocol and the queue on until they wait for a vote or there is nothing left to do.
+  /// Runs the protocol and the queue on until they wait for a vote, there is nothing left to do, or the event's
+  /// work is used up. A protocol's start, a phase's end with what follows at once, is one step.
   void settle(Surroundings& env);
+  bool unfinished() const { return run_ ? run_->missing == 0 : !failures_.empty() || !queue_.empty(); }
+  /// Whether it stands in the engine's line of unfinished groups.
+  bool in_line() const { return in_line_; }
+  void set_in_line(bool is) { in_line_ = is; }
 
   bool born() const { return !members_.empty(); }
   bool finished() const { return members_.empty() && !run_ && queue_.empty(); }
   const std::string& name() const { return name_; }
   std::shared_ptr<const GroupAttributes> attributes() const { return attributes_; }
   const Membership& member_ids() const { return *member_ids_; }
-  std::size_t state_length() const { return state_value_->size(); }
+  std::size_t state_length() const { return state_value_.bytes->size(); }
   std::uint64_t seqnum() const { return seqnum_; }
   const char* running_protocol() const { return run_ ? run_->traits->name : ""; }
+  std::uint32_t running_phase() const { return run_ ? run_->phase : 0; }
+  std::size_t missing_votes() const { return run_ ? run_->missing : 0; }
+  /// The first of those who have not voted, in the order in which they were asked.
+  std::vector<MissingVoter> missing_voters(std::size_t at_most) const;
   GroupView view() const;
   void add_to(Digest& digest) const;
 
@@ -89,9 +110,10 @@ class Group {
     std::vector<LeaveCode> leave_codes;
     std::optional<ExpelInfo> expel_info;
     std::shared_ptr<const GroupAttributes> new_attributes;
-    SharedBytes proposed_state;
-    SharedBytes message;
-    SharedBytes voted_message;      // the last one of this phase's votes
+    Value proposed_state;
+    Value message;
+    Value voted_message;            // the last one of this phase's votes
+    Ledger::Charge charge;          // for what else its request has brought
     std::vector<MemberPtr> voters;  // of this phase
     std::size_t missing = 0;        // votes
     std::uint32_t collect = 0;      // WYX_COLLECT_ flags of the group as it was at the start
@@ -99,13 +121,18 @@ class Group {
     std::uint32_t defaults = 0;     // summary flags of the default votes counted so far
   };
 
+  using Queue = std::map<std::uint64_t, Queued>;  // by place
+
   static void add_to(Digest& digest, const Run& run);
 
   // The queue (group.cpp).
-  bool start_next(Surroundings& env);
+  void start_next(Surroundings& env);
   bool start_failure_leave(Surroundings& env);
   void start_leave(Surroundings& env);
   void start_join(Surroundings& env);
+  void enqueue(MemberPtr who, std::variant<JoinRequest, LeaveRequest> request);
+  Queued dequeue(Queue::iterator& entry);
+  void release(const Member& member, Surroundings& env);
   bool batches(wyx_batch_ctrl_t what) const { return (attributes_->batch_control & what) != 0; }
   Run new_run(wyx_request_t type, const ProtocolTerms& terms, ProviderId proposed_by) const;
   void add_changing(Run& run, MemberPtr member, LeaveCode code) const;
@@ -114,10 +141,11 @@ class Group {
   void start(Run run, Surroundings& env);
   void open_phase(Surroundings& env);
   void end_phase(Surroundings& env);
-  void collect(const std::optional<Bytes>& value, std::uint32_t flag, std::optional<Bytes>& into);
+  void collect(const Value& value, std::uint32_t flag, Value& into);
   void cast_default(Member& voter, std::uint32_t cause);
   void approve(std::uint32_t summary, Surroundings& env);
   void reject(std::uint32_t summary, Surroundings& env);
+  static void end(const Run& run, const std::vector<MemberPtr>& audience);
   void change_membership(const Run& run);
   void dismiss(const Run& run, Surroundings& env);
   void tell_subscribers(const Run& run, bool was_born, Surroundings& env);
@@ -133,11 +161,14 @@ class Group {
   std::shared_ptr<const GroupAttributes> attributes_;  // null until the first join starts
   std::vector<MemberPtr> members_;                     // in join order
   SharedMembership member_ids_;                        // theirs
-  SharedBytes state_value_;
+  std::set<ProviderId> taken_ids_;                     // of members, joiners and queued joins that are not gone
+  Value state_value_;
   std::uint64_t seqnum_ = 0;  // of the last event
   std::optional<Run> run_;
   std::deque<MemberPtr> failures_;  // gone; those that are no members when their turn comes are passed over
-  std::deque<Queued> queue_;        // joins and leaves
+  Queue queue_;                     // joins and leaves
+  std::uint64_t last_place_ = 0;
+  bool in_line_ = false;
 };
 
 }  // namespace gs

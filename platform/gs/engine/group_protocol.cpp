@@ -31,6 +31,10 @@ void Group::start(Run run, Surroundings& env) {
     for (const MemberPtr& m : run.changing) ids.push_back(m->id);
     run.changing_ids = std::make_shared<const Membership>(std::move(ids));
   }
+  for (const MemberPtr& m : run.changing) m->changing = true;
+  const std::uint16_t longest = env.limits.max_phase_time;
+  if (longest != 0 && (run.terms.time_limit == 0 || run.terms.time_limit > longest))
+    run.terms.time_limit = longest;
   run.number = ++env.last_protocol;
   run.collect = attributes_->batch_control & WYX_COLLECT_ALL_RESULT;
   run_ = std::move(run);
@@ -47,11 +51,8 @@ void Group::open_phase(Surroundings& env) {
 
   run.voters.clear();
   const bool changing_vote = run.traits->changing_role == ChangingRole::kVote;
-  auto changes = [&](const MemberPtr& m) {
-    return std::find(run.changing.begin(), run.changing.end(), m) != run.changing.end();
-  };
   for (const MemberPtr& m : members_)
-    if (!m->gone() && (run.changing.empty() || changing_vote || !changes(m))) run.voters.push_back(m);
+    if (!m->gone() && !m->changing) run.voters.push_back(m);
   for (const MemberPtr& m : run.changing)
     if (changing_vote && !m->gone()) run.voters.push_back(m);
   run.missing = run.voters.size();
@@ -67,29 +68,33 @@ void Group::open_phase(Surroundings& env) {
     m->ballot.default_vote = default_vote;
   }
   if (run.voted_message && run.traits->message_is_proposal) run.message = run.voted_message;
-  run.voted_message = nullptr;
+  run.voted_message = {};
   note.seqnum = ++seqnum_;
   send(run, std::move(note), run.voters, env);
-  if (run.terms.time_limit != 0) env.timers.push_back({{name_, run.number, run.phase}, run.terms.time_limit});
+  env.timers.push_back({{name_, run.number, run.phase}, run.terms.time_limit});
 }
 
-void Group::vote(Member& voter, const VoteRequest& request) {
+void Group::vote(Member& voter, const VoteRequest& request, Surroundings& env) {
   Ballot& ballot = voter.ballot;
   ballot.open = false;
   ballot.vote = request.vote;
   ballot.summary = summary_of(request.vote, false);
   if (request.default_vote != WYX_NULL_VOTE) ballot.default_vote = request.default_vote;
-  if (request.proposed_state) run_->proposed_state = std::make_shared<const Bytes>(*request.proposed_state);
-  if (request.message) run_->voted_message = std::make_shared<const Bytes>(*request.message);
-  collect(request.proposed_state, WYX_COLLECT_STATEVALUE_RESULT, ballot.proposed_state);
-  collect(request.message, WYX_COLLECT_MSG_RESULT, ballot.message);
+  if (request.proposed_state) {
+    run_->proposed_state = env.keep(voter, *request.proposed_state);
+    collect(run_->proposed_state, WYX_COLLECT_STATEVALUE_RESULT, ballot.proposed_state);
+  }
+  if (request.message) {
+    run_->voted_message = env.keep(voter, *request.message);
+    collect(run_->voted_message, WYX_COLLECT_MSG_RESULT, ballot.message);
+  }
   --run_->missing;
 }
 
 /// Values over the limit are left out, so that no notification grows with the number of voters without bound.
-void Group::collect(const std::optional<Bytes>& value, std::uint32_t flag, std::optional<Bytes>& into) {
-  if (!(run_->collect & flag) || !value || run_->collected + value->size() > kMaxCollected) return;
-  run_->collected += value->size();
+void Group::collect(const Value& value, std::uint32_t flag, Value& into) {
+  if (!(run_->collect & flag) || run_->collected + value.bytes->size() > kMaxCollected) return;
+  run_->collected += value.bytes->size();
   into = value;
 }
 
@@ -110,9 +115,19 @@ bool Group::awaits(const TimerId& timer) const {
 }
 
 void Group::expire(const TimerId& timer) {
-  if (!awaits(timer)) return;
+  if (!awaits(timer) || run_->terms.time_limit == 0) return;
   for (const MemberPtr& m : run_->voters)
     if (m->ballot.open) cast_default(*m, WYX_TIME_LIMIT_EXCEEDED);
+}
+
+std::vector<MissingVoter> Group::missing_voters(std::size_t at_most) const {
+  std::vector<MissingVoter> missing;
+  if (!run_) return missing;
+  for (const MemberPtr& m : run_->voters) {
+    if (missing.size() == at_most) break;
+    if (m->ballot.open) missing.push_back({m->to, m->id, m->local_name});
+  }
+  return missing;
 }
 
 void Group::end_phase(Surroundings& env) {
@@ -130,7 +145,7 @@ void Group::end_phase(Surroundings& env) {
     case PhaseEnd::kReject:
       return reject(rejects, env);
     case PhaseEnd::kApproveRejected:
-      run.proposed_state = nullptr;
+      run.proposed_state = {};
       return approve(rejects, env);
     case PhaseEnd::kApprove:
       return approve(run.defaults != 0 ? run.defaults : std::uint32_t{WYX_EXPLICIT_APPROVE}, env);
@@ -153,7 +168,7 @@ void Group::approve(std::uint32_t summary, Surroundings& env) {
   note.seqnum = ++seqnum_;
   send(run, std::move(note), audience, env);
 
-  for (const MemberPtr& m : audience) m->ballot = {};
+  end(run, audience);
   if (run.traits->changing_role == ChangingRole::kHearEnd) dismiss(run, env);
   tell_subscribers(run, was_born, env);
   if (!born()) forget_values();
@@ -168,14 +183,19 @@ void Group::reject(std::uint32_t summary, Surroundings& env) {
   note.seqnum = ++seqnum_;
   send(run, std::move(note), audience, env);
 
-  for (const MemberPtr& m : audience) m->ballot = {};
+  end(run, audience);
   if (joins) {
     for (const MemberPtr& m : run.changing) {
       m->stage = Member::Stage::kOut;
-      if (!m->gone()) env.clients.erase(m->to);
+      if (!m->gone()) release(*m, env);
     }
   }
   if (!born()) forget_values();
+}
+
+void Group::end(const Run& run, const std::vector<MemberPtr>& audience) {
+  for (const MemberPtr& m : audience) m->ballot = {};
+  for (const MemberPtr& m : run.changing) m->changing = false;
 }
 
 void Group::change_membership(const Run& run) {
@@ -196,14 +216,13 @@ void Group::change_membership(const Run& run) {
 void Group::dismiss(const Run& run, Surroundings& env) {
   std::shared_ptr<const Notification> dissolved;
   for (const MemberPtr& m : run.changing) {
-    auto waiting = std::find_if(queue_.begin(), queue_.end(), [&](const Queued& q) { return q.who == m; });
-    if (waiting != queue_.end()) {
+    if (auto waiting = queue_.find(m->place); waiting != queue_.end()) {
+      const Queued leave = dequeue(waiting);
       env.deliveries.push_back(
-          delayed_error(m->to, std::get<LeaveRequest>(waiting->request), WYX_NOT_A_MEMBER, nullptr));
-      queue_.erase(waiting);
+          delayed_error(m->to, std::get<LeaveRequest>(leave.request), WYX_NOT_A_MEMBER, nullptr));
     }
     if (m->gone()) continue;
-    env.clients.erase(m->to);
+    release(*m, env);
     if (run.traits->type != WYX_EXPEL) continue;
     if (!dissolved)
       dissolved = std::make_shared<const Notification>(AnnouncementNotification{WYX_GROUP_DISSOLVED, nullptr});
@@ -213,7 +232,7 @@ void Group::dismiss(const Run& run, Surroundings& env) {
 
 void Group::tell_subscribers(const Run& run, bool was_born, Surroundings& env) {
   GroupView now = view();
-  now.state_changed = run.proposed_state != nullptr;
+  now.state_changed = run.proposed_state.bytes != nullptr;
   if (run.traits->changing_role == ChangingRole::kVote) now.joined = run.changing_ids;
   if (run.traits->changing_role == ChangingRole::kHearEnd) {
     now.left = run.changing_ids;
@@ -243,7 +262,7 @@ ProtocolNotification Group::compose(const Run& run, wyx_notification_type_t type
   p.proposed_by = run.proposed_by;
   p.whats_changed = WYX_CURRENT_STATE_VALUE;
   p.current_providers = member_ids_;
-  p.current_state = state_value_;
+  p.current_state = state_value_.bytes;
   if (run.changing_ids) {
     p.whats_changed |=
         bit(WYX_PROPOSED_MEMBERSHIP, WYX_ONGOING_MEMBERSHIP, WYX_UPDATED_MEMBERSHIP, WYX_REJECTED_MEMBERSHIP);
@@ -257,15 +276,15 @@ ProtocolNotification Group::compose(const Run& run, wyx_notification_type_t type
   // An approved value is the current one; a rejected one is gone.
   if (run.proposed_state) {
     p.whats_changed |= bit(WYX_PROPOSED_STATE_VALUE, WYX_ONGOING_STATE_VALUE, WYX_UPDATED_STATE_VALUE, 0);
-    if (!approved && !rejected) p.proposed_state = run.proposed_state;
+    if (!approved && !rejected) p.proposed_state = run.proposed_state.bytes;
   }
   if (run.new_attributes) {
     p.whats_changed |= bit(WYX_PROPOSED_GROUP_ATTRIBUTES, WYX_ONGOING_GROUP_ATTRIBUTES,
                            WYX_UPDATED_GROUP_ATTRIBUTES, WYX_REJECTED_GROUP_ATTRIBUTES);
     p.new_attributes = run.new_attributes;
   }
-  p.message = run.voted_message;
-  if (!p.message && !rejected) p.message = run.message;
+  p.message = run.voted_message.bytes;
+  if (!p.message && !rejected) p.message = run.message.bytes;
   if (p.message) p.whats_changed |= WYX_UPDATED_PROVIDER_MESSAGE;
   add_vote_results(run, p);
   return note;
@@ -280,31 +299,25 @@ void Group::add_vote_results(const Run& run, Proposal& proposal) const {
     if (run.collect & WYX_COLLECT_VOTE_RESULT) result.vote = m->ballot.vote;
     result.summary = m->ballot.summary;
     result.leave_code = is_default(m->ballot) ? m->gone_code : 0;
-    result.proposed_state = m->ballot.proposed_state;
-    result.message = m->ballot.message;
-    const bool changes = std::find(run.changing.begin(), run.changing.end(), m) != run.changing.end();
-    (changes ? proposal.changing_vote_results : proposal.current_vote_results).push_back(std::move(result));
+    result.proposed_state = m->ballot.proposed_state.bytes;
+    result.message = m->ballot.message.bytes;
+    (m->changing ? proposal.changing_vote_results : proposal.current_vote_results).push_back(std::move(result));
   }
 }
 
 /// One notification for all, but for those who read their own id as the proposer's.
 void Group::send(const Run& run, ProtocolNotification notification, const std::vector<MemberPtr>& to,
                  Surroundings& env) const {
-  std::map<Endpoint, std::shared_ptr<const Notification>> own;
-  if (run.traits->each_proposes_itself) {
-    for (const MemberPtr& m : run.changing) {
-      if (m->gone() || m->id == run.proposed_by) continue;
-      ProtocolNotification copy = notification;
-      copy.proposal.proposed_by = m->id;
-      own[m->to] = std::make_shared<const Notification>(std::move(copy));
-    }
-  }
   const auto shared = std::make_shared<const Notification>(std::move(notification));
-  env.deliveries.reserve(env.deliveries.size() + to.size());
   for (const MemberPtr& m : to) {
     if (m->gone()) continue;
-    auto it = own.find(m->to);
-    env.deliveries.push_back({m->to, it == own.end() ? shared : it->second});
+    auto what = shared;
+    if (run.traits->each_proposes_itself && m->changing && m->id != run.proposed_by) {
+      ProtocolNotification own = std::get<ProtocolNotification>(*shared);
+      own.proposal.proposed_by = m->id;
+      what = std::make_shared<const Notification>(std::move(own));
+    }
+    env.deliveries.push_back({m->to, std::move(what)});
   }
 }
 

@@ -1,10 +1,10 @@
-// A provider as its group sees it, and the table of all clients.
+// A provider as its group sees it.
 #pragma once
 
-#include <map>
 #include <memory>
 #include <string>
 
+#include "engine/ledger.h"
 #include "engine/types.h"
 
 namespace gs {
@@ -15,8 +15,8 @@ struct Ballot {
   wyx_vote_value_t vote = WYX_NULL_VOTE;          // in this phase
   wyx_vote_value_t default_vote = WYX_NULL_VOTE;  // given with an earlier vote; WYX_NULL_VOTE: the group's
   std::uint32_t summary = 0;                      // flags of wyx_summary_code_t, of the vote
-  std::optional<Bytes> proposed_state;            // kept only where vote results are collected
-  std::optional<Bytes> message;
+  Value proposed_state;                           // kept only where vote results are collected
+  Value message;
 };
 
 struct Member {
@@ -27,26 +27,23 @@ struct Member {
     kOut,
   };
   Endpoint to;
+  std::uint32_t user = 0;
   ProviderId id;
   std::string local_name;
   Stage stage = Stage::kQueued;
-  bool leaving = false;  // its leave waits or runs
+  bool leaving = false;   // its leave waits or runs
+  bool changing = false;  // the running protocol changes its membership
   std::uint32_t gone_code =
-      0;  // flags of wyx_leave_code_t once it has died or said goodbye: it hears nothing more
+      0;                    // flags of wyx_leave_code_t once it has died or said goodbye: it hears nothing more
+  std::uint64_t place = 0;  // in its group's queue; 0: nothing of it waits
   Ballot ballot;
+  Ledger::Charge charge;  // for its being there, names included
 
   bool gone() const { return gone_code != 0; }
+  Payer payer() const { return {to.session, user}; }
 };
 
 /// Shared by its group's lists and the client table.
 using MemberPtr = std::shared_ptr<Member>;
-
-struct Client {
-  std::string group;
-  MemberPtr provider;  // null: a subscriber
-};
-
-/// Everybody who may make a request with a token, and be sent something.
-using ClientTable = std::map<Endpoint, Client>;
 
 }  // namespace gs

@@ -60,13 +60,14 @@ GroupView as_first(const GroupView& view) {
 
 }  // namespace
 
-void SubscriberTable::add(const std::string& group, const Subscriber& subscriber) {
-  groups_[group].push_back(subscriber);
+std::uint64_t SubscriberTable::add(const std::string& group, const Subscriber& subscriber) {
+  groups_[group].emplace(++last_subscription_, subscriber);
+  return last_subscription_;
 }
 
-void SubscriberTable::remove(const std::string& group, const Endpoint& endpoint) {
+void SubscriberTable::remove(const std::string& group, std::uint64_t subscription) {
   auto it = groups_.find(group);
-  std::erase_if(it->second, [&](const Subscriber& s) { return s.to == endpoint; });
+  it->second.erase(subscription);
   if (it->second.empty()) groups_.erase(it);
 }
 
@@ -85,14 +86,14 @@ void SubscriberTable::born(const std::string& group, const GroupView& view, std:
   if (it == groups_.end()) return;
   const GroupView first = as_first(view);
   NoteCache notes(first);
-  for (const Subscriber& s : it->second) out.push_back({s.to, notes.of(first_type(s.control))});
+  for (const auto& [number, s] : it->second) out.push_back({s.to, notes.of(first_type(s.control))});
 }
 
 void SubscriberTable::changed(const std::string& group, const GroupView& view, std::vector<Delivery>& out) const {
   auto it = groups_.find(group);
   if (it == groups_.end()) return;
   NoteCache notes(view);
-  for (const Subscriber& s : it->second) {
+  for (const auto& [number, s] : it->second) {
     const std::uint32_t type = changed_type(s.control, view);
     if (type != 0) out.push_back({s.to, notes.of(type)});
   }
@@ -106,7 +107,7 @@ std::vector<Endpoint> SubscriberTable::ended(const std::string& group, const Gro
   GroupView last = view;
   last.state = std::make_shared<const Bytes>();
   NoteCache notes(view), last_notes(last);
-  for (const Subscriber& s : it->second) {
+  for (const auto& [number, s] : it->second) {
     const std::uint32_t type = changed_type(s.control, view);
     if (s.control & WYX_SUBSCRIBE_PERSISTENCE) {
       const std::uint32_t state = s.control & WYX_SUBSCRIPTION_STATE;
@@ -117,7 +118,7 @@ std::vector<Endpoint> SubscriberTable::ended(const std::string& group, const Gro
     out.push_back({s.to, notes.of(WYX_SUBSCRIPTION_DISSOLVED)});
     over.push_back(s.to);
   }
-  std::erase_if(it->second, [](const Subscriber& s) { return !(s.control & WYX_SUBSCRIBE_PERSISTENCE); });
+  std::erase_if(it->second, [](const auto& s) { return !(s.second.control & WYX_SUBSCRIBE_PERSISTENCE); });
   if (it->second.empty()) groups_.erase(it);
   return over;
 }
@@ -127,7 +128,7 @@ void SubscriberTable::add_to(Digest& digest) const {
   for (const auto& [name, subscribers] : groups_) {
     digest.add(name);
     digest.add(subscribers.size());
-    for (const Subscriber& s : subscribers) {
+    for (const auto& [number, s] : subscribers) {
       digest.add(s.to);
       digest.add(s.control);
     }

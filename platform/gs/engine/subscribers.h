@@ -40,9 +40,10 @@ struct GroupView {
 /// end its subscription in the client. It gets a first notification again when the group is born again.
 class SubscriberTable {
  public:
-  void add(const std::string& group, const Subscriber& subscriber);
+  /// Returns the subscription's number, greater than those before it.
+  std::uint64_t add(const std::string& group, const Subscriber& subscriber);
   /// It must be one of the group's.
-  void remove(const std::string& group, const Endpoint& endpoint);
+  void remove(const std::string& group, std::uint64_t subscription);
   std::size_t count(const std::string& group) const;
 
   /// The first notification of a group that is there already.
@@ -56,7 +57,8 @@ class SubscriberTable {
   void add_to(Digest& digest) const;
 
  private:
-  std::map<std::string, std::vector<Subscriber>> groups_;
+  std::map<std::string, std::map<std::uint64_t, Subscriber>> groups_;  // by number
+  std::uint64_t last_subscription_ = 0;
 };
 
 }  // namespace gs

@@ -190,6 +190,7 @@ std::string body(const TimerExpiredEvent& e) {
 std::string body(const ResponsivenessEvent& e) {
   return name_of(e.session) + (e.responding ? ": responds" : ": does not respond");
 }
+std::string body(const ContinueEvent&) { return "unfinished work goes on"; }
 
 }  // namespace
 

@@ -148,11 +148,13 @@ using Request =
 
 /// A client's request. `answered`: its daemon has already said WYX_OK to the client (from precheck), so a refusal
 /// found now goes out as a delayed error. None may be ordered after its session's SessionGoneEvent; those of a
-/// host that is gone are refused with WYX_NO_INIT.
+/// host that is gone are refused with WYX_NO_INIT. `user`: the session's, in all its events; what is kept on the
+/// request's account is charged to both.
 struct RequestEvent {
   SessionId session;
   Request request;
   bool answered = false;
+  std::uint32_t user = 0;  // 0: root
 };
 /// A client has quit or died; its providers fail, its subscriptions end.
 struct SessionGoneEvent {
@@ -183,8 +185,11 @@ struct ResponsivenessEvent {
   bool responding = false;
 };
 
+/// Goes on with what earlier events have left to do. To be ordered while Engine::busy.
+struct ContinueEvent {};
+
 using Event = std::variant<RequestEvent, SessionGoneEvent, HostGoneEvent, HostCameEvent, TimerExpiredEvent,
-                           ResponsivenessEvent>;
+                           ResponsivenessEvent, ContinueEvent>;
 
 // --------------------------------------------------------------------------------------------- notifications
 
@@ -199,9 +204,8 @@ struct VoteResult {
   wyx_vote_value_t vote = WYX_NULL_VOTE;
   std::uint32_t summary = 0;  // flags of wyx_summary_code_t
   std::uint32_t leave_code = 0;
-  std::optional<Bytes> proposed_state;
-  std::optional<Bytes> message;
-  bool operator==(const VoteResult&) const = default;
+  SharedBytes proposed_state;
+  SharedBytes message;
 };
 
 struct ExpelInfo {
@@ -265,10 +269,23 @@ struct Delivery {
   std::shared_ptr<const Notification> what;
 };
 
-/// Asks that TimerExpiredEvent{id} be ordered after `seconds`.
+/// A phase has opened: asks that TimerExpiredEvent{id} be ordered after `seconds`.
 struct TimerRequest {
   TimerId id;
-  std::uint16_t seconds = 0;
+  std::uint16_t seconds = 0;  // 0: the phase has no time limit
+};
+
+/// Somebody who has been asked to vote and has not.
+struct MissingVoter {
+  Endpoint to;
+  ProviderId id;
+  std::string local_name;
+};
+struct MissingVotes {
+  std::string protocol;  // printable name; empty: none runs
+  std::uint32_t phase = 0;
+  std::size_t count = 0;
+  std::vector<MissingVoter> voters;  // the first of them, in the order in which they were asked
 };
 
 /// What came of one ordered event. `rc` answers a RequestEvent; where it was answered before, a refusal is among

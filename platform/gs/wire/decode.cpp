@@ -163,7 +163,7 @@ class Reader {
     for (const fb::VoteResult* r : *results) {
       values.push_back({value(r->voter()), enumeration<wyx_vote_value_t>(r->vote()),
                         flags(r->summary(), kSummaryBits), flags(r->leave_code(), kLeaveCodeBits),
-                        optional_bytes(r->proposed_state()), optional_bytes(r->message())});
+                        shared_bytes(r->proposed_state()), shared_bytes(r->message())});
     }
     return values;
   }
