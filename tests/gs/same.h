@@ -1,5 +1,4 @@
-// Deep equality of what the engine and the wire say: what pointers point at is compared, not the pointers. And
-// which protocol a request asks for.
+// Deep equality of what the engine and the wire say: what pointers point at is compared, not the pointers.
 #pragma once
 
 #include <algorithm>
@@ -83,14 +82,5 @@ struct Same {
   }
 };
 inline constexpr Same same;
-
-/// WYX_INTERNAL_REQUEST: none.
-inline wyx_request_t protocol_of(const Request& request) {
-  static constexpr wyx_request_t kTypes[] = {
-      WYX_JOIN,         WYX_STATE_VALUE_CHANGE,     WYX_PROVIDER_MESSAGE, WYX_LEAVE,
-      WYX_EXPEL,        WYX_GROUP_ATTRIBUTE_CHANGE, WYX_INTERNAL_REQUEST, WYX_INTERNAL_REQUEST,
-      WYX_SUBSCRIPTION, WYX_INTERNAL_REQUEST};
-  return kTypes[request.index()];
-}
 
 }  // namespace gs

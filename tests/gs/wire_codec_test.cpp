@@ -113,14 +113,26 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
       [](N& n) { n.proposal.whats_changed = 0x40000; },
       [](N& n) { n.proposal.leave_codes.push_back({}); },
       [](N& n) { n.proposal.changing_providers = nullptr; },
+      [](N& n) { n.protocol = WYX_SUBSCRIPTION; },
+      [](N& n) { n.proposal.phase = 0; },
+      [](N& n) { n.proposal.current_providers = nullptr; },
+      [](N& n) { n.proposal.expel_info.reset(); },
+      [](N& n) { n.proposal.whats_changed |= WYX_MERGE_GROUP_INFO; },
       [](N& n) { n.proposal.current_vote_results[0].vote = static_cast<wyx_vote_value_t>(128); }};
   std::vector<Notification> bad = {
-      DelayedErrorNotification{WYX_JOIN, static_cast<wyx_rc_t>(38), GoodbyeRequest{}, nullptr},
-      SubscriptionNotification{0x400, nullptr, nullptr, nullptr, {}, 1}};
+      DelayedErrorNotification{WYX_JOIN, static_cast<wyx_rc_t>(38), JoinRequest{}, nullptr},
+      DelayedErrorNotification{WYX_JOIN, WYX_COLLIDE, VoteRequest{}, nullptr},
+      DelayedErrorNotification{WYX_JOIN, WYX_OK, JoinRequest{}, nullptr},
+      AnnouncementNotification{WYX_GROUP_DISSOLVED | WYX_RESPONSIVENESS_RESPONSE, nullptr},
+      AnnouncementNotification{WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY, nullptr}};
+  for (const int type :
+       {0x400, +WYX_SUBSCRIPTION_GS_HAS_DIED, +WYX_SUBSCRIPTION_STATE, +WYX_SUBSCRIPTION_MEMBERSHIP,
+        +WYX_SUBSCRIPTION_DELTA_JOIN, WYX_SUBSCRIPTION_DISSOLVED | WYX_SUBSCRIPTION_PERSISTENT})
+    bad.push_back(SubscriptionNotification{static_cast<std::uint32_t>(type), nullptr, nullptr, nullptr, {}, 1});
   for (const auto& change : changes) change(std::get<N>(bad.emplace_back(samples::full_protocol())));
-  for (const Notification& n : bad)
-    EXPECT_NE(problem_of_built(ServerMessage(Notify{-1, std::make_shared<const Notification>(n)})), "")
-        << n.index();
+  for (std::size_t i = 0; i < bad.size(); ++i)
+    EXPECT_NE(problem_of_built(ServerMessage(Notify{-1, std::make_shared<const Notification>(bad[i])})), "") << i;
+  EXPECT_NE(problem_of_built(ServerMessage(Welcome{0x8000, 1, 1})), "");
 
   N huge = samples::full_protocol();
   const auto value = std::make_shared<const Bytes>(kMaxStateValue, 'v');

@@ -3,6 +3,7 @@
 
 #include <vector>
 
+#include "engine/protocols.h"
 #include "gs/same.h"
 
 namespace gs::wire::samples {
@@ -81,10 +82,18 @@ inline ProtocolNotification full_protocol(std::size_t state_size = 5) {
   return n;
 }
 
+/// With what every one has, and nothing else.
+inline ProtocolNotification plain_protocol() {
+  ProtocolNotification n;
+  n.proposal.current_providers = members({});
+  n.proposal.current_state = bytes("");
+  return n;
+}
+
 inline std::vector<Notification> notifications() {
   std::vector<Notification> all = {
       full_protocol(),
-      ProtocolNotification{},
+      plain_protocol(),
       AnnouncementNotification{WYX_RESPONSIVENESS_NO_RESPONSE, members({{8, 9}})},
       AnnouncementNotification{WYX_GROUP_DISSOLVED, nullptr},
       SubscriptionNotification{WYX_SUBSCRIPTION_STATE | WYX_SUBSCRIPTION_DELTA_LEAVE,

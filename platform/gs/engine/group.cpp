@@ -6,19 +6,6 @@
 #include "engine/work.h"
 
 namespace gs {
-namespace {
-
-wyx_request_t protocol_of(const Request& request) {
-  // A vote, a goodbye and an unsubscription are no protocols.
-  static constexpr wyx_request_t kTypes[] = {
-      WYX_JOIN,         WYX_STATE_VALUE_CHANGE,     WYX_PROVIDER_MESSAGE, WYX_LEAVE,
-      WYX_EXPEL,        WYX_GROUP_ATTRIBUTE_CHANGE, WYX_INTERNAL_REQUEST, WYX_INTERNAL_REQUEST,
-      WYX_SUBSCRIPTION, WYX_INTERNAL_REQUEST};
-  static_assert(std::size(kTypes) == std::variant_size_v<Request>);
-  return kTypes[request.index()];
-}
-
-}  // namespace
 
 Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
                        std::shared_ptr<const GroupAttributes> group_attributes) {

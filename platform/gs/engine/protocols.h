@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <iterator>
 
 #include "engine/types.h"
 
@@ -39,6 +40,23 @@ constexpr const ProtocolTraits& traits_of(wyx_request_t type) {
   for (const ProtocolTraits& traits : kProtocols)
     if (traits.type == type) return traits;
   return kProtocols[0];
+}
+
+constexpr bool is_protocol(wyx_request_t type) {
+  for (const ProtocolTraits& traits : kProtocols)
+    if (traits.type == type) return true;
+  return false;
+}
+
+/// What a request asks for, as its delayed error names it: a protocol or a subscription; a vote, a goodbye and an
+/// unsubscription are WYX_INTERNAL_REQUEST.
+constexpr wyx_request_t protocol_of(const Request& request) {
+  constexpr wyx_request_t kTypes[] = {
+      WYX_JOIN,         WYX_STATE_VALUE_CHANGE,     WYX_PROVIDER_MESSAGE, WYX_LEAVE,
+      WYX_EXPEL,        WYX_GROUP_ATTRIBUTE_CHANGE, WYX_INTERNAL_REQUEST, WYX_INTERNAL_REQUEST,
+      WYX_SUBSCRIPTION, WYX_INTERNAL_REQUEST};
+  static_assert(std::size(kTypes) == std::variant_size_v<Request>);
+  return kTypes[request.index()];
 }
 
 /// What the end of a phase leads to.

@@ -13,7 +13,7 @@ namespace {
 static_assert(std::endian::native == std::endian::little, "packet headers are written as they lie in memory");
 
 constexpr std::uint32_t kMagic = 0x50445347;  // "GSDP"
-constexpr std::uint16_t kPacketVersion = 1;    // of header and slicing; the schema has kProtocolVersion
+constexpr std::uint16_t kPacketVersion = 1;   // of header and slicing; the schema has kProtocolVersion
 constexpr std::uint16_t kFirst = 1;           // flag: first packet of its message
 constexpr std::uint16_t kLast = 2;            // flag: last packet of its message
 

@@ -2,6 +2,7 @@
 
 #include "gs_generated.h"
 #include "wire/codec.h"
+#include "wire/coherence.h"
 #include "wire/enumerations.h"
 #include "wire/fb_codec.h"
 
@@ -17,9 +18,19 @@ using FbVoteResults = flatbuffers::Vector<flatbuffers::Offset<fb::VoteResult>>;
 /// used.
 class Reader {
  public:
+  explicit Reader(std::size_t message_size) : left_(message_size) {}
+
   const char* problem() const { return problem_; }
   void fail(const char* why) {
     if (problem_ == nullptr) problem_ = why;
+  }
+
+  /// Parts of a FlatBuffer may lie in one another, and little could grow to more than there is memory. True: the
+  /// parts read so far are no larger than their message.
+  bool take(std::size_t size) {
+    if (size > left_) fail("parts that lie in one another");
+    left_ -= std::min(size, left_);
+    return problem_ == nullptr;
   }
 
   template <typename E>
@@ -34,7 +45,13 @@ class Reader {
     return value;
   }
 
+  std::uint32_t node_number(std::uint32_t value) {
+    if (value > kMaxNodeNumber) fail("a number that no node has");
+    return value;
+  }
+
   std::string name(const flatbuffers::String* text) {
+    if (!take(text->size())) return {};
     if (text->size() > kMaxWireName) {
       fail("a name over the limit");
       return {};
@@ -44,11 +61,14 @@ class Reader {
     return value;
   }
 
-  static Bytes bytes(const FbBytes* data) { return {reinterpret_cast<const char*>(data->data()), data->size()}; }
-  static std::optional<Bytes> optional_bytes(const FbBytes* data) {
+  Bytes bytes(const FbBytes* data) {
+    if (!take(data->size())) return {};
+    return {reinterpret_cast<const char*>(data->data()), data->size()};
+  }
+  std::optional<Bytes> optional_bytes(const FbBytes* data) {
     return data == nullptr ? std::nullopt : std::optional<Bytes>(bytes(data));
   }
-  static SharedBytes shared_bytes(const FbBytes* data) {
+  SharedBytes shared_bytes(const FbBytes* data) {
     return data == nullptr ? nullptr : std::make_shared<const Bytes>(bytes(data));
   }
 
@@ -57,13 +77,14 @@ class Reader {
     return {enumeration<wyx_num_phases_t>(terms->num_phases()), terms->time_limit()};
   }
 
-  static Membership members(const FbProviders* ids) {
+  Membership members(const FbProviders* ids) {
     Membership result;
+    if (!take(ids->size() * sizeof(fb::ProviderId))) return result;
     result.reserve(ids->size());
     std::transform(ids->begin(), ids->end(), std::back_inserter(result), [](auto* id) { return value(id); });
     return result;
   }
-  static SharedMembership shared_members(const FbProviders* ids) {
+  SharedMembership shared_members(const FbProviders* ids) {
     return ids == nullptr ? nullptr : std::make_shared<const Membership>(members(ids));
   }
 
@@ -72,6 +93,7 @@ class Reader {
     if (codes == nullptr) return {};
     if (changing == nullptr || codes->size() != changing->size()) fail("leave codes that match no providers");
     std::vector<LeaveCode> result;
+    if (!take(codes->size() * sizeof(fb::LeaveCode))) return result;
     result.reserve(codes->size());
     for (const fb::LeaveCode* code : *codes) {
       result.push_back({flags(code->voluntary_or_failure(), kLeaveCodeBits), code->voluntary_code()});
@@ -158,7 +180,7 @@ class Reader {
 
   std::vector<VoteResult> votes(const FbVoteResults* results) {
     std::vector<VoteResult> values;
-    if (results == nullptr) return values;
+    if (results == nullptr || !take(results->size() * sizeof(fb::ProviderId))) return values;
     values.reserve(results->size());
     for (const fb::VoteResult* r : *results) {
       values.push_back({value(r->voter()), enumeration<wyx_vote_value_t>(r->vote()),
@@ -238,6 +260,7 @@ class Reader {
 
  private:
   const char* problem_ = nullptr;
+  std::size_t left_;  // bytes of the message that no part has taken
 };
 
 ClientMessage Reader::client_message(const fb::ClientMessage& m) {
@@ -273,14 +296,18 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
   switch (m.body_type()) {
     case fb::ServerBody::Welcome: {
       const auto* welcome = m.body_as_Welcome();
-      return Welcome{welcome->node_number(), welcome->session_number(), welcome->cookie()};
+      return Welcome{node_number(welcome->node_number()), welcome->session_number(), welcome->cookie()};
     }
     case fb::ServerBody::Answer:
       return Answer{enumeration<wyx_rc_t>(m.body_as_Answer()->rc())};
     case fb::ServerBody::NodeInfo:
-      return NodeInfo{m.body_as_NodeInfo()->node_number(), m.body_as_NodeInfo()->domain_master_node()};
-    case fb::ServerBody::Notify:
-      return Notify{token, std::make_shared<const Notification>(notification(*m.body_as_Notify()))};
+      return NodeInfo{node_number(m.body_as_NodeInfo()->node_number()),
+                      node_number(m.body_as_NodeInfo()->domain_master_node())};
+    case fb::ServerBody::Notify: {
+      auto what = std::make_shared<const Notification>(notification(*m.body_as_Notify()));
+      if (const char* why = contradiction_in(*what); why != nullptr) fail(why);
+      return Notify{token, std::move(what)};
+    }
     case fb::ServerBody::Ping:
       return Ping{m.body_as_Ping()->number()};
     case fb::ServerBody::Farewell:
@@ -309,7 +336,7 @@ const Table* verified_root(std::span<const std::byte> payload, const char* id, s
 std::optional<ClientMessage> parse_client_message(std::span<const std::byte> payload, std::string* error) {
   const auto* root = verified_root<fb::ClientMessage>(payload, kClientMessageId, error);
   if (root == nullptr) return std::nullopt;
-  Reader reader;
+  Reader reader(payload.size());
   ClientMessage message = reader.client_message(*root);
   if (reader.problem() == nullptr) return message;
   *error = reader.problem();
@@ -320,7 +347,7 @@ std::optional<ServerMessage> parse_server_message(std::span<const std::byte> pay
                                                   std::string* error) {
   const auto* root = verified_root<fb::ServerMessage>(payload, kServerMessageId, error);
   if (root == nullptr) return std::nullopt;
-  Reader reader;
+  Reader reader(payload.size());
   ServerMessage message = reader.server_message(*root, token);
   if (reader.problem() == nullptr) return message;
   *error = reader.problem();

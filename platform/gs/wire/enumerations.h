@@ -30,10 +30,18 @@ constexpr bool known(wyx_notification_type_t*, int value) {
   return value >= WYX_N_PHASE_NOTIFICATION && value <= WYX_REJECTED_NOTIFICATION;
 }
 
+/// A node's number is that of its providers' ids.
+inline constexpr std::uint32_t kMaxNodeNumber = INT16_MAX;
+
 // The bits of the flag sets that a daemon sends.
 inline constexpr std::uint32_t kSummaryBits = 2 * WYX_MAX_SUMMARY_CODE - 1;
-inline constexpr std::uint32_t kWhatsChangedBits = 2 * WYX_MERGE_ALPHA_OMEGA_SWITCHED - 1;
+/// Without those of parts that no message has: a source group's state value, merges.
+inline constexpr std::uint32_t kWhatsChangedBits =
+    (2 * WYX_CURRENT_STATE_VALUE - 1) & ~std::uint32_t{WYX_REFLECTED_SOURCE_STATE_VALUE};
 inline constexpr std::uint32_t kLeaveCodeBits = 2 * WYX_HOST_LEAVE_DUE_TO_FORCE_DOWN - 1;
-inline constexpr std::uint32_t kSubscriptionTypeBits = 2 * WYX_SUBSCRIPTION_PERSISTENT - 1;
+/// Without special data, which no message has, and the daemon's death, which the library tells.
+inline constexpr std::uint32_t kSubscriptionTypeBits = WYX_SUBSCRIPTION_STATE | WYX_SUBSCRIPTION_DELTA_JOIN |
+                                                       WYX_SUBSCRIPTION_DELTA_LEAVE | WYX_SUBSCRIPTION_MEMBERSHIP |
+                                                       WYX_SUBSCRIPTION_DISSOLVED | WYX_SUBSCRIPTION_PERSISTENT;
 
 }  // namespace gs::wire::detail
