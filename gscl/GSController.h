@@ -35,6 +35,11 @@ struct GSxControllerData;
 /// dispatch() or any other operation of it or of a client. The controller's lock is taken before a client's, never
 /// the reverse.
 ///
+/// Forks: the session stays the parent's. In the child every operation is answered as without a session, quit()
+/// and the destructors of controller and clients reach nothing of the parent's, and initialize() opens a session
+/// of the child's own. Locks that other threads held at the fork stay held in the child: fork while no other
+/// thread is inside a controller or client, or let the child do no more than exec or _exit.
+///
 /// Callbacks (the virtual functions below and those of the clients) run on the thread that called dispatch(),
 /// inside it, with no lock of the library held: they may issue requests, call dispatch() again, construct clients
 /// and destroy them, the one that the callback belongs to included. They must not wait for notifications.

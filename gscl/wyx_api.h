@@ -5,6 +5,31 @@
 // until the callback returns. Records given to a request stay the caller's and are not read after it returns.
 //
 // The entry points themselves are reached through the table in gslib_dli.h.
+//
+// Forks: a session, opened by wyx_setup, belongs to the process that opened it. In the child of a fork every entry
+// point behaves as without a session, the parent's tokens are nobody's, and the child may open a session of its
+// own. Nothing that the child does, its end included, reaches the parent's session. The parent's descriptor stays
+// valid in the child and is never readable. A dispatch that forks inside a callback answers WYX_NO_INIT in the
+// child.
+//
+// Environment, read by wyx_setup (and by queries without a session): GSD_ENDPOINT, where the daemon is.
+// GSD_REQUEST_LIMIT, the seconds that an answer may take, 1 to 86400, 30 without it: a daemon that takes longer
+// counts as dead. Read at each failure: GSD_DEBUG, when it is neither empty nor "0": each is also a line on
+// standard error,
+//   wyx_r: cannot connect to /run/gsd/gsd.sock: Permission denied (connect-denied-13-4711-1-20260131T235959Z)
+//
+// Failures: wyx_get_ffdc_id reads what-code-pid-count-time, the count of this process's failures, the time in UTC.
+//   what                                            | code
+//   ------------------------------------------------|------------------------------------------------------------
+//   connect-absent, -denied, -refused, -timeout     | errno: no socket there, not permitted, nobody listens on it,
+//                                                   | the daemon takes no connection
+//   connect, socket, embedded                       | errno: another failure of that step
+//   hello-, attach-, query- with one of:            | a step of opening a session, or of a query without one
+//     timeout, closed, malformed                    | ETIMEDOUT, ECONNRESET, EPROTO: no answer, the end, nonsense
+//     refused                                       | wyx_rc_t: the daemon's answer
+//   request-, ping- with timeout, closed, malformed | the same, of an open session: it has ended
+//   event-malformed, hang-up, farewell              | the event channel: nonsense, the daemon's end, its goodbye
+//   endpoint, request-limit                         | EINVAL: the variable has no usable value
 #ifndef GSCL_WYX_API_H
 #define GSCL_WYX_API_H
 

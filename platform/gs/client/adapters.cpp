@@ -9,20 +9,17 @@
 #include <set>
 #include <string>
 
-#include "client/mutex.h"
+#include "client/fork.h"
 
 namespace gs::client {
 namespace {
 
 /// The names that adapter records point at: few, and kept for good.
 const char* keep_name(const char* name) {
-  struct Names {
-    Mutex mutex;
-    std::set<std::string> kept GS_GUARDED_BY(mutex);
-  };
-  static Names& names = *new Names;
-  MutexLock lock(names.mutex);
-  return names.kept.insert(name).first->c_str();
+  static std::set<std::string>* kept GS_GUARDED_BY(process_mutex) = nullptr;
+  MutexLock lock(process_mutex);
+  if (kept == nullptr) kept = new std::set<std::string>;
+  return kept->insert(name).first->c_str();
 }
 
 bool read_address(const sockaddr* address, Adapter* adapter) {

@@ -1,10 +1,11 @@
 #include "client/channel.h"
 
+#include <poll.h>
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <sys/un.h>
-#include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstring>
@@ -14,70 +15,100 @@
 namespace gs::client {
 namespace {
 
-bool send_packet(int fd, std::span<std::byte> header, std::span<const std::byte> slice) {
-  std::array<iovec, 2> parts = {iovec{header.data(), header.size()},
-                                iovec{const_cast<std::byte*>(slice.data()), slice.size()}};
-  msghdr packet{};
-  packet.msg_iov = parts.data();
-  packet.msg_iovlen = parts.size();
-  ssize_t sent;
-  do {
-    sent = sendmsg(fd, &packet, MSG_NOSIGNAL);
-  } while (sent < 0 && errno == EINTR);
-  return sent >= 0;
+/// WYX_CONNECT_FAILED, with the reason recorded.
+wyx_rc_t not_connected(const std::string& path, int error) {
+  const char* what = "connect";
+  if (error == ENOENT) what = "connect-absent";
+  if (error == EACCES || error == EPERM) what = "connect-denied";
+  if (error == ECONNREFUSED) what = "connect-refused";
+  if (error == EAGAIN) error = ETIMEDOUT;  // its queue of connections stayed full
+  if (error == ETIMEDOUT) what = "connect-timeout";
+  record_failure(what, error, "cannot connect to " + path + ": " + strerrordesc_np(error));
+  return WYX_CONNECT_FAILED;
 }
 
 }  // namespace
 
 std::unique_ptr<Channel> Channel::connect(const std::string& path, wyx_rc_t* rc) {
-  const int fd = socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
-  if (fd < 0) {
-    record_failure("socket", errno);
+  auto channel = std::make_unique<Channel>(socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0));
+  if (channel->fd() < 0) {
+    const int error = errno;
+    record_failure("socket", error, std::string("cannot make a socket: ") + strerrordesc_np(error));
     *rc = WYX_SOCK_CREATE_FAILED;
     return nullptr;
   }
-  auto channel = std::make_unique<Channel>(fd);
-  channel->limit_waits(kPatience);
+  const timeval limit = {kPatience, 0};
+  setsockopt(channel->fd(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof(limit));
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+  const auto until = channel->deadline();
   int connected;
   do {
-    connected = ::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address));
-  } while (connected != 0 && errno == EINTR);
-  if (connected != 0) {
-    record_failure("connect", errno);
-    *rc = WYX_CONNECT_FAILED;
-    return nullptr;
-  }
-  return channel;
+    connected = ::connect(channel->fd(), reinterpret_cast<const sockaddr*>(&address), sizeof(address));
+  } while (connected != 0 && errno == EINTR && Clock::now() < until);
+  if (connected == 0) return channel;
+  *rc = not_connected(path, errno == EINTR ? ETIMEDOUT : errno);
+  return nullptr;
 }
 
 Channel::Channel(int fd) : fd_(fd), assembler_(wire::kMaxServerMessage), packet_(wire::kMaxPacket + 1) {}
 
-Channel::~Channel() { close(fd_); }
-
-void Channel::limit_waits(int seconds) {
-  const timeval limit = {seconds, 0};
-  setsockopt(fd_, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof(limit));
-  setsockopt(fd_, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof(limit));
+/// False: nothing has happened until then.
+bool Channel::await(short events, Clock::time_point until) const {
+  for (;;) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(until - Clock::now()).count();
+    pollfd watched = {fd(), events, 0};
+    const int happened = poll(&watched, 1, static_cast<int>(std::max<decltype(left)>(left, 0)));
+    if (happened > 0) return true;
+    if (left <= 0 || (happened < 0 && errno != EINTR)) return false;
+  }
 }
 
-bool Channel::send(const wire::ClientMessage& message) {
+Channel::Got Channel::send_packet(std::span<std::byte> header, std::span<const std::byte> slice,
+                                  Clock::time_point until) {
+  std::array<iovec, 2> parts = {iovec{header.data(), header.size()},
+                                iovec{const_cast<std::byte*>(slice.data()), slice.size()}};
+  msghdr packet{};
+  packet.msg_iov = parts.data();
+  packet.msg_iovlen = parts.size();
+  for (;;) {
+    if (sendmsg(fd(), &packet, MSG_NOSIGNAL | MSG_DONTWAIT) >= 0) return Got::kMessage;
+    if (errno == EINTR) continue;
+    if (errno != EAGAIN && errno != EWOULDBLOCK) return Got::kEnd;
+    if (!await(POLLOUT, until)) return Got::kTimeout;
+  }
+}
+
+Channel::Got Channel::send(const wire::ClientMessage& message) { return send(message, deadline()); }
+
+Channel::Got Channel::send(const wire::ClientMessage& message, Clock::time_point until) {
   const wire::Encoded encoded = wire::encode(message);
-  if (!encoded) return false;
+  if (!encoded) return Got::kEnd;
   for (std::size_t index = 0; index < encoded.packets(); ++index) {
     std::array<std::byte, wire::kHeaderSize> header;
     const auto slice = encoded.packet_for(index, -1, header);
-    if (!send_packet(fd_, header, slice)) return false;
+    const Got sent = send_packet(header, slice, until);
+    if (sent != Got::kMessage) return sent;
   }
-  return true;
+  return Got::kMessage;
 }
 
-Channel::Got Channel::receive(int flags, wire::ServerMessage* message) {
+Channel::Got Channel::ask(const wire::ClientMessage& question, wire::ServerMessage* answer) {
+  const auto until = deadline();
+  const Got sent = send(question, until);
+  if (sent != Got::kMessage) return sent;
+  for (;;) {
+    if (!await(POLLIN, until)) return Got::kTimeout;
+    const Got got = receive(answer);
+    if (got != Got::kNothing) return got;
+  }
+}
+
+Channel::Got Channel::receive(wire::ServerMessage* message) {
   std::string error;
   for (;;) {
-    const ssize_t length = recv(fd_, packet_.data(), packet_.size(), flags);
+    const ssize_t length = recv(fd(), packet_.data(), packet_.size(), MSG_DONTWAIT);
     if (length < 0 && errno == EINTR) continue;
     if (length < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return Got::kNothing;
     if (length <= 0) return Got::kEnd;
@@ -91,6 +122,6 @@ Channel::Got Channel::receive(int flags, wire::ServerMessage* message) {
   return Got::kMalformed;
 }
 
-void Channel::shut_down() { shutdown(fd_, SHUT_RDWR); }
+void Channel::shut_down() { shutdown(fd(), SHUT_RDWR); }
 
 }  // namespace gs::client

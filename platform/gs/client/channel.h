@@ -1,19 +1,27 @@
 // One SOCK_SEQPACKET connection to the daemon, speaking whole messages.
 #pragma once
 
+#include <chrono>
 #include <memory>
 #include <string>
 #include <vector>
 
+#include "client/fork.h"
 #include "wire/codec.h"
 
 namespace gs::client {
 
 /// One thread may send while another receives; each of the two is one thread's at a time. `shut_down` any
-/// thread's. No signal is ever raised. Descriptors are closed on exec.
+/// thread's. No signal is ever raised. Descriptors are closed on exec, and let go of in the child of a fork.
 class Channel {
  public:
-  enum class Got { kMessage, kNothing, kEnd, kMalformed };
+  enum class Got {
+    kMessage,
+    kNothing,   // not now
+    kTimeout,   // not within the limit
+    kEnd,       // the other side is gone
+    kMalformed  // what it said makes no sense
+  };
 
   /// Seconds: a daemon that takes no connection and answers no greeting or farewell for so long counts as not
   /// there.
@@ -25,33 +33,35 @@ class Channel {
 
   /// Takes over a connected socket.
   explicit Channel(int fd);
-  ~Channel();
-  Channel(const Channel&) = delete;
-  Channel& operator=(const Channel&) = delete;
 
-  int fd() const { return fd_; }
+  int fd() const { return fd_.get(); }
+  /// Keeps the descriptor valid, lets go of the connection.
+  void silence() { fd_.silence(); }
 
-  /// Bounds every send and receive from now on; 0: no bound.
-  void limit_waits(int seconds);
+  /// Bounds the waiting of every send, and of every ask, from now on.
+  void limit_waits(int seconds) { limit_ = seconds; }
+  int limit() const { return limit_; }
 
-  /// False: the other side is gone.
-  bool send(const wire::ClientMessage& message);
-  /// `flags` as for recv: MSG_DONTWAIT answers kNothing instead of waiting. kEnd: the other side is gone.
-  /// kMalformed: what it said makes no sense.
-  Got receive(int flags, wire::ServerMessage* message);
-  /// The next message, which must be a T. Nothing: it is not, or the other side is gone.
-  template <typename T>
-  std::optional<T> receive_a() {
-    wire::ServerMessage message;
-    if (receive(0, &message) != Got::kMessage || !std::holds_alternative<T>(message)) return std::nullopt;
-    return std::get<T>(std::move(message));
-  }
+  /// kMessage: it is sent. Else kTimeout or kEnd.
+  Got send(const wire::ClientMessage& message);
+  /// Sends and receives, both within the limit.
+  Got ask(const wire::ClientMessage& question, wire::ServerMessage* answer);
+  /// What is there, without waiting; kNothing: no whole message.
+  Got receive(wire::ServerMessage* message);
 
   /// Wakes every waiter. What the other side has sent already can still be received.
   void shut_down();
 
  private:
-  const int fd_;
+  using Clock = std::chrono::steady_clock;
+
+  Clock::time_point deadline() const { return Clock::now() + std::chrono::seconds(limit_); }
+  bool await(short events, Clock::time_point until) const;
+  Got send(const wire::ClientMessage& message, Clock::time_point until);
+  Got send_packet(std::span<std::byte> header, std::span<const std::byte> slice, Clock::time_point until);
+
+  Descriptor fd_;
+  int limit_ = kPatience;  // seconds
   wire::Assembler assembler_;
   std::vector<std::byte> packet_;  // one byte more than a packet may have, so that a longer one shows
 };

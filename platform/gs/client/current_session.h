@@ -7,8 +7,9 @@
 
 namespace gs::client {
 
-/// Null before wyx_setup and after wyx_quit. Whoever holds the result keeps the session's storage and descriptors,
-/// not the session itself, which another thread may quit. Any thread.
+/// Null before wyx_setup and after wyx_quit, and in the child of a fork until its own wyx_setup. Whoever holds the
+/// result keeps the session's storage and descriptors, not the session itself, which another thread may quit. Any
+/// thread.
 std::shared_ptr<Session> current_session();
 
 /// What wyx_setup gives.

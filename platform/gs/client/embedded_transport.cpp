@@ -4,10 +4,11 @@
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
 #include <sys/timerfd.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <cstring>
+#include <string>
 
 #include "client/failure_log.h"
 
@@ -35,7 +36,8 @@ timespec to_timespec(std::chrono::steady_clock::time_point when) {
 std::unique_ptr<EmbeddedTransport> EmbeddedTransport::open(wyx_rc_t* rc) {
   std::unique_ptr<EmbeddedTransport> transport(new EmbeddedTransport);
   if (transport->ready()) return transport;
-  record_failure("embedded", errno);
+  const int error = errno;
+  record_failure("embedded", error, std::string("no descriptors for the session: ") + strerrordesc_np(error));
   *rc = WYX_SOCK_CREATE_FAILED;
   return nullptr;
 }
@@ -45,15 +47,8 @@ EmbeddedTransport::EmbeddedTransport()
       event_fd_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
       timer_fd_(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK)) {}
 
-EmbeddedTransport::~EmbeddedTransport() {
-  for (const int fd : {timer_fd_, event_fd_, epoll_fd_}) {
-    if (fd >= 0) close(fd);
-  }
-}
-
 bool EmbeddedTransport::ready() const {
-  return epoll_fd_ >= 0 && event_fd_ >= 0 && timer_fd_ >= 0 && watch(epoll_fd_, event_fd_) &&
-         watch(epoll_fd_, timer_fd_);
+  return watch(epoll_fd_.get(), event_fd_.get()) && watch(epoll_fd_.get(), timer_fd_.get());
 }
 
 wyx_rc_t EmbeddedTransport::call(Request request) {
@@ -116,9 +111,8 @@ void EmbeddedTransport::answer_ping(std::uint64_t number, bool ok) {
 }
 
 void EmbeddedTransport::wait() {
-  pollfd watched = {epoll_fd_, POLLIN, 0};
-  while (poll(&watched, 1, -1) < 0 && errno == EINTR) {
-  }
+  pollfd watched = {epoll_fd_.get(), POLLIN, 0};
+  poll(&watched, 1, -1);
 }
 
 bool EmbeddedTransport::gone() {
@@ -199,7 +193,7 @@ void EmbeddedTransport::arm_timer() {
   armed_ = due;
   itimerspec setting{};
   if (due != Clock::time_point::max()) setting.it_value = to_timespec(due);
-  timerfd_settime(timer_fd_, TFD_TIMER_ABSTIME, &setting, nullptr);
+  timerfd_settime(timer_fd_.get(), TFD_TIMER_ABSTIME, &setting, nullptr);
 }
 
 void EmbeddedTransport::show_queue() {
@@ -207,10 +201,10 @@ void EmbeddedTransport::show_queue() {
   if (show == shown_) return;
   shown_ = show;
   if (show) {
-    eventfd_write(event_fd_, 1);
+    eventfd_write(event_fd_.get(), 1);
   } else {
     eventfd_t count;
-    eventfd_read(event_fd_, &count);
+    eventfd_read(event_fd_.get(), &count);
   }
 }
 

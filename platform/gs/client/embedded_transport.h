@@ -7,7 +7,7 @@
 #include <optional>
 #include <vector>
 
-#include "client/mutex.h"
+#include "client/fork.h"
 #include "client/transport.h"
 #include "engine/engine.h"
 
@@ -19,7 +19,6 @@ class EmbeddedTransport : public Transport {
 
   /// Null: `rc` says why.
   static std::unique_ptr<EmbeddedTransport> open(wyx_rc_t* rc);
-  ~EmbeddedTransport() override;
 
   std::uint32_t node_number() const override { return kNodeNumber; }
   wyx_rc_t call(Request request) override;
@@ -28,7 +27,7 @@ class EmbeddedTransport : public Transport {
   Incoming take() override;
   void answer_ping(std::uint64_t number, bool ok) override;
   void wait() override;
-  int descriptor() const override { return epoll_fd_; }
+  int descriptor() const override { return epoll_fd_.get(); }
   void silence() override {}
   bool gone() override;
   void quit() override;
@@ -50,9 +49,9 @@ class EmbeddedTransport : public Transport {
   void arm_timer() GS_REQUIRES(mutex_);
   void show_queue() GS_REQUIRES(mutex_);
 
-  const int epoll_fd_;  // holds the two others
-  const int event_fd_;  // readable while queue_ has something or the session is over
-  const int timer_fd_;  // the earliest of all deadlines
+  Descriptor epoll_fd_;  // holds the two others
+  Descriptor event_fd_;  // readable while queue_ has something or the session is over
+  Descriptor timer_fd_;  // the earliest of all deadlines
 
   Mutex mutex_;
   Engine engine_ GS_GUARDED_BY(mutex_);

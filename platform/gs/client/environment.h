@@ -1,4 +1,4 @@
-// Where group services are found: the environment variable GSD_ENDPOINT, or the default path without it.
+// What the application's environment says.
 #pragma once
 
 #include <optional>
@@ -11,8 +11,17 @@ struct DaemonAddress {
   std::string path;  // of the daemon's socket, when not embedded
 };
 
+inline constexpr int kDefaultRequestLimit = 30;     // seconds
+inline constexpr int kMaxRequestLimit = 24 * 3600;  // seconds
+
 /// GSD_ENDPOINT is "unix:/path" (absolute, short enough for a socket's address) or "embedded:". Not set or empty:
-/// the default path. Nothing: the value is none of these.
-std::optional<DaemonAddress> daemon_address_from_environment();
+/// the default path. Nothing: the value is none of these, and the failure is recorded.
+std::optional<DaemonAddress> daemon_address();
+
+/// GSD_REQUEST_LIMIT: seconds, 1 to kMaxRequestLimit. Not set or empty: the default. Nothing: as above.
+std::optional<int> request_limit();
+
+/// GSD_DEBUG: set, not empty and not "0".
+bool debug_wanted();
 
 }  // namespace gs::client

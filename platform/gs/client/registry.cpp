@@ -40,6 +40,16 @@ Token next_token() {
   return static_cast<Token>(count.fetch_add(1) % std::numeric_limits<Token>::max()) + 1;
 }
 
+/// Whether a client of this kind can be told it at all.
+bool fits(const Notification& notification, Client::Kind kind) {
+  bool subscribers = std::holds_alternative<SubscriptionNotification>(notification);
+  if (const auto* error = std::get_if<DelayedErrorNotification>(&notification)) {
+    subscribers = std::holds_alternative<SubscribeRequest>(error->failing_request) ||
+                  std::holds_alternative<UnsubscribeRequest>(error->failing_request);
+  }
+  return subscribers == (kind == Client::Kind::kSubscriber);
+}
+
 bool is_own_join(const Notification& notification, ProviderId id) {
   const auto* n = std::get_if<ProtocolNotification>(&notification);
   return n != nullptr && n->type == WYX_APPROVED_NOTIFICATION && n->protocol == WYX_JOIN &&
@@ -93,6 +103,7 @@ std::optional<Client> Registry::addressee(Token token, const Notification& notif
   const auto entry = entries_.find(token);
   if (entry == entries_.end()) return std::nullopt;
   const Client client = entry->second.client;
+  if (!fits(notification, client.kind)) return std::nullopt;
   if (is_own_join(notification, client.id)) entry->second.joined = true;
   if (is_last(notification, client, entry->second.joined)) entries_.erase(entry);
   return client;

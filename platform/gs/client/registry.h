@@ -35,7 +35,8 @@ class Registry {
 
   bool has(Token token, Client::Kind kind);
   std::optional<Client> find(Token token);
-  /// Whom a notification goes to, unless it is unknown; a client whose last notification this is, is forgotten.
+  /// Whom a notification goes to, unless it is unknown or of a kind that is told other things; a client whose last
+  /// notification this is, is forgotten.
   std::optional<Client> addressee(Token token, const Notification& notification);
 
   /// Group services are gone: no client is added or accepted any more.

@@ -1,7 +1,6 @@
 #include "client/session.h"
 
 #include <sys/epoll.h>
-#include <unistd.h>
 
 #include <utility>
 
@@ -25,7 +24,7 @@ class Session::Turn {
   Turn(Session& session, bool blocking, int cancel_state)
       : session_(session), held_(session.begin_turn(blocking, cancel_state)) {}
   ~Turn() {
-    if (held_) session_.end_turn();
+    if (held_ && !session_.inherited()) session_.end_turn();  // in a child the lock may be lost
   }
   Turn(const Turn&) = delete;
   Turn& operator=(const Turn&) = delete;
@@ -38,23 +37,19 @@ class Session::Turn {
 };
 
 Session::Session(std::unique_ptr<Transport> transport, const SessionRoutines& routines)
-    : transport_(std::move(transport)), routines_(routines), descriptor_(transport_->descriptor()) {}
+    : transport_(std::move(transport)), routines_(routines) {}
 
-Session::~Session() {
-  if (descriptor_ != transport_->descriptor()) close(descriptor_);
-}
-
-void Session::inherit(std::shared_ptr<Session> previous) {
+void Session::follow(std::shared_ptr<Session> previous) {
   if (previous->ended_ || previous->quit_) return;
   previous_ = std::move(previous);
   const int both = epoll_create1(EPOLL_CLOEXEC);
   if (both < 0) return;
-  for (const int fd : {previous_->descriptor_, descriptor_}) {
+  for (const int fd : {previous_->descriptor(), transport_->descriptor()}) {
     epoll_event event{};
     event.events = EPOLLIN;
     epoll_ctl(both, EPOLL_CTL_ADD, fd, &event);
   }
-  descriptor_ = both;
+  both_.emplace(both);
 }
 
 wyx_rc_t Session::check_token(Token token, Client::Kind kind) {
@@ -94,17 +89,20 @@ wyx_responsiveness_t Session::exchange_settings(const wyx_responsiveness_t& sett
 }
 
 wyx_rc_t Session::dispatch(bool blocking, int cancel_state) {
-  for (;;) {
+  while (!inherited()) {
     {
       Turn turn(*this, blocking, cancel_state);
       if (!turn.held()) return WYX_OK;  // another thread is handing out what there is
-      if (drain(quit_) > 0) return WYX_OK;
+      const int delivered = drain(quit_);
+      if (inherited()) break;
+      if (delivered > 0) return WYX_OK;
     }
     if (quit_ || ended_) return WYX_NO_INIT;
     if (!blocking) return WYX_OK;
     CancelWindow window(cancel_state);
     transport_->wait();
   }
+  return WYX_NO_INIT;
 }
 
 void Session::quit() {
@@ -144,7 +142,7 @@ int Session::drain(const std::atomic<bool>& stop) {
     delivered = previous->hand_out_rest(stop);
     if (previous->ended_) previous_.reset();
   }
-  while (delivered < kMaxDeliveries && !stop) {
+  while (delivered < kMaxDeliveries && !stop && !inherited()) {
     const Step step = deliver_next();
     if (step == Step::kNothing) break;
     if (step == Step::kDelivered) ++delivered;
@@ -230,7 +228,7 @@ Session::Step Session::answer_ping(std::uint64_t number) {
     settings = settings_;
   }
   const wyx_callback_rc_t answer = routines_.responsiveness(records_[level_].ping(settings));
-  transport_->answer_ping(number, answer == WYX_CALLBACK_OK);
+  if (!inherited()) transport_->answer_ping(number, answer == WYX_CALLBACK_OK);
   return Step::kDelivered;
 }
 

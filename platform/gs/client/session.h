@@ -5,8 +5,9 @@
 #include <atomic>
 #include <deque>
 #include <memory>
+#include <optional>
 
-#include "client/mutex.h"
+#include "client/fork.h"
 #include "client/records.h"
 #include "client/registry.h"
 #include "client/transport.h"
@@ -23,14 +24,17 @@ class Session {
  public:
   Session(std::unique_ptr<Transport> transport, const SessionRoutines& routines);
 
-  ~Session();
   Session(const Session&) = delete;
   Session& operator=(const Session&) = delete;
 
   /// Before the first use: takes over what `previous`, whose group services are gone, has not handed out yet.
-  void inherit(std::shared_ptr<Session> previous);
+  void follow(std::shared_ptr<Session> previous);
 
-  int descriptor() const { return descriptor_; }
+  /// This process is the child of a fork in the one that the session belongs to: it must not be used. A dispatch
+  /// that is under way across the fork ends.
+  bool inherited() const { return generation_ != fork_generation(); }
+
+  int descriptor() const { return both_ ? both_->get() : transport_->descriptor(); }
   std::uint32_t node_number() const { return transport_->node_number(); }
   /// Group services have gone or the session was quit.
   bool gone() { return transport_->gone(); }
@@ -74,7 +78,8 @@ class Session {
 
   const std::unique_ptr<Transport> transport_;
   const SessionRoutines routines_;
-  int descriptor_;  // the transport's, or one that holds it beside the previous session's
+  const unsigned generation_ = fork_generation();
+  std::optional<Descriptor> both_;  // holds the transport's descriptor beside the previous session's
   Registry registry_;
   std::atomic<bool> quit_ = false;
   std::atomic<bool> ended_ = false;  // group services are gone and every client has been told

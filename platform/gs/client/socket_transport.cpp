@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -14,9 +13,40 @@
 namespace gs::client {
 namespace {
 
-wyx_rc_t refused_handshake(const char* what, wyx_rc_t rc) {
-  record_failure(what, rc);
-  return rc == WYX_OK ? WYX_CONNECT_FAILED : rc;
+/// Why an answer that is awaited has not come.
+struct NoAnswer {
+  const char* how;
+  int error;
+  std::string why;
+};
+
+NoAnswer no_answer(Channel::Got got, int limit) {
+  if (got == Channel::Got::kTimeout)
+    return {"-timeout", ETIMEDOUT, "no answer within " + std::to_string(limit) + " seconds"};
+  if (got == Channel::Got::kEnd) return {"-closed", ECONNRESET, "the daemon has closed the connection"};
+  return {"-malformed", EPROTO, "the daemon says what makes no sense"};
+}
+
+/// One step of a handshake: asks, and receives an Answer or the T that is wanted. Nothing: `rc` says why, and the
+/// failure is recorded.
+template <typename T>
+std::optional<T> handshake(const char* step, Channel& channel, const wire::ClientMessage& question, wyx_rc_t* rc) {
+  wire::ServerMessage message;
+  const Channel::Got got = channel.ask(question, &message);
+  if (got == Channel::Got::kMessage) {
+    const auto* answer = std::get_if<wire::Answer>(&message);
+    if (answer != nullptr && answer->rc != WYX_OK) {
+      record_failure(std::string(step) + "-refused", answer->rc,
+                     "no session: the daemon refuses it with result " + std::to_string(answer->rc));
+      *rc = answer->rc;
+      return std::nullopt;
+    }
+    if (const auto* wanted = std::get_if<T>(&message)) return *wanted;
+  }
+  const NoAnswer reason = no_answer(got, channel.limit());
+  record_failure(std::string(step) + reason.how, reason.error, std::string("no session: ") + reason.why);
+  *rc = WYX_CONNECT_FAILED;
+  return std::nullopt;
 }
 
 /// SIGIO for each arrival, to this process.
@@ -25,38 +55,21 @@ void raise_signals(int fd) {
   fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_ASYNC);
 }
 
-/// The greeting on the request channel. Nothing: `rc` says why.
-std::optional<wire::Welcome> greet(Channel& requests, const wire::Hello& hello, wyx_rc_t* rc) {
-  wire::ServerMessage reply;
-  const bool answered = requests.send(hello) && requests.receive(0, &reply) == Channel::Got::kMessage;
-  if (answered && std::holds_alternative<wire::Welcome>(reply)) return std::get<wire::Welcome>(reply);
-  const auto* answer = answered ? std::get_if<wire::Answer>(&reply) : nullptr;
-  *rc = refused_handshake("hello", answer == nullptr ? WYX_CONNECT_FAILED : answer->rc);
-  return std::nullopt;
-}
-
-wyx_rc_t attach(Channel& events, const wire::Welcome& welcome) {
-  std::optional<wire::Answer> answer;
-  if (events.send(wire::Attach{welcome.session_number, welcome.cookie})) answer = events.receive_a<wire::Answer>();
-  if (answer && answer->rc == WYX_OK) return WYX_OK;
-  return refused_handshake("attach", answer ? answer->rc : WYX_CONNECT_FAILED);
-}
-
 }  // namespace
 
 std::unique_ptr<SocketTransport> SocketTransport::open(const std::string& path, const wire::Hello& hello,
-                                                       wyx_rc_t* rc) {
+                                                       int request_limit, wyx_rc_t* rc) {
   auto requests = Channel::connect(path, rc);
   if (!requests) return nullptr;
-  const auto welcome = greet(*requests, hello, rc);
+  const auto welcome = handshake<wire::Welcome>("hello", *requests, hello, rc);
   if (!welcome) return nullptr;
   auto events = Channel::connect(path, rc);
   if (!events) return nullptr;
-  *rc = attach(*events, *welcome);
-  if (*rc != WYX_OK) return nullptr;
+  const wire::Attach attach{welcome->session_number, welcome->cookie};
+  if (!handshake<wire::Answer>("attach", *events, attach, rc)) return nullptr;
 
-  requests->limit_waits(0);
-  events->limit_waits(0);
+  requests->limit_waits(request_limit);
+  events->limit_waits(request_limit);
   if ((hello.socket_control & WYX_SOCKET_SIGNAL) != 0) raise_signals(events->fd());
   return std::make_unique<SocketTransport>(std::move(requests), std::move(events), welcome->node_number);
 }
@@ -65,11 +78,9 @@ wyx_rc_t SocketTransport::query_node_of(const std::string& path, wire::NodeInfo*
   wyx_rc_t rc = WYX_OK;
   const auto channel = Channel::connect(path, &rc);
   if (!channel) return rc;
-  std::optional<wire::NodeInfo> answer;
-  if (channel->send(wire::QueryNode{})) answer = channel->receive_a<wire::NodeInfo>();
-  if (!answer) return refused_handshake("query", WYX_CONNECT_FAILED);
-  *info = *answer;
-  return WYX_OK;
+  const auto answer = handshake<wire::NodeInfo>("query", *channel, wire::QueryNode{}, &rc);
+  if (answer) *info = *answer;
+  return rc;
 }
 
 SocketTransport::SocketTransport(std::unique_ptr<Channel> requests, std::unique_ptr<Channel> events,
@@ -86,14 +97,14 @@ wyx_rc_t SocketTransport::exchange(const wire::ClientMessage& message, T* answer
 template <typename T>
 wyx_rc_t SocketTransport::exchange_locked(const wire::ClientMessage& message, T* answer) {
   if (gone_) return WYX_NO_INIT;
-  std::optional<T> received;
-  if (requests_->send(message)) received = requests_->receive_a<T>();
-  if (!received) {
-    lose("request");
-    return WYX_NO_INIT;
+  wire::ServerMessage received;
+  const Channel::Got got = requests_->ask(message, &received);
+  if (got == Channel::Got::kMessage && std::holds_alternative<T>(received)) {
+    *answer = std::get<T>(std::move(received));
+    return WYX_OK;
   }
-  *answer = *received;
-  return WYX_OK;
+  lose_without_answer("request", got, requests_->limit());
+  return WYX_NO_INIT;
 }
 
 wyx_rc_t SocketTransport::call(Request request) {
@@ -112,7 +123,7 @@ wyx_rc_t SocketTransport::query_node(wire::NodeInfo* info) { return exchange(wir
 
 Incoming SocketTransport::take() {
   wire::ServerMessage message;
-  const Channel::Got got = events_->receive(MSG_DONTWAIT, &message);
+  const Channel::Got got = events_->receive(&message);
   if (got == Channel::Got::kNothing) return {};
   if (got == Channel::Got::kMessage) {
     if (auto* notify = std::get_if<wire::Notify>(&message)) {
@@ -121,35 +132,31 @@ Incoming SocketTransport::take() {
     if (const auto* ping = std::get_if<wire::Ping>(&message))
       return {Incoming::Kind::kPing, -1, nullptr, ping->number};
   }
-  lose(got == Channel::Got::kEnd ? "hang-up" : got == Channel::Got::kMessage ? "farewell" : "malformed");
+  if (got == Channel::Got::kMalformed) lose_without_answer("event", got, 0);
+  if (got == Channel::Got::kMessage) lose("farewell", ECONNRESET, "the daemon stops");
+  hang_up();
   return {Incoming::Kind::kGone, -1, nullptr, 0};
 }
 
 void SocketTransport::answer_ping(std::uint64_t number, bool ok) {
   MutexLock lock(answer_mutex_);
-  if (!events_->send(wire::PingAnswer{number, ok})) lose("ping");
+  const Channel::Got sent = events_->send(wire::PingAnswer{number, ok});
+  if (sent != Channel::Got::kMessage) lose_without_answer("ping", sent, events_->limit());
 }
 
 void SocketTransport::wait() {
   // The request channel is watched for its end only. It stays ended, also when another thread has silenced the
   // event channel's descriptor in the meantime.
   std::array<pollfd, 2> watched = {pollfd{events_->fd(), POLLIN, 0}, pollfd{requests_->fd(), 0, 0}};
-  while (poll(watched.data(), watched.size(), -1) < 0 && errno == EINTR) {
-  }
-  if (watched[1].revents != 0) lose("hang-up");
+  if (poll(watched.data(), watched.size(), -1) > 0 && watched[1].revents != 0) hang_up();
 }
 
-void SocketTransport::silence() {
-  const int quiet = eventfd(0, EFD_CLOEXEC);
-  if (quiet < 0) return;
-  dup3(quiet, events_->fd(), O_CLOEXEC);
-  close(quiet);
-}
+void SocketTransport::silence() { events_->silence(); }
 
 bool SocketTransport::gone() {
   if (gone_) return true;
   pollfd watched = {requests_->fd(), 0, 0};
-  if (poll(&watched, 1, 0) > 0) lose("hang-up");
+  if (poll(&watched, 1, 0) > 0) hang_up();
   return gone_;
 }
 
@@ -167,11 +174,18 @@ void SocketTransport::quit() {
 }
 
 /// The daemon is gone or no longer to be talked to: everyone who waits for it comes back.
-void SocketTransport::lose(const char* what) {
+void SocketTransport::lose(const std::string& what, int error, const std::string& why) {
   if (gone_.exchange(true)) return;
-  record_failure(what, ECONNRESET);
+  record_failure(what, error, "group services are gone: " + why);
   requests_->shut_down();
   events_->shut_down();
+}
+
+void SocketTransport::hang_up() { lose("hang-up", ECONNRESET, "the daemon has closed the connection"); }
+
+void SocketTransport::lose_without_answer(const char* step, Channel::Got got, int limit) {
+  const NoAnswer reason = no_answer(got, limit);
+  lose(std::string(step) + reason.how, reason.error, reason.why);
 }
 
 }  // namespace gs::client

@@ -13,8 +13,10 @@ namespace gs::client {
 
 class SocketTransport : public Transport {
  public:
-  /// Connects and greets. Null: `rc` says why.
-  static std::unique_ptr<SocketTransport> open(const std::string& path, const wire::Hello& hello, wyx_rc_t* rc);
+  /// Connects and greets. `request_limit`: seconds that a daemon may take for an answer; one that takes longer
+  /// counts as gone. Null: `rc` says why.
+  static std::unique_ptr<SocketTransport> open(const std::string& path, const wire::Hello& hello,
+                                               int request_limit, wyx_rc_t* rc);
   /// Asks the daemon without a session.
   static wyx_rc_t query_node_of(const std::string& path, wire::NodeInfo* info);
 
@@ -37,7 +39,9 @@ class SocketTransport : public Transport {
   wyx_rc_t exchange(const wire::ClientMessage& message, T* answer);
   template <typename T>
   wyx_rc_t exchange_locked(const wire::ClientMessage& message, T* answer) GS_REQUIRES(exchange_mutex_);
-  void lose(const char* what);
+  void lose(const std::string& what, int error, const std::string& why);
+  void lose_without_answer(const char* step, Channel::Got got, int limit);
+  void hang_up();
 
   const std::uint32_t node_number_;
   const std::unique_ptr<Channel> requests_;

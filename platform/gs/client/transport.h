@@ -42,7 +42,7 @@ class Transport {
 
   virtual Incoming take() = 0;
   virtual void answer_ping(std::uint64_t number, bool ok) = 0;
-  /// Returns when `take` may have something. A cancellation point, holding nothing.
+  /// Returns when `take` may have something, or a signal has come. A cancellation point, holding nothing.
   virtual void wait() = 0;
 
   /// Readable when `take` has something; owned by the transport.

@@ -13,12 +13,14 @@
 // other codes are the group's. Ownership: what a request is given is not read after it returns. What a callback is
 // given belongs to the library and lives until the callback returns.
 //
-// A session ends when the daemon dies or says what makes no sense: requests under way and to come answer
-// WYX_NO_INIT, what had arrived before is still handed out, then every provider gets the announcement
-// WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY and every subscriber WYX_SUBSCRIPTION_GS_HAS_DIED, in the order of their
-// tokens. The descriptor stays valid, and is no longer readable, until wyx_quit or the next wyx_setup.
+// A session ends when the daemon dies, says what makes no sense or leaves a request unanswered for
+// GSD_REQUEST_LIMIT seconds (see wyx_api.h): requests under way and to come answer WYX_NO_INIT, what had arrived
+// before is still handed out, then every provider gets the announcement WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY and
+// every subscriber WYX_SUBSCRIPTION_GS_HAS_DIED, in the order of their tokens. The descriptor stays valid, and is
+// no longer readable, until wyx_quit or the next wyx_setup.
 //
-// A fork is the application's matter: a child must not use its parent's session. Descriptors are closed on exec.
+// A session belongs to the process that opened it; what that means to the child of a fork: wyx_api.h. Descriptors
+// are closed on exec.
 #ifndef WYX_ENTRY_POINTS_H
 #define WYX_ENTRY_POINTS_H
 
@@ -38,9 +40,11 @@
 /// daemon; the other flags change nothing. `responsiveness` as for wyx_change_responsiveness; null: none.
 /// `deactivate_path` is accepted and not used. A routine that is null gets nothing; there are no query
 /// notifications.
-/// WYX_EXISTS: there is a session. A session whose group services are gone is replaced; clients of it that have
+/// WYX_EXISTS: there is a session. Connecting and each step of the greeting wait ten seconds for
+/// the daemon. A session whose group services are gone is replaced; clients of it that have
 /// not been told yet are told by the first wyx_dispatch. WYX_CONNECT_FAILED: no daemon there.
-/// WYX_SOCK_CREATE_FAILED. WYX_BAD_PARAMETER: also for a GSD_ENDPOINT that is none of the above.
+/// WYX_SOCK_CREATE_FAILED. WYX_BAD_PARAMETER: also for a GSD_ENDPOINT that is none of the above and a
+/// GSD_REQUEST_LIMIT that cannot be. Why it failed: wyx_get_ffdc_id.
 WYX_ENTRY wyx_rc_t wyx_setup(int version, int count, wyx_descriptor_t* descriptor,
                              wyx_socket_ctrl_t socket_control, const wyx_responsiveness_t* responsiveness,
                              const char* deactivate_path, wyx_responsiveness_cb_t* responsiveness_routine,
@@ -88,7 +92,8 @@ WYX_ENTRY wyx_rc_t wyx_get_limits(wyx_limits* limits);
 /// The versions of the installed product. `quick_version` packs them, 8 bits each, the version highest.
 WYX_ENTRY wyx_rc_t wyx_get_zelt_active_version(wyx_zelt_version_t* version);
 WYX_ENTRY wyx_rc_t wyx_get_zelt_installed_version(wyx_zelt_version_t* version);
-/// Names the last failure that the library met in this process; empty: none. `buffer` has room for 64 characters.
+/// Names the last failure that the library met in this process, in the form that wyx_api.h gives; empty: none.
+/// `buffer` has room for 64 characters.
 WYX_ENTRY wyx_rc_t wyx_get_ffdc_id(char* buffer);
 
 /// This host's adapter: the first interface that is up and not the loopback, else the loopback. `node_number` is
