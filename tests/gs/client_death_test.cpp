@@ -277,6 +277,36 @@ TEST_F(ClientOfAFake, Pings_areAnsweredInsideDispatchOnly) {
   EXPECT_FALSE(answer.ok);
 }
 
+TEST_F(ClientOfAFake, NotificationForSeveral_keepsTheDescriptorReadableUntilAllHaveIt) {
+  const wyx_token_t first = subscriber(), second = subscriber();
+  session.event.send(wire::Fanout{{first, second}});
+  session.event.send(state_for(-1, "shared"));
+  session.event.send(wire::FanoutEnd{});
+  recorder().set_hook([this](const Seen&) { EXPECT_TRUE(readable(fd())); });
+  dispatch_next();
+  for (const wyx_token_t token : {first, second}) EXPECT_EQ(told(token), "subscription {state}, state 'shared'\n");
+  EXPECT_FALSE(readable(fd()));
+}
+
+TEST_F(ClientOfAFake, NotificationForSeveralThatMakesNoSense_endsTheSession) {
+  const wire::ServerMessage fanout = wire::Fanout{{1, 2}}, end = wire::FanoutEnd{}, shared = state_for(-1, "s"),
+                            own = state_for(1, "s"), ping = wire::Ping{1};
+  for (const auto& messages : std::vector<std::vector<wire::ServerMessage>>{{shared},
+                                                                            {end},
+                                                                            {fanout, fanout},
+                                                                            {fanout, own},
+                                                                            {fanout, end},
+                                                                            {fanout, ping},
+                                                                            {fanout, shared, shared},
+                                                                            {fanout, shared, ping}}) {
+    for (const auto& message : messages) session.event.send(message);
+    EXPECT_TRUE(dispatch_until(fd(), [] { return wyx_dispatch(WYX_NON_BLOCKING) == WYX_NO_INIT; }));
+    session.close();
+    wyx_quit();
+    open_with_fake();
+  }
+}
+
 // ---------------------------------------------------------------------------------------------- the real daemon
 
 class ClientOfADaemon : public SessionTest, public testing::WithParamInterface<int> {};

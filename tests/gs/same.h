@@ -47,6 +47,8 @@ inline auto fields(const Ping& m) { return std::tie(m.number); }
 inline auto fields(const QueryNode&) { return std::tie(); }
 inline auto fields(const Quit&) { return std::tie(); }
 inline auto fields(const Farewell&) { return std::tie(); }
+inline auto fields(const Fanout& m) { return std::tie(m.tokens); }
+inline auto fields(const FanoutEnd&) { return std::tie(); }
 
 }  // namespace wire
 

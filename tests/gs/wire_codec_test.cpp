@@ -134,6 +134,9 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
     EXPECT_NE(problem_of_built(ServerMessage(Notify{-1, std::make_shared<const Notification>(bad[i])})), "") << i;
   EXPECT_NE(problem_of_built(ServerMessage(Welcome{0x8000, 1, 1})), "");
 
+  for (const auto& tokens : {std::vector<Token>{1}, std::vector<Token>{1, -1}, std::vector<Token>(kMaxFanout + 1)})
+    EXPECT_NE(problem_of_built(ServerMessage(Fanout{tokens})), "") << tokens.size();
+
   N huge = samples::full_protocol();
   const auto value = std::make_shared<const Bytes>(kMaxStateValue, 'v');
   const VoteResult large{{1, 1}, WYX_VOTE_APPROVE, 0, 0, value, value};

@@ -111,8 +111,13 @@ inline std::vector<Notification> notifications() {
 }
 
 inline std::vector<ServerMessage> server_messages() {
-  std::vector<ServerMessage> messages = {Welcome{4, 77, 0x8877665544332211}, Answer{WYX_UNEXPECTED_QUORUM_RESP},
-                                         NodeInfo{4, 5}, Ping{6}, Farewell{}};
+  std::vector<ServerMessage> messages = {Welcome{4, 77, 0x8877665544332211},
+                                         Answer{WYX_UNEXPECTED_QUORUM_RESP},
+                                         NodeInfo{4, 5},
+                                         Ping{6},
+                                         Farewell{},
+                                         Fanout{{0, 7, 2'000'000'000}},
+                                         FanoutEnd{}};
   Token token = 0;
   for (Notification& n : notifications()) {
     messages.push_back(Notify{token++, std::make_shared<const Notification>(std::move(n))});

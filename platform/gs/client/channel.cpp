@@ -109,7 +109,8 @@ Channel::Got Channel::receive(wire::ServerMessage* message) {
   std::string error;
   for (;;) {
     const ssize_t length = recv(fd(), packet_.data(), packet_.size(), MSG_DONTWAIT);
-    if (length < 0 && errno == EINTR) continue;
+    // ECONNRESET: the other side has left something unread; what it had said before, and then its end, follow.
+    if (length < 0 && (errno == EINTR || errno == ECONNRESET)) continue;
     if (length < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return Got::kNothing;
     if (length <= 0) return Got::kEnd;
     if (!assembler_.add({packet_.data(), static_cast<std::size_t>(length)}, &error)) break;

@@ -78,6 +78,8 @@ const wyx_responsiveness_notification_t* Records::ping(const wyx_responsiveness_
 }
 
 wyx_proposal_t* Records::proposal(const Proposal& p) {
+  if (built_ == &p) return &proposal_;
+  built_ = source_ ? &p : nullptr;
   proposal_ = {};
   proposal_.gs_phase_info = {p.num_phases, p.phase};
   proposal_.gs_proposed_by = to_record(p.proposed_by);

@@ -12,6 +12,13 @@ namespace gs::client {
 /// points. A part that the notification does not carry is a null pointer. One thread at a time.
 class Records {
  public:
+  /// What the following calls get their values from: what was built from it already is used again. Null: nothing.
+  void begin(const std::shared_ptr<const Notification>& source) {
+    if (source == source_) return;
+    source_ = source;
+    built_ = nullptr;
+  }
+
   const wyx_n_phase_notification_t* n_phase(Token token, const ProtocolNotification& n);
   const wyx_approved_notification_t* approved(Token token, const ProtocolNotification& n);
   const wyx_rejected_notification_t* rejected(Token token, const ProtocolNotification& n);
@@ -44,6 +51,9 @@ class Records {
   static wyx_state_value_t* fill(wyx_state_value_t& record, const SharedBytes& bytes);
   static wyx_group_attributes_t* fill(wyx_group_attributes_t& record, const GroupAttributes& attributes);
   static wyx_vote_results_t* fill(VoteResults& storage, const std::vector<VoteResult>& votes);
+
+  std::shared_ptr<const Notification> source_;
+  const Proposal* built_ = nullptr;  // of source_: proposal_ was built from it
 
   wyx_n_phase_notification_t n_phase_;
   wyx_approved_notification_t approved_;

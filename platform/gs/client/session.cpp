@@ -161,8 +161,10 @@ Session::Step Session::deliver_next() {
   const Incoming incoming = transport_->take();
   switch (incoming.kind) {
     case Incoming::Kind::kNothing:
+      records_[level_].begin(nullptr);
       return Step::kNothing;
     case Incoming::Kind::kNotification:
+      records_[level_].begin(incoming.what);
       return deliver(incoming.token, *incoming.what);
     case Incoming::Kind::kPing:
       return answer_ping(incoming.ping);

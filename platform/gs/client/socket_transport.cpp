@@ -122,19 +122,53 @@ wyx_rc_t SocketTransport::set_responsiveness(const wire::SetResponsiveness& sett
 wyx_rc_t SocketTransport::query_node(wire::NodeInfo* info) { return exchange(wire::QueryNode{}, info); }
 
 Incoming SocketTransport::take() {
-  wire::ServerMessage message;
-  const Channel::Got got = events_->receive(&message);
-  if (got == Channel::Got::kNothing) return {};
-  if (got == Channel::Got::kMessage) {
-    if (auto* notify = std::get_if<wire::Notify>(&message)) {
-      return {Incoming::Kind::kNotification, notify->token, std::move(notify->what), 0};
+  for (;;) {
+    if (shared_ && handed_out_ < fanout_.size()) {
+      return {Incoming::Kind::kNotification, fanout_[handed_out_++], shared_, 0};
     }
-    if (const auto* ping = std::get_if<wire::Ping>(&message))
-      return {Incoming::Kind::kPing, -1, nullptr, ping->number};
+    wire::ServerMessage message;
+    const Channel::Got got = events_->receive(&message);
+    if (got == Channel::Got::kNothing) return {};
+    if (got == Channel::Got::kMalformed) return malformed();
+    if (got != Channel::Got::kMessage) {
+      hang_up();
+      return {Incoming::Kind::kGone, -1, nullptr, 0};
+    }
+    if (auto next = accept(std::move(message))) return std::move(*next);
   }
-  if (got == Channel::Got::kMalformed) lose_without_answer("event", got, 0);
-  if (got == Channel::Got::kMessage) lose("farewell", ECONNRESET, "the daemon stops");
-  hang_up();
+}
+
+/// Nothing: the message was part of a fan-out.
+std::optional<Incoming> SocketTransport::accept(wire::ServerMessage message) {
+  const bool in_fanout = !fanout_.empty();
+  if (auto* notify = std::get_if<wire::Notify>(&message)) {
+    const bool for_fanout = notify->token == -1;
+    if (for_fanout != in_fanout || shared_) return malformed();
+    if (!for_fanout) return Incoming{Incoming::Kind::kNotification, notify->token, std::move(notify->what), 0};
+    shared_ = std::move(notify->what);
+    return std::nullopt;
+  }
+  if (std::holds_alternative<wire::FanoutEnd>(message)) {
+    if (!shared_) return malformed();
+    fanout_.clear();
+    shared_.reset();
+    return std::nullopt;
+  }
+  if (in_fanout) return malformed();
+  if (auto* fanout = std::get_if<wire::Fanout>(&message)) {
+    fanout_ = std::move(fanout->tokens);
+    handed_out_ = 0;
+    return std::nullopt;
+  }
+  if (const auto* ping = std::get_if<wire::Ping>(&message)) {
+    return Incoming{Incoming::Kind::kPing, -1, nullptr, ping->number};
+  }
+  lose("farewell", ECONNRESET, "the daemon stops");
+  return Incoming{Incoming::Kind::kGone, -1, nullptr, 0};
+}
+
+Incoming SocketTransport::malformed() {
+  lose_without_answer("event", Channel::Got::kMalformed, 0);
   return {Incoming::Kind::kGone, -1, nullptr, 0};
 }
 

@@ -42,6 +42,8 @@ class SocketTransport : public Transport {
   void lose(const std::string& what, int error, const std::string& why);
   void lose_without_answer(const char* step, Channel::Got got, int limit);
   void hang_up();
+  Incoming malformed();
+  std::optional<Incoming> accept(wire::ServerMessage message);
 
   const std::uint32_t node_number_;
   const std::unique_ptr<Channel> requests_;
@@ -49,6 +51,11 @@ class SocketTransport : public Transport {
   Mutex exchange_mutex_;  // one exchange at a time on requests_
   Mutex answer_mutex_;    // one sender at a time on events_
   std::atomic<bool> gone_ = false;
+
+  // Of the thread that takes: a notification for several clients. Its end stays in the socket until all have it.
+  std::vector<Token> fanout_;  // empty: none is under way
+  std::size_t handed_out_ = 0;
+  std::shared_ptr<const Notification> shared_;  // null: it is still to come
 };
 
 }  // namespace gs::client

@@ -57,6 +57,8 @@ std::size_t bulk(const std::vector<VoteResult>& results) {
   return total;
 }
 
+std::size_t bulk(const Request& request);
+
 /// Bytes of the parts that can be large: enough to keep FlatBuffers from ever being given more than it can hold.
 std::size_t bulk(const Notification& notification) {
   if (const auto* n = std::get_if<ProtocolNotification>(&notification)) {
@@ -67,7 +69,8 @@ std::size_t bulk(const Notification& notification) {
   if (const auto* n = std::get_if<SubscriptionNotification>(&notification)) {
     return bulk(n->state) + bulk(n->full_membership) + 3 * bulk(n->changing_membership);
   }
-  return 0;
+  if (const auto* n = std::get_if<AnnouncementNotification>(&notification)) return bulk(n->providers);
+  return bulk(std::get<DelayedErrorNotification>(notification).failing_request);
 }
 
 // -------------------------------------------------------------------------------- what a request must keep to
@@ -108,27 +111,33 @@ bool enumerations_known(const R& r) {
   return true;
 }
 
-std::size_t payload(const StateChangeRequest& r) { return r.new_state.size(); }
-std::size_t payload(const MessageRequest& r) { return r.message.size(); }
-std::size_t payload(const ExpelRequest& r) {
+std::size_t bulk_of(const StateChangeRequest& r) { return r.new_state.size(); }
+std::size_t bulk_of(const MessageRequest& r) { return r.message.size(); }
+std::size_t bulk_of(const ExpelRequest& r) {
   return r.expelled.size() * sizeof(ProviderId) + r.deactivate_flag.size();
 }
-std::size_t payload(const VoteRequest& r) { return bulk(r.proposed_state) + bulk(r.message); }
+std::size_t bulk_of(const VoteRequest& r) { return bulk(r.proposed_state) + bulk(r.message); }
 template <typename R>
-std::size_t payload(const R&) {
+std::size_t bulk_of(const R&) {
   return 0;
 }
+std::size_t bulk(const Request& request) {
+  return std::visit([](const auto& r) { return bulk_of(r); }, request);
+}
 
-constexpr std::size_t kRequestFrame = 1024;  // bytes, more than a request needs beside its payload
+constexpr std::size_t kRequestFrame = 1024;      // bytes, more than a request needs beside its bulk
+constexpr std::size_t kNotificationFrame = 512;  // bytes, what a notification mostly needs beside its bulk
 
 }  // namespace
+
+std::size_t estimated_size(const Notification& notification) { return bulk(notification) + kNotificationFrame; }
 
 std::string problem_with(const Request& request) {
   return std::visit(
       [](const auto& r) -> std::string {
         if (!names_fit(r)) return "a name over the limit or with a NUL in it";
         if (!enumerations_known(r)) return "a number that is no value of its enumeration";
-        if (payload(r) > kMaxClientMessage - kRequestFrame) return "a payload that does not fit a message";
+        if (bulk_of(r) > kMaxClientMessage - kRequestFrame) return "a payload that does not fit a message";
         return {};
       },
       request);

@@ -59,6 +59,9 @@ Encoded encode(const ClientMessage& message);
 /// A Notify is encoded without its token: give that to packet_for.
 Encoded encode(const ServerMessage& message);
 
+/// About the bytes that a notification's packets have, rather more than less, without encoding it.
+std::size_t estimated_size(const Notification& notification);
+
 /// Why the daemon would take this request for malformed: a name over kMaxWireName or with a NUL in it, an
 /// enumeration value that does not exist, a payload that does not fit a message. Empty: it would not. (An
 /// enumeration of 0, "not set", passes: it is the engine's to answer.)

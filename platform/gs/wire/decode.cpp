@@ -255,6 +255,16 @@ class Reader {
 
   // ---------------------------------------------------------------------------------------------- messages
 
+  std::vector<Token> tokens(const flatbuffers::Vector<Token>& values) {
+    if (values.size() < 2 || values.size() > kMaxFanout) {
+      fail("a fan-out to too few or too many");
+      return {};
+    }
+    std::vector<Token> result(values.begin(), values.end());
+    if (std::any_of(result.begin(), result.end(), [](Token token) { return token < 0; })) fail("a token below 0");
+    return result;
+  }
+
   ClientMessage client_message(const fb::ClientMessage& m);
   ServerMessage server_message(const fb::ServerMessage& m, Token token);
 
@@ -304,6 +314,7 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
       return NodeInfo{node_number(m.body_as_NodeInfo()->node_number()),
                       node_number(m.body_as_NodeInfo()->domain_master_node())};
     case fb::ServerBody::Notify: {
+      if (token < -1) fail("a token below 0");
       auto what = std::make_shared<const Notification>(notification(*m.body_as_Notify()));
       if (const char* why = contradiction_in(*what); why != nullptr) fail(why);
       return Notify{token, std::move(what)};
@@ -312,6 +323,10 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
       return Ping{m.body_as_Ping()->number()};
     case fb::ServerBody::Farewell:
       return Farewell{};
+    case fb::ServerBody::Fanout:
+      return Fanout{tokens(*m.body_as_Fanout()->tokens())};
+    case fb::ServerBody::FanoutEnd:
+      return FanoutEnd{};
     case fb::ServerBody::NONE:
       break;
   }

@@ -221,6 +221,13 @@ ServerBody body(Builder& b, const Notify& m) {
 }
 ServerBody body(Builder& b, const Ping& m) { return {fb::ServerBody::Ping, fb::CreatePing(b, m.number).Union()}; }
 ServerBody body(Builder& b, const Farewell&) { return {fb::ServerBody::Farewell, fb::CreateFarewell(b).Union()}; }
+ServerBody body(Builder& b, const Fanout& m) {
+  const auto tokens = b.CreateVector(m.tokens);
+  return {fb::ServerBody::Fanout, fb::CreateFanout(b, tokens).Union()};
+}
+ServerBody body(Builder& b, const FanoutEnd&) {
+  return {fb::ServerBody::FanoutEnd, fb::CreateFanoutEnd(b).Union()};
+}
 
 }  // namespace
 

@@ -8,7 +8,8 @@
 
 namespace gs::wire {
 
-inline constexpr std::uint16_t kProtocolVersion = 1;
+inline constexpr std::uint16_t kProtocolVersion = 2;
+inline constexpr std::size_t kMaxFanout = kMaxSessionClients;  // tokens
 
 // ---------------------------------------------------------------------------------------- client to daemon
 
@@ -62,7 +63,7 @@ struct NodeInfo {
   std::uint32_t domain_master_node = 0;
 };
 struct Notify {
-  Token token = -1;
+  Token token = -1;  // -1: those of the Fanout before it
   std::shared_ptr<const Notification> what;
 };
 struct Ping {
@@ -70,7 +71,14 @@ struct Ping {
 };
 /// The daemon is going away; nothing follows.
 struct Farewell {};
+/// The Notify that follows, whose own token is -1, is for each of these in turn: 2 to kMaxFanout, none negative.
+/// After it comes a FanoutEnd, and nothing in between.
+struct Fanout {
+  std::vector<Token> tokens;
+};
+/// A reader leaves it unread until all tokens have their notification, so that its descriptor stays readable.
+struct FanoutEnd {};
 
-using ServerMessage = std::variant<Welcome, Answer, NodeInfo, Notify, Ping, Farewell>;
+using ServerMessage = std::variant<Welcome, Answer, NodeInfo, Notify, Ping, Farewell, Fanout, FanoutEnd>;
 
 }  // namespace gs::wire
