@@ -44,7 +44,7 @@ class Input {
 class Run {
  public:
   Run(const std::uint8_t* data, std::size_t size) : input_(data, size) {
-    require(good_.join(0, 0, "g0") == WYX_OK, "join");
+    require(good_.join(0, 0, "g0") == WYX_OK && good_.join(1, 1, "g0") == WYX_OK, "join");
   }
 
   void run() {
@@ -142,7 +142,14 @@ class Run {
 
   Input input_;
   test::MadeUp<Input> made_up_{input_};
-  MemoryDaemon daemon_{kQueueBound};
+  static ClientLimits limits() {
+    ClientLimits limits;
+    limits.user_queue_bound = 2 * kQueueBound;
+    limits.total_queue_bound = 4 * kQueueBound;
+    return limits;
+  }
+
+  MemoryDaemon daemon_{{1, kQueueBound}, limits()};
   MemoryClient good_{daemon_};
   std::vector<ConnectionId> open_;
   wire::Welcome last_welcome_;

@@ -33,6 +33,7 @@ class MemoryTransport : public Transport {
     return Sent::kDone;
   }
   void wait_writable(ConnectionId connection) override { wires.at(connection).wants_writable = true; }
+  bool watch_process(ConnectionId) override { return true; }
   void close(ConnectionId connection) override { wires.at(connection).closed = true; }
 
   /// The daemon's messages so far, taken off the wire.
@@ -54,17 +55,18 @@ class MemoryTransport : public Transport {
 };
 
 struct MemoryDaemon {
-  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20, const Limits& limits = {})
-      : layer({.node_number = 1, .queue_bound = queue_bound, .engine = limits},
+  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20) : MemoryDaemon({1, queue_bound}, {}) {}
+  explicit MemoryDaemon(SessionLayer::Settings settings, const ClientLimits& limits)
+      : layer((settings.limits = limits, settings),
               {transport, ordering, [this] { return time; }, [this] { return ++last_random; }, logger,
                [this] { work_left = true; }}) {
     logger->set_level(spdlog::level::trace);
   }
 
-  ConnectionId open(std::uint32_t uid = 1000) {
+  ConnectionId open(std::uint32_t uid = 1000, int pid = 4711) {
     const ConnectionId id = ++last_connection;
     transport.wires[id];
-    layer.opened(id, Peer{4711, uid, 100, {}});
+    layer.opened(id, Peer{pid, uid, 100, {}});
     return id;
   }
   void say(ConnectionId id, const wire::ClientMessage& message) {
@@ -102,10 +104,11 @@ struct MemoryDaemon {
 /// A session with both channels, and what a well-behaved client does with them.
 class MemoryClient {
  public:
-  explicit MemoryClient(MemoryDaemon& daemon) : daemon_(daemon), request(daemon.open()) {
+  explicit MemoryClient(MemoryDaemon& daemon, std::uint32_t uid = 1000)
+      : daemon_(daemon), request(daemon.open(uid)) {
     daemon_.say(request, wire::Hello{wire::kProtocolVersion, 0, 0, "client"});
     welcome = std::get<wire::Welcome>(daemon_.transport.take(request).at(0));
-    event = daemon_.open();
+    event = daemon_.open(uid);
     daemon_.say(event, wire::Attach{welcome.session_number, welcome.cookie});
     if (std::get<wire::Answer>(daemon_.transport.take(event).at(0)).rc != WYX_OK)
       throw std::runtime_error("attach");

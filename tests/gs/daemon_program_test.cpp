@@ -3,6 +3,7 @@
 #include <signal.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <fstream>
@@ -77,7 +78,7 @@ TEST(DaemonProgram, HostileAndDyingClients_AreClosedWithAReasonAndMembersGoOn) {
 }
 
 TEST(DaemonProgram, FloodThatIsNotDrained_ClosesTheSlowClientAndHoldsUpNobody) {
-  GsdProcess gsd({"--queue-bound", "1000000"});
+  GsdProcess gsd({"--queue-bound", "1000000", "--drain-time", "1"});
   Member sender(gsd, 1), slow(gsd, 2);
   std::optional<ProviderId> failed;
   for (int i = 0; i < 1000 && !failed; ++i) {
@@ -87,6 +88,29 @@ TEST(DaemonProgram, FloodThatIsNotDrained_ClosesTheSlowClientAndHoldsUpNobody) {
   if (!failed) sender.expect_failure_of(2);
   EXPECT_TRUE(gsd.wait_for_log("does not drain its notifications"));
   slow.event.wait_for_close();
+}
+
+// As the kernel closes no socket that a child still holds.
+TEST(DaemonProgram, ProcessThatEndsWhileItsChildHoldsTheSockets_IsLostOnceItsLastRequestIsDone) {
+  GsdProcess gsd;
+  Member survivor(gsd, 1);
+  int child_may_end[2];
+  ASSERT_EQ(pipe(child_may_end), 0);
+  const pid_t parent = fork();
+  if (parent == 0) {
+    Member dying(gsd, 2);
+    close(child_may_end[1]);
+    char byte;
+    if (fork() == 0) _exit(static_cast<int>(read(child_may_end[0], &byte, 1)));
+    dying.request.send(wire::Call{MessageRequest{1, {}, "last words"}});
+    _exit(0);
+  }
+  ASSERT_EQ(waitpid(parent, nullptr, 0), parent);
+  survivor.read_until(WYX_PROVIDER_MESSAGE);
+  survivor.expect_failure_of(2);
+  EXPECT_TRUE(gsd.wait_for_log("closed: its process has ended"));
+  close(child_may_end[0]);
+  close(child_may_end[1]);
 }
 
 TEST(DaemonProgram, IdleClients_CostAtMost64KiBEach) {
@@ -207,8 +231,10 @@ class DaemonConfig : public testing::Test {
     return path_;
   }
   static auto values(const Options& o) {
-    return std::tuple(o.socket_path, o.access_group, o.node_number, o.queue_bound, o.log_level, o.log_file,
-                      o.engine.session_bytes, o.engine.user_bytes, o.engine.total_bytes, o.engine.max_phase_time);
+    return std::tuple(o.socket_path, o.access_group, o.node_number, o.queue_bound, o.drain_time,
+                      o.user_queue_bound, o.total_queue_bound, o.max_sessions, o.user_sessions, o.root_sessions,
+                      o.log_level, o.log_file, o.engine.session_bytes, o.engine.user_bytes, o.engine.total_bytes,
+                      o.engine.max_phase_time);
   }
 
   TempDir dir_;
@@ -248,21 +274,26 @@ TEST_F(DaemonConfig, WrongOptionOrFile_IsOneLineAndStatusTwo) {
 TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const std::string path = write(
       "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\n"
+      "drain-time = 3\nuser-queue-bound = 200_000\ntotal-queue-bound = 300_000\n"
+      "max-sessions = 4\nuser-sessions = 5\nroot-sessions = 6\n"
       "log-level = \"debug\"\nlog-file = \"/tmp/log\"\nsession-state-bound = 2_000_000\n"
       "user-state-bound = 3_000_000\nstate-bound = 4_000_000\nmax-phase-time = 300\n");
   const char* argv[] = {"gsd", "--config", path.c_str(), "--node-number", "13"};
   const auto options = parse_options(5, argv);
   ASSERT_TRUE(options);
-  EXPECT_EQ(values(*options), std::tuple("/tmp/x", "0", 13u, 100'000u, spdlog::level::debug, "/tmp/log",
-                                         2'000'000u, 3'000'000u, 4'000'000u, 300));
+  EXPECT_EQ(values(*options),
+            std::tuple("/tmp/x", "0", 13u, 100'000u, std::chrono::seconds(3), 200'000u, 300'000u, 4u, 5u, 6u,
+                       spdlog::level::debug, "/tmp/log", 2'000'000u, 3'000'000u, 4'000'000u, 300));
 }
 
 TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
   Options changed;
   changed.socket_path = changed.access_group = changed.log_file = "changed";
   changed.node_number = 99;
-  changed.queue_bound = 0;
   changed.engine = {1, 1, 1, 1, 1};
+  changed.queue_bound = changed.user_queue_bound = changed.total_queue_bound = 0;
+  changed.drain_time = {};
+  changed.max_sessions = changed.user_sessions = changed.root_sessions = 99;
   changed.log_level = spdlog::level::off;
   const Options defaults;
   EXPECT_EQ(values(read_config(SAMPLE_CONFIG, changed)), values(defaults));
@@ -281,6 +312,12 @@ TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
       {"user\\-state\\-bound", "Default: " + std::to_string(defaults.engine.user_bytes) + "."},
       {"state\\-bound", "Default: " + std::to_string(defaults.engine.total_bytes) + "."},
       {"max\\-phase\\-time", "Default: " + std::to_string(defaults.engine.max_phase_time) + ";"},
+      {"drain\\-time", "Default: " + std::to_string(defaults.drain_time.count()) + "."},
+      {"user\\-queue\\-bound", "Default: " + std::to_string(defaults.user_queue_bound) + "."},
+      {"total\\-queue\\-bound", "Default: " + std::to_string(defaults.total_queue_bound) + "."},
+      {"max\\-sessions", "Default: " + std::to_string(defaults.max_sessions) + "."},
+      {"user\\-sessions", "Default: " + std::to_string(defaults.user_sessions) + "."},
+      {"root\\-sessions", "Default: " + std::to_string(defaults.root_sessions) + "."},
       {"log\\-file", "Default: none"},
       {"log\\-level", "Default: " + level + "."}};
   for (const auto& [option, text] : entries) {

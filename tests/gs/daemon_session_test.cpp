@@ -6,6 +6,7 @@
 #include "common/access.h"
 #include "gs/daemon_memory.h"
 #include "gs/engine_text.h"
+#include "tests/support/allocations.h"
 
 namespace gs::daemon {
 namespace {
@@ -50,15 +51,17 @@ TEST_F(DaemonSession, AttachThatIsNotItsOwn_IsClosedAndTheSessionLivesOn) {
   const auto [request, welcome] = greeted();
   const struct {
     std::uint32_t uid;
+    int pid;
     std::uint64_t cookie;
     bool closed;
     const char* what;
-  } attempts[] = {{1000, welcome.cookie + 1, true, "a guess"},
-                  {1001, welcome.cookie, true, "another user"},
-                  {1000, welcome.cookie, false, "its own"},
-                  {1000, welcome.cookie, true, "a second one"}};
+  } attempts[] = {{1000, 4711, welcome.cookie + 1, true, "a guess"},
+                  {1001, 4711, welcome.cookie, true, "another user"},
+                  {1000, 4712, welcome.cookie, true, "another process"},
+                  {1000, 4711, welcome.cookie, false, "its own"},
+                  {1000, 4711, welcome.cookie, true, "a second one"}};
   for (const auto& attempt : attempts) {
-    const ConnectionId id = daemon_.open(attempt.uid);
+    const ConnectionId id = daemon_.open(attempt.uid, attempt.pid);
     daemon_.say(id, wire::Attach{welcome.session_number, attempt.cookie});
     EXPECT_EQ(daemon_.closed(id), attempt.closed) << attempt.what;
   }
@@ -154,7 +157,7 @@ TEST_F(DaemonSession, ClientThatStalls_GetsEverythingInOrderOnceItTakesAgain_The
   EXPECT_FALSE(daemon_.layer.drained());
   daemon_.layer.lost(sender.request, "gone");
   slow.event_wire().full = false;
-  daemon_.layer.writable(slow.event);
+  for (int turn = 0; turn < 2; ++turn) daemon_.layer.writable(slow.event);
   EXPECT_TRUE(daemon_.layer.drained());
   std::string order;
   for (const std::string& line : told(slow))
@@ -162,15 +165,155 @@ TEST_F(DaemonSession, ClientThatStalls_GetsEverythingInOrderOnceItTakesAgain_The
   EXPECT_EQ(order, "abcdefarewell");
 }
 
-TEST(DaemonQueue, MessageOverTheBound_PassesOnlyWhenNothingElseWaits) {
-  OutQueue queue;
-  SubscriptionNotification state;
-  state.type = WYX_SUBSCRIPTION_STATE;
-  state.state = std::make_shared<const Bytes>(100'000, 's');
-  const auto large = wire::encode(wire::Notify{1, std::make_shared<const Notification>(state)});
-  EXPECT_TRUE(queue.push(large, 1, 1000));
-  EXPECT_FALSE(queue.push(large, 1, 2 * large.size() - 1));
-  EXPECT_TRUE(queue.push(large, 1, 2 * large.size()));
+// --------------------------------------------------------------------------------------------- bounds and limits
+
+/// Messages of 64 KiB into a group that only this client is in.
+void talk_to_itself(MemoryClient& client, const std::string& group, int messages) {
+  ASSERT_EQ(client.join(1, static_cast<std::int16_t>(client.event), group), WYX_OK);
+  for (int i = 0; i < messages; ++i) {
+    ASSERT_EQ(client.call(MessageRequest{1, {}, Bytes(1024 * 64, 'm')}), WYX_OK);
+  }
+}
+
+TEST_F(DaemonSession, ClientOverTheQueueBound_IsClosedOnlyIfItIsStillOverItAfterTheDrainTime) {
+  MemoryClient client(daemon_), idle(daemon_);
+  client.event_wire().full = true;
+  talk_to_itself(client, "a", 32);
+  daemon_.pass(9'999ms);
+  client.event_wire().full = false;
+  for (int turn = 0; turn < 5; ++turn) daemon_.layer.writable(client.event);
+  EXPECT_THAT(client.events().size(), testing::Le(5 * 5u)) << "a turn is bounded";
+  client.event_wire().full = true;
+  daemon_.pass(3600s);
+  EXPECT_FALSE(client.closed()) << "under the bound it may wait for ever";
+
+  ASSERT_EQ(client.call(GoodbyeRequest{1}), WYX_OK);
+  talk_to_itself(client, "b", 16);
+  daemon_.pass(9'999ms);
+  EXPECT_FALSE(client.closed());
+  daemon_.pass(1ms);
+  EXPECT_TRUE(client.closed() && daemon_.logged("does not drain its notifications"));
+  EXPECT_FALSE(idle.closed());
+}
+
+TEST(DaemonBounds, UserOrAllOverTheirBound_LoseWhoHoldsTheMost_RootAndOtherUsersLoseNobody) {
+  ClientLimits limits;
+  limits.user_queue_bound = 4 << 20;
+  MemoryDaemon daemon({1, 1 << 20}, limits);
+  MemoryClient root(daemon, 0), other(daemon, 1), modest(daemon, 2), greedy(daemon, 2);
+  for (MemoryClient* client : {&root, &other, &modest, &greedy}) client->event_wire().full = true;
+  talk_to_itself(root, "root", 80);
+  talk_to_itself(other, "other", 48);
+  talk_to_itself(modest, "modest", 16);
+  ASSERT_EQ(greedy.join(1, 1, "greedy"), WYX_OK);
+  for (int i = 0; i < 100 && !greedy.closed(); ++i) greedy.call(MessageRequest{1, {}, Bytes(60'000, 'm')});
+  EXPECT_TRUE(greedy.closed() && daemon.logged("its user is over user-queue-bound"));
+
+  limits.total_queue_bound = 8 << 20;
+  MemoryDaemon full({1, 1 << 20}, limits);
+  MemoryClient served(full, 0), most(full, 3), less(full, 4), last(full, 5);
+  for (MemoryClient* client : {&served, &most, &less, &last}) client->event_wire().full = true;
+  talk_to_itself(served, "root", 8);
+  talk_to_itself(most, "most", 48);
+  talk_to_itself(less, "less", 32);
+  talk_to_itself(last, "last", 32);
+  EXPECT_TRUE(most.closed() && full.logged("all are over total-queue-bound"));
+  EXPECT_FALSE(root.closed() || other.closed() || modest.closed());
+  EXPECT_FALSE(served.closed() || less.closed() || last.closed());
+}
+
+// Five readers of one burst hold it once, not five times.
+TEST(DaemonBounds, BurstForManyReaders_CountsOnceForTheirUser) {
+  ClientLimits limits;
+  limits.user_queue_bound = 3 << 20;
+  MemoryDaemon daemon({1, 1 << 20}, limits);
+  MemoryClient sender(daemon, 0);
+  ASSERT_EQ(sender.join(1, 1), WYX_OK);
+  std::vector<std::unique_ptr<MemoryClient>> readers;
+  for (std::int16_t i = 2; i < 7; ++i) {
+    readers.push_back(std::make_unique<MemoryClient>(daemon));
+    ASSERT_EQ(readers.back()->join(1, i), WYX_OK);
+    readers.back()->event_wire().full = true;
+  }
+  for (int i = 0; i < 32; ++i) ASSERT_EQ(sender.call(MessageRequest{1, {}, Bytes(1024 * 64, 'm')}), WYX_OK);
+  for (const auto& reader : readers) {
+    EXPECT_FALSE(reader->closed());
+    reader->event_wire().full = false;
+    for (int turn = 0; turn < 20; ++turn) daemon.layer.writable(reader->event);
+    EXPECT_THAT(reader->events().size(), testing::Ge(32u));
+  }
+  EXPECT_TRUE(daemon.layer.drained());
+}
+
+TEST(DaemonBounds, SessionsAndSilentConnectionsOverTheirLimit_AreToldSo_RootIsLetIn) {
+  ClientLimits limits;
+  limits.max_sessions = 6;
+  limits.user_sessions = 2;
+  limits.root_sessions = 1;
+  MemoryDaemon daemon({1, 1 << 20}, limits);
+  const auto hello = [&](std::uint32_t uid) {
+    const ConnectionId id = daemon.open(uid);
+    daemon.say(id, wire::Hello{});
+    const auto answer = daemon.transport.take(id).at(0);
+    EXPECT_EQ(daemon.closed(id), answer.index() != 0);
+    return answer.index() == 0 ? WYX_OK : std::get<wire::Answer>(answer).rc;
+  };
+  for (const auto& [uid, rc] : std::vector<std::pair<std::uint32_t, wyx_rc_t>>{{1, WYX_OK},
+                                                                               {1, WYX_OK},
+                                                                               {1, WYX_NO_MEMORY},
+                                                                               {2, WYX_OK},
+                                                                               {2, WYX_OK},
+                                                                               {3, WYX_OK},
+                                                                               {4, WYX_NO_MEMORY},
+                                                                               {0, WYX_OK},
+                                                                               {0, WYX_NO_MEMORY}})
+    EXPECT_EQ(hello(uid), rc) << uid;
+  ConnectionId last = 0;
+  for (int i = 0; i < 300; ++i) last = daemon.open(5);
+  EXPECT_TRUE(daemon.closed(last));
+  EXPECT_EQ(std::get<wire::Answer>(daemon.transport.take(last).at(0)).rc, WYX_NO_MEMORY);
+  EXPECT_FALSE(daemon.closed(daemon.open(6)) || daemon.closed(daemon.open(0)));
+}
+
+TEST_F(DaemonSession, SeveralEndpointsOfOneSession_ShareTheNotification_EachInItsOrder) {
+  MemoryClient many(daemon_), single(daemon_);
+  ASSERT_EQ(many.join(0, 0), WYX_OK);
+  ASSERT_EQ(single.join(9, 9), WYX_OK);
+  for (std::int16_t i = 1; i < 3; ++i) ASSERT_EQ(many.join(i, i), WYX_OK);
+  many.events();
+  many.event_wire().full = true;
+  ASSERT_EQ(single.call(MessageRequest{9, {}, "first"}), WYX_OK);
+  ASSERT_EQ(many.call(GoodbyeRequest{1}), WYX_OK);
+  many.event_wire().full = false;
+  daemon_.layer.writable(many.event);
+  const auto events = many.events();
+  ASSERT_EQ(events.size(), 6u);
+  EXPECT_THAT(std::get<wire::Fanout>(events[0]).tokens, ElementsAre(0, 1, 2));
+  EXPECT_EQ(std::get<wire::Notify>(events[1]).token, -1);
+  EXPECT_THAT(std::get<wire::Fanout>(events[3]).tokens, ElementsAre(0, 2));
+  EXPECT_TRUE(std::holds_alternative<wire::FanoutEnd>(events[5]));
+  EXPECT_EQ(std::get<wire::Notify>(single.events().back()).token, 9);
+}
+
+// An allocation fails anywhere in an event: some may be closed, and the daemon goes on with the others.
+TEST(DaemonBounds, MemoryThatRunsOutAnywhere_ClosesSessionsAndServesTheNextOne) {
+  if (!allocations::kControlled) GTEST_SKIP() << "the sanitizer allocates";
+  for (int after = 0; after < 120; ++after) {
+    MemoryDaemon daemon;
+    MemoryClient first(daemon), second(daemon);
+    ASSERT_EQ(first.join(1, 1), WYX_OK);
+    ASSERT_EQ(second.join(1, 2), WYX_OK);
+    const auto packets = wire::packets_of(wire::ClientMessage(wire::Call{LeaveRequest{1, {WYX_1_PHASE, 0}, 0}}));
+    try {
+      const allocations::Refuse refuse(after);
+      daemon.layer.received(first.request, packets[0]);
+    } catch (const std::bad_alloc&) {
+      daemon.layer.failed(first.request, "out of memory");
+    }
+    MemoryClient next(daemon);
+    ASSERT_EQ(next.join(1, 3), WYX_OK) << after;
+    EXPECT_TRUE(second.closed() || second.call(MessageRequest{1, {}, "there"}) == WYX_OK) << after;
+  }
 }
 
 // -------------------------------------------------------------------------------------------------------- pings

@@ -16,16 +16,21 @@ class LocalOrdering : public Ordering {
   void submit(Event event) override {
     waiting_.push_back(std::move(event));
     if (delivering_) return;
-    delivering_ = true;
+    const Turn turn{delivering_ = true};
     while (!waiting_.empty()) {
       const Event next = std::move(waiting_.front());
       waiting_.pop_front();
       sink_(next);
     }
-    delivering_ = false;
   }
 
  private:
+  /// Also over when the sink throws.
+  struct Turn {
+    bool& delivering;
+    ~Turn() { delivering = false; }
+  };
+
   Sink sink_;
   std::deque<Event> waiting_;
   bool delivering_ = false;

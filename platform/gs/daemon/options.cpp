@@ -23,6 +23,8 @@ constexpr std::uint64_t kMinQueueBound = 64 * 1024;
 constexpr std::uint64_t kMaxQueueBound = std::uint64_t{1} << 40;
 constexpr std::uint64_t kMinStateBound = 1024 * 1024;
 constexpr std::uint64_t kMaxStateBound = std::uint64_t{1} << 40;
+constexpr std::uint64_t kMaxDrainTime = 3600;
+constexpr std::uint64_t kMaxSessions = 1'000'000;
 
 Problem set_socket_path(Options& options, const std::string& text) {
   constexpr std::size_t kLongest = sizeof(sockaddr_un::sun_path) - 1;
@@ -47,10 +49,18 @@ Problem set_node_number(Options& options, const std::string& text) {
   if (problem.empty()) options.node_number = static_cast<std::uint32_t>(value);
   return problem;
 }
-Problem set_queue_bound(Options& options, const std::string& text) {
+/// A size that is kept in the options as it is given.
+template <std::size_t Options::*Member, std::uint64_t kMin, std::uint64_t kMax>
+Problem set_size(Options& options, const std::string& text) {
   std::uint64_t value = 0;
-  Problem problem = set_number(text, kMinQueueBound, kMaxQueueBound, &value);
-  if (problem.empty()) options.queue_bound = value;
+  Problem problem = set_number(text, kMin, kMax, &value);
+  if (problem.empty()) options.*Member = value;
+  return problem;
+}
+Problem set_drain_time(Options& options, const std::string& text) {
+  std::uint64_t value = 0;
+  Problem problem = set_number(text, 1, kMaxDrainTime, &value);
+  if (problem.empty()) options.drain_time = std::chrono::seconds(value);
   return problem;
 }
 template <std::size_t Limits::*Bound>
@@ -91,7 +101,19 @@ constexpr Setting kSettings[] = {
     {"access-group", "GROUP", false, "Unix group whose members may be clients (none: the owner alone)",
      set_access_group},
     {"node-number", "N", true, "Number of this node, 0 to 32767", set_node_number},
-    {"queue-bound", "BYTES", true, "Bytes that may wait for a client before it is closed", set_queue_bound},
+    {"queue-bound", "BYTES", true, "Bytes that may wait for a client for any time",
+     set_size<&Options::queue_bound, kMinQueueBound, kMaxQueueBound>},
+    {"drain-time", "SECONDS", true, "How long more may wait before the client is closed", set_drain_time},
+    {"user-queue-bound", "BYTES", true, "Bytes that may wait for all clients of a user",
+     set_size<&Options::user_queue_bound, kMinQueueBound, kMaxQueueBound>},
+    {"total-queue-bound", "BYTES", true, "Bytes that may wait for all clients",
+     set_size<&Options::total_queue_bound, kMinQueueBound, kMaxQueueBound>},
+    {"max-sessions", "N", true, "Sessions at a time, as far as descriptors allow",
+     set_size<&Options::max_sessions, 1, kMaxSessions>},
+    {"user-sessions", "N", true, "Sessions of one user at a time (0: half of all)",
+     set_size<&Options::user_sessions, 0, kMaxSessions>},
+    {"root-sessions", "N", true, "Sessions of all that are kept for root",
+     set_size<&Options::root_sessions, 0, kMaxSessions>},
     {"session-state-bound", "BYTES", true, "Bytes that one client may have in groups",
      set_state_bound<&Limits::session_bytes>},
     {"user-state-bound", "BYTES", true, "Bytes that all clients of a user but root may have in groups",

@@ -4,6 +4,7 @@
 
 #include <spdlog/common.h>
 
+#include <chrono>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -16,9 +17,16 @@ namespace gs::daemon {
 
 struct Options {
   std::string socket_path = wire::kDefaultSocketPath;
-  std::string access_group;                    // name or number of a unix group; empty: the owner alone
-  std::uint32_t node_number = 1;               // 0 to 32767
-  std::size_t queue_bound = 16 * 1024 * 1024;  // bytes that may wait for each channel of a client
+  std::string access_group;                          // name or number of a unix group; empty: the owner alone
+  std::uint32_t node_number = 1;                     // 0 to 32767
+  std::size_t queue_bound = 16 * 1024 * 1024;        // bytes that may wait for each channel of a client
+  std::chrono::seconds drain_time{10};               // that more may wait for it
+  std::size_t user_queue_bound = 256 * 1024 * 1024;  // bytes that may wait for all clients of a user but root
+  std::size_t total_queue_bound =
+      1024 * 1024 * 1024;  // bytes that may wait for all clients, one eighth for root's
+  std::size_t max_sessions = 4096;
+  std::size_t user_sessions = 0;   // of a user but root; 0: half of max_sessions
+  std::size_t root_sessions = 16;  // of max_sessions, for root alone
   Limits engine;
   spdlog::level::level_enum log_level = spdlog::level::info;
   std::string log_file;  // empty: standard error

@@ -1,6 +1,8 @@
 #include "daemon/server.h"
 
+#include <malloc.h>
 #include <sys/random.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 
 #include <cerrno>
@@ -8,6 +10,8 @@
 #include <cstring>
 #include <system_error>
 
+#include "daemon/memory_reserve.h"
+#include "daemon/peer_process.h"
 #include "wire/endpoint.h"
 
 namespace gs::daemon {
@@ -18,6 +22,8 @@ constexpr timeval kAtOnce = {0, 0};       // after the descriptors that are read
 constexpr timeval kAcceptPause = {0, 100'000};    // when descriptors have run out
 constexpr timeval kFarewellLimit = {0, 500'000};  // for clients to take what waits for them
 constexpr int kAcceptsAtOnce = 64;                // before the connected are served again
+constexpr int kLastPackets = 64;                  // that a process has left behind
+constexpr std::size_t kOwnDescriptors = 32;       // socket, log, loop and the like
 
 Time now() { return std::chrono::duration_cast<Time>(std::chrono::steady_clock::now().time_since_epoch()); }
 
@@ -33,6 +39,17 @@ void enlarge_send_buffer(int fd) {
   setsockopt(fd, SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
 }
 
+std::size_t descriptors_for_clients() {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return ClientLimits{}.descriptors;
+  return limit.rlim_cur > kOwnDescriptors ? limit.rlim_cur - kOwnDescriptors : 0;
+}
+
+ClientLimits limits_of(const Options& options) {
+  return {options.max_sessions,      options.user_sessions,    options.root_sessions,
+          descriptors_for_clients(), options.user_queue_bound, options.total_queue_bound};
+}
+
 /// The default path's directory is the daemon's own.
 const std::string& prepared(const std::string& path) {
   if (path == wire::kDefaultSocketPath) platform::make_directory_of(path);
@@ -41,10 +58,27 @@ const std::string& prepared(const std::string& path) {
 
 }  // namespace
 
+/// No error of one client's ends the daemon or reaches the loop. `id`: the client's connection, if it is about
+/// one.
+template <typename Action>
+void Server::guarded(ConnectionId id, Action action) {
+  try {
+    action();
+  } catch (const std::exception& error) {
+    log_->error("{}", error.what());
+    try {
+      sessions_.failed(id, std::string("the daemon could not serve it: ") + error.what());
+    } catch (const std::exception& again) {
+      log_->error("connection {}: not closed yet: {}", id, again.what());
+    }
+  }
+  tend_memory();
+}
+
 template <void (Server::*Member)()>
 void Server::call(evutil_socket_t, short, void* server) {
   auto* self = static_cast<Server*>(server);
-  (self->*Member)();
+  self->guarded(0, [self] { (self->*Member)(); });
   self->arm_deadline();
 }
 
@@ -52,8 +86,23 @@ template <void (Server::*Member)(ConnectionId)>
 void Server::call_connection(evutil_socket_t, short, void* connection) {
   auto* at = static_cast<Connection*>(connection);
   Server* self = at->server;
-  (self->*Member)(at->id);  // may destroy the connection
+  self->guarded(at->id, [self, id = at->id] { (self->*Member)(id); });  // may destroy the connection
   self->arm_deadline();
+}
+
+/// While the reserve is taken, each turn of the loop gives some memory back.
+void Server::tend_memory() {
+  if (!memory_reserve::taken()) return;
+  const bool was_short = std::exchange(short_of_memory_, true);
+  if (!was_short) log_->error("out of memory: clients may be closed, and nothing new is taken in");
+  malloc_trim(0);
+  short_of_memory_ = !memory_reserve::refill();
+  try {
+    sessions_.set_short_of_memory(short_of_memory_);
+  } catch (const std::exception& error) {
+    log_->error("out of memory: {}", error.what());
+  }
+  if (!short_of_memory_) log_->warn("there is memory again");
 }
 
 Server::EventPtr Server::make_event(evutil_socket_t fd, short what, event_callback_fn callback, void* argument) {
@@ -67,10 +116,16 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       access_{geteuid(), platform::group_id(options.access_group)},
       base_(event_base_new()),
       listener_("gsd", prepared(options.socket_path), access_.group),
-      sessions_({.node_number = options.node_number, .queue_bound = options.queue_bound, .engine = options.engine},
-                {*this, ordering_, now, random_number, log_, [this] { event_add(continue_.get(), &kAtOnce); }}),
+      sessions_({.node_number = options.node_number,
+                 .queue_bound = options.queue_bound,
+                 .drain_time = options.drain_time,
+                 .limits = limits_of(options),
+                 .engine = options.engine},
+                {*this, ordering_, now, random_number, log_, [this] { event_add(continue_.get(), &kAtOnce); },
+                 [] { malloc_trim(0); }}),
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
+  memory_reserve::hold();
   const auto on_stop = [](evutil_socket_t signal, short, void* self) {
     static_cast<Server*>(self)->stop(strsignal(static_cast<int>(signal)));
   };
@@ -98,6 +153,10 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
 
 Server::~Server() = default;
 
+void Server::set_bounds(const Options& options) {
+  sessions_.set_bounds(options.queue_bound, options.drain_time, limits_of(options));
+}
+
 void Server::run() { event_base_dispatch(base_.get()); }
 
 Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action,
@@ -110,7 +169,7 @@ Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::
 
 void Server::Repeated::call(evutil_socket_t, short, void* self) {
   const auto* repeated = static_cast<Repeated*>(self);
-  repeated->action_();
+  repeated->server_.guarded(0, repeated->action_);
   repeated->server_.arm_deadline();
 }
 
@@ -173,22 +232,58 @@ void Server::add_connection(Descriptor socket) {
   connection.server = this;
   connection.id = id;
   connection.socket = std::move(socket);
-  connection.readable = make_event(fd, EV_READ | EV_PERSIST, call_connection<&Server::on_readable>, &connection);
-  event_add(connection.readable.get(), nullptr);
-  sessions_.opened(id, *peer);
+  connection.connected = time_since_boot();
+  try {
+    connection.readable = make_event(fd, EV_READ | EV_PERSIST, call_connection<&Server::on_readable>, &connection);
+    if (event_add(connection.readable.get(), nullptr) != 0) throw std::bad_alloc();
+    sessions_.opened(id, *peer);
+  } catch (const std::exception& error) {
+    log_->error("connection (pid {}, uid {}): closed: {}", peer->pid, peer->uid, error.what());
+    sessions_.lost(id, error.what());
+    connections_.erase(id);
+  }
 }
 
 // ------------------------------------------------------------------------------------------------- connections
 
-void Server::on_readable(ConnectionId id) {
+void Server::on_readable(ConnectionId id) { receive_one(id); }
+
+/// False: nothing more is there.
+bool Server::receive_one(ConnectionId id) {
   const int fd = connections_.at(id).socket.get();
   const ssize_t length = recv(fd, packet_.data(), packet_.size(), MSG_DONTWAIT);
-  if (length > 0) return sessions_.received(id, {packet_.data(), static_cast<std::size_t>(length)});
-  if (length == 0) return sessions_.lost(id, "the peer is gone");
-  if (errno != EAGAIN && errno != EINTR) sessions_.lost(id, std::string("the peer is gone: ") + strerror(errno));
+  if (length > 0) {
+    sessions_.received(id, {packet_.data(), static_cast<std::size_t>(length)});
+    return true;
+  }
+  // The peer has left something unread. What it had sent before is there all the same, then the end.
+  if (length < 0 && errno == ECONNRESET) return true;
+  if (length == 0) sessions_.lost(id, "the peer is gone");
+  if (length < 0 && errno != EAGAIN && errno != EINTR) {
+    sessions_.lost(id, std::string("the peer is gone: ") + strerror(errno));
+  }
+  return false;
 }
 
 void Server::on_writable(ConnectionId id) { sessions_.writable(id); }
+
+bool Server::watch_process(ConnectionId id) {
+  Connection& connection = connections_.at(id);
+  auto process = process_of_peer(connection.socket.get(), connection.connected);
+  if (!process) return false;
+  if (!*process) return true;  // the end of its socket has to do
+  connection.process = std::move(*process);
+  connection.process_ended =
+      make_event(connection.process.get(), EV_READ, call_connection<&Server::on_process_ended>, &connection);
+  event_add(connection.process_ended.get(), nullptr);
+  return true;
+}
+
+void Server::on_process_ended(ConnectionId id) {
+  for (int i = 0; i < kLastPackets && connections_.contains(id) && receive_one(id); ++i) {
+  }
+  sessions_.lost(id, "its process has ended");
+}
 
 Transport::Sent Server::send_packet(ConnectionId to, std::span<const std::byte> header,
                                     std::span<const std::byte> slice) {
@@ -251,7 +346,10 @@ void Server::stop(const std::string& why) {
   event_del(deadline_.get());
   event_del(continue_.get());
   listener_.close();
-  for (auto& [id, connection] : connections_) event_del(connection.readable.get());
+  for (auto& [id, connection] : connections_) {
+    event_del(connection.readable.get());
+    if (connection.process_ended) event_del(connection.process_ended.get());
+  }
   sessions_.say_farewell();
   event_add(farewell_over_.get(), &kFarewellLimit);
   finish_when_drained();

@@ -43,7 +43,7 @@ class Server : private Transport {
   void on_stopping(std::function<void()> action) { stopping_action_ = std::move(action); }
   void set_log_level(spdlog::level::level_enum level) { log_->set_level(level); }
   spdlog::logger& log() { return *log_; }
-  void set_queue_bound(std::size_t bytes) { sessions_.set_queue_bound(bytes); }
+  void set_bounds(const Options& options);
   std::size_t clients() const { return sessions_.sessions(); }
   std::vector<Engine::GroupStatus> groups() const { return sessions_.groups(); }
   std::vector<SessionLayer::SessionStatus> sessions() const { return sessions_.status(); }
@@ -75,19 +75,24 @@ class Server : private Transport {
     Server* server;
     ConnectionId id;
     Descriptor socket;
-    EventPtr readable;  // the events go before the socket
+    std::chrono::milliseconds connected;  // since boot
+    Descriptor process;                   // of the peer, once that is watched
+    EventPtr readable;                    // the events go before their descriptors
     EventPtr writable;
+    EventPtr process_ended;
   };
 
   // Transport.
   Sent send_packet(ConnectionId to, std::span<const std::byte> header, std::span<const std::byte> slice) override;
   void wait_writable(ConnectionId id) override;
+  bool watch_process(ConnectionId id) override;
   void close(ConnectionId id) override;
 
   // Called by the loop.
   void on_acceptable();
   void on_readable(ConnectionId id);
   void on_writable(ConnectionId id);
+  void on_process_ended(ConnectionId id);
   void on_deadline();
   void on_continue() { sessions_.continue_work(); }
 
@@ -98,7 +103,11 @@ class Server : private Transport {
   void pause_accepting(int error);
   void arm_deadline();
   void finish_when_drained();
+  bool receive_one(ConnectionId id);
 
+  template <typename Action>
+  void guarded(ConnectionId id, Action action);
+  void tend_memory();
   template <void (Server::*Member)()>
   static void call(evutil_socket_t, short, void* server);
   template <void (Server::*Member)(ConnectionId)>
@@ -128,6 +137,7 @@ class Server : private Transport {
   std::unordered_map<ConnectionId, Connection> connections_;
   ConnectionId last_connection_ = 0;
   bool stopping_ = false;
+  bool short_of_memory_ = false;
   std::vector<std::byte> packet_;  // of whatever connection is being read
 };
 

@@ -95,8 +95,14 @@ std::vector<std::string> Service::read_again() {
   }
   options_->log_level = now.log_level;
   options_->queue_bound = now.queue_bound;
+  options_->drain_time = now.drain_time;
+  options_->user_queue_bound = now.user_queue_bound;
+  options_->total_queue_bound = now.total_queue_bound;
+  options_->max_sessions = now.max_sessions;
+  options_->user_sessions = now.user_sessions;
+  options_->root_sessions = now.root_sessions;
   if (!tracing_) server_->set_log_level(now.log_level);
-  server_->set_queue_bound(now.queue_bound);
+  server_->set_bounds(now);
   if (now.socket_path != options_->socket_path) later("socket-path");
   if (now.access_group != options_->access_group) later("access-group");
   if (now.node_number != options_->node_number) later("node-number");

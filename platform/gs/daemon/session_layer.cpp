@@ -6,11 +6,31 @@
 #include "gscl/GSUtils.h"
 
 namespace gs::daemon {
+namespace {
+
+/// Of what ends something or is waited for there is always room for one more.
+bool needs_memory(const Request& request) {
+  return !std::holds_alternative<LeaveRequest>(request) && !std::holds_alternative<GoodbyeRequest>(request) &&
+         !std::holds_alternative<VoteRequest>(request) && !std::holds_alternative<UnsubscribeRequest>(request);
+}
+
+/// The session that an event comes from; 0: none.
+std::uint64_t origin(const Event& event) {
+  if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session.number;
+  if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session.number;
+  return 0;
+}
+
+}  // namespace
 
 SessionLayer::SessionLayer(const Settings& settings, Environment environment)
-    : settings_(settings), env_(std::move(environment)), client_log_(*env_.log), engine_(settings.engine) {
+    : settings_(settings),
+      env_(std::move(environment)),
+      client_log_(*env_.log),
+      engine_(std::make_unique<Engine>(settings.engine)),
+      accounts_(settings.limits) {
   for (std::size_t rc = 0; rc < answers_.size(); ++rc) {
-    answers_[rc] = wire::encode(wire::Answer{static_cast<wyx_rc_t>(rc)});
+    answers_[rc] = packets_of(wire::Answer{static_cast<wyx_rc_t>(rc)});
   }
   env_.ordering.start([this](const Event& event) { ordered(event); });
 }
@@ -27,9 +47,17 @@ SessionLayer::Session* SessionLayer::find_session(std::uint64_t number) {
 
 // -------------------------------------------------------------------------------------------------- from below
 
+void SessionLayer::set_bounds(std::size_t queue_bound, Duration drain_time, const ClientLimits& limits) {
+  settings_.queue_bound = queue_bound;
+  settings_.drain_time = drain_time;
+  accounts_.set_limits(limits);
+}
+
 void SessionLayer::opened(ConnectionId id, const Peer& peer) {
-  Connection& connection = connections_[id];
-  connection.peer = peer;
+  Connection& connection = connections_.try_emplace(id, peer, accounts_, recent_).first->second;
+  if (const char* problem = accounts_.problem_with_connection(connection.share.account())) {
+    return refuse(id, problem);
+  }
   connection.handshake = timers_.arm(env_.now() + settings_.handshake_limit, [this, id] {
     end(id, End::kFault, "said neither Hello nor Attach in time");
   });
@@ -44,14 +72,30 @@ void SessionLayer::received(ConnectionId id, std::span<const std::byte> packet) 
   const auto message = connection->in.take_client_message(&error);
   if (!message) return end(id, End::kFault, "malformed: " + error);
   on_message(id, *connection, *message);
+  enforce_bounds();
 }
 
 void SessionLayer::writable(ConnectionId id) {
   Connection* connection = find(id);
   if (connection == nullptr) return;
-  const auto sent = connection->out.flush(env_.transport, id);
-  if (sent == Transport::Sent::kFull) env_.transport.wait_writable(id);
-  if (sent == Transport::Sent::kGone) end(id, End::kGone, "the peer is gone");
+  if (!handle(id, connection->out.flush(env_.transport, id, kFlushShare))) return;
+  if (!connection->out.empty()) env_.transport.wait_writable(id);
+  watch_bound(id, *connection);
+  note_freed();
+}
+
+void SessionLayer::failed(ConnectionId id, const std::string& why) { end(id, End::kFault, why); }
+
+void SessionLayer::set_short_of_memory(bool is_short) {
+  short_of_memory_ = is_short;
+  if (!is_short) return;
+  recent_.drop();
+  ConnectionId id = 0;
+  for (const auto of : {Accounts::Overdraft::Of::kAllButRoot, Accounts::Overdraft::Of::kRoot}) {
+    const Connection* most = most_waiting({of}, &id);
+    if (most == nullptr || most->out.bytes() < kWorthClosing) continue;
+    return end(id, End::kFault, "out of memory, and it has the most to read");
+  }
 }
 
 void SessionLayer::lost(ConnectionId id, const std::string& why) {
@@ -60,12 +104,12 @@ void SessionLayer::lost(ConnectionId id, const std::string& why) {
 
 void SessionLayer::say_farewell() {
   client_log_.tell_left_out();
-  const wire::Encoded farewell = wire::encode(wire::Farewell{});
+  const EncodedPtr farewell = packets_of(wire::Farewell{});
   std::vector<ConnectionId> channels;
   for (const auto& [number, session] : sessions_) {
     if (session.event != 0) channels.push_back(session.event);
   }
-  for (const ConnectionId id : channels) send(id, farewell);
+  for (const ConnectionId id : channels) put(id, {farewell}, true);
   said_farewell_ = true;
 }
 
@@ -116,29 +160,36 @@ void SessionLayer::on_hello(ConnectionId id, Connection& connection, const wire:
     answer(id, WYX_NOT_SUPPORTED);
     return end(id, End::kFault, "speaks protocol version " + std::to_string(hello.protocol_version));
   }
+  Account& account = connection.share.account();
+  const char* problem = short_of_memory_ ? "out of memory" : accounts_.problem_with_session(account);
+  if (problem != nullptr) return refuse(id, problem);
+  if (!env_.transport.watch_process(id)) return end(id, End::kGone, "its process has ended");
   const std::uint64_t number = ++last_session_;
   timers_.cancel(connection.handshake);
+  Session& session = sessions_.try_emplace(number, number, account, *this).first->second;
   connection.channel = Channel::kRequest;
   connection.session = number;
-  Session& session = sessions_.try_emplace(number, number, *this).first->second;
+  connection.share.settle();
   session.request = id;
   session.cookie = env_.random();
   session.program = printable(hello.program);
   session.attach_limit = timers_.arm(env_.now() + settings_.handshake_limit, [this, number] {
     end_session(number, End::kFault, "did not attach its event channel in time");
   });
-  send(id, wire::encode(wire::Welcome{settings_.node_number, number, session.cookie}));
+  send(id, wire::Welcome{settings_.node_number, number, session.cookie});
 }
 
 void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire::Attach& attach) {
   Session* session = find_session(attach.session_number);
-  const bool right = session != nullptr && session->event == 0 && session->cookie == attach.cookie &&
-                     find(session->request)->peer.uid == connection.peer.uid;
-  if (!right) return end(id, End::kFault, "attaches to a session that is not its own");
+  const bool known = session != nullptr && session->event == 0 && session->cookie == attach.cookie;
+  const Peer* opener = known ? &find(session->request)->peer : nullptr;
+  if (!known || opener->uid != connection.peer.uid || opener->pid != connection.peer.pid)
+    return end(id, End::kFault, "attaches to a session that is not its own");
   timers_.cancel(connection.handshake);
   timers_.cancel(session->attach_limit);
   connection.channel = Channel::kEvent;
   connection.session = attach.session_number;
+  connection.share.settle();
   session->event = id;
   log_about(connection.peer.uid, spdlog::level::info, describe(connection) + ": connected");
   answer(id, WYX_OK);
@@ -148,20 +199,21 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, const wire::
   Session* session = find_session(connection.session);
   if (session->event == 0) return end(id, End::kFault, "out of order: a request before its event channel");
   if (session->answer_due) return end(id, End::kFault, "out of order: a request before the answer to the last");
+  if (short_of_memory_ && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
   session->answer_due = true;
   env_.ordering.submit(RequestEvent{id_of(connection.session), call.request, false, connection.peer.uid});
 }
 
 void SessionLayer::on_query_node(ConnectionId id) {
   // With one host, that host is the domain's master.
-  send(id, wire::encode(wire::NodeInfo{settings_.node_number, settings_.node_number}));
+  send(id, wire::NodeInfo{settings_.node_number, settings_.node_number});
 }
 
 // ----------------------------------------------------------------------------------------------------- pingers
 
 void SessionLayer::send_ping(std::uint64_t session, std::uint64_t ping) {
   const Session* found = find_session(session);
-  if (found != nullptr && found->event != 0) send(found->event, wire::encode(wire::Ping{ping}));
+  if (found != nullptr && found->event != 0) send(found->event, wire::Ping{ping});
 }
 
 void SessionLayer::responding_changed(std::uint64_t session, bool responding) {
@@ -178,23 +230,39 @@ void SessionLayer::too_slow(std::uint64_t session) {
 
 // ------------------------------------------------------------------------------------------------ ordered side
 
+void SessionLayer::ordered(const Event& event) {
+  const std::uint64_t from = origin(event);
+  if (from != 0 && from <= last_forgotten_) return;
+  Outcome outcome;
+  try {
+    outcome = engine_->apply(event);
+  } catch (const std::exception& error) {
+    return begin_anew(error.what());
+  }
+  try {
+    deliver(event, outcome);
+  } catch (const std::exception& error) {
+    begin_anew(error.what());
+  }
+  enforce_bounds();
+}
+
 // What a request brings its own client is written before the answer, the rest after it: a client that wakes for
 // its answer finds its notifications there and need not sleep again, and no answer waits for hundreds of sends.
-void SessionLayer::ordered(const Event& event) {
-  const Outcome outcome = engine_.apply(event);
+void SessionLayer::deliver(const Event& event, const Outcome& outcome) {
   if (env_.log->should_log(spdlog::level::debug)) trace(event, outcome);
   const auto* request = std::get_if<RequestEvent>(&event);
   const SessionId asker = request != nullptr ? request->session : SessionId{};
-  for (const Delivery& delivery : outcome.deliveries) {
-    if (request != nullptr && delivery.to.session == asker) deliver(delivery);
+  sent_at_once_ = 0;
+  if (request != nullptr) {
+    deliver_to(outcome.deliveries, [&](const Delivery& d) { return d.to.session == asker; });
+    if (!request->answered) answer_request(asker, outcome.rc);
   }
-  if (request != nullptr && !request->answered) answer_request(asker, outcome.rc);
-  for (const Delivery& delivery : outcome.deliveries) {
-    if (request == nullptr || delivery.to.session != asker) deliver(delivery);
-  }
-  encoded_.clear();
+  deliver_to(outcome.deliveries, [&](const Delivery& d) { return request == nullptr || d.to.session != asker; });
+  outgoing_.clear();
+  if (accounts_.waiting() == 0) recent_.drop();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
-  if (!engine_.busy() || continue_due_) return;
+  if (!engine_->busy() || continue_due_) return;
   continue_due_ = true;
   env_.continue_soon();
 }
@@ -202,6 +270,26 @@ void SessionLayer::ordered(const Event& event) {
 void SessionLayer::continue_work() {
   continue_due_ = false;
   env_.ordering.submit(ContinueEvent{});
+}
+
+/// Of an event that the engine could not finish nobody knows what it has changed: no client is served from that.
+void SessionLayer::begin_anew(const std::string& why) {
+  env_.log->critical("an event could not be finished: {}; all sessions are closed and all groups end", why);
+  last_forgotten_ = last_session_;
+  while (!sessions_.empty()) {
+    const ConnectionId request = sessions_.begin()->second.request, event = sessions_.begin()->second.event;
+    timers_.cancel(sessions_.begin()->second.attach_limit);
+    sessions_.erase(sessions_.begin());
+    drop(request);
+    if (event != 0) drop(event);
+  }
+  for (auto& [group, of_group] : phase_timers_) {
+    timers_.cancel(of_group.timer);
+    timers_.cancel(of_group.warning);
+  }
+  phase_timers_.clear();
+  engine_ = std::make_unique<Engine>(settings_.engine);
+  return_memory_soon();
 }
 
 void SessionLayer::trace(const Event& event, const Outcome& outcome) {
@@ -221,13 +309,51 @@ void SessionLayer::answer_request(SessionId asker, wyx_rc_t rc) {
   answer(session->request, rc);
 }
 
-void SessionLayer::deliver(const Delivery& delivery) {
-  if (delivery.to.session.node != settings_.node_number) return;
-  const Session* session = find_session(delivery.to.session.number);
+template <typename Wanted>
+void SessionLayer::deliver_to(const std::vector<Delivery>& deliveries, Wanted wanted) {
+  run_.clear();
+  for (const Delivery& delivery : deliveries) {
+    if (delivery.to.session.node != settings_.node_number || !wanted(delivery)) continue;
+    if (!run_.empty() && run_.back()->what != delivery.what) deliver_run();
+    run_.push_back(&delivery);
+  }
+  deliver_run();
+}
+
+/// One notification to all of the run. Each endpoint has the notifications in their order, also when the endpoints
+/// of a session are served together.
+void SessionLayer::deliver_run() {
+  if (run_.empty()) return;
+  const auto session_of = [](const Delivery* d) { return d->to.session.number; };
+  if (!std::ranges::is_sorted(run_, {}, session_of)) std::ranges::stable_sort(run_, {}, session_of);
+  std::shared_ptr<Outgoing>& what = outgoing_[run_.front()->what.get()];
+  if (!what) what = std::make_shared<Outgoing>(run_.front()->what);
+  for (auto first = run_.begin(); first != run_.end();) {
+    const auto last =
+        std::find_if(first, run_.end(), [&](const Delivery* d) { return d->to.session != (*first)->to.session; });
+    deliver_to_session({first, last}, what);
+    first = last;
+  }
+  run_.clear();
+}
+
+void SessionLayer::deliver_to_session(std::span<const Delivery* const> to, const std::shared_ptr<Outgoing>& what) {
+  const std::uint64_t number = to.front()->to.session.number;
+  const Session* session = find_session(number);
   if (session == nullptr) return;
-  wire::Encoded& message = encoded_[delivery.what.get()];
-  if (!message) message = wire::encode(wire::Notify{-1, delivery.what});
-  send(session->event, message, delivery.to.token);
+  const ConnectionId event = session->event;
+  const bool at_once = sent_at_once_ < kEventShare;
+  if (at_once) sent_at_once_ += what->size();
+  try {
+    if (to.size() == 1) return void(put(event, {nullptr, what, to.front()->to.token}, at_once));
+    wire::Fanout fanout;
+    for (const Delivery* delivery : to) fanout.tokens.push_back(delivery->to.token);
+    if (put(event, {packets_of(fanout)}, at_once) && put(event, {nullptr, what}, at_once)) {
+      put(event, {fanout_end_}, at_once);
+    }
+  } catch (const std::exception& error) {
+    end_session(number, End::kFault, std::string("it could not be sent its notification: ") + error.what());
+  }
 }
 
 void SessionLayer::arm(const TimerRequest& timer) {
@@ -248,8 +374,8 @@ void SessionLayer::arm(const TimerRequest& timer) {
 }
 
 void SessionLayer::warn_of_missing_votes(const TimerId& phase) {
-  if (!engine_.awaits(phase)) return;
-  const MissingVotes missing = engine_.missing_votes(phase.group, kNamedVoters);
+  if (!engine_->awaits(phase)) return;
+  const MissingVotes missing = engine_->missing_votes(phase.group, kNamedVoters);
   if (missing.count == 0) return;
   std::string names;
   for (const MissingVoter& voter : missing.voters) names += (names.empty() ? "" : ", ") + describe(voter);
@@ -272,7 +398,7 @@ std::string SessionLayer::describe(const MissingVoter& voter) {
 void SessionLayer::drop_stale_timers() {
   std::erase_if(phase_timers_, [this](const auto& of_group) {
     PhaseTimer ended = of_group.second;
-    if (engine_.awaits(ended.phase)) return false;
+    if (engine_->awaits(ended.phase)) return false;
     timers_.cancel(ended.timer);
     timers_.cancel(ended.warning);
     return true;
@@ -282,16 +408,107 @@ void SessionLayer::drop_stale_timers() {
 
 // --------------------------------------------------------------------------------------------- sending, ending
 
-void SessionLayer::send(ConnectionId to, const wire::Encoded& message, Token token) {
+/// Sends, `at_once` where nothing waits, or queues. False: the connection is not there, or no longer.
+bool SessionLayer::put(ConnectionId to, OutQueue::Item item, bool at_once) {
   Connection* connection = find(to);
-  if (connection == nullptr || said_farewell_) return;
-  if (!message) return end(to, End::kFault, "a notification for it is over the limit of a message");
+  if (connection == nullptr || said_farewell_) return false;
   const bool waited = !connection->out.empty();
-  if (!connection->out.push(message, token, settings_.queue_bound)) {
-    return end(to, End::kFault,
-               "does not drain its notifications: " + std::to_string(connection->out.bytes()) + " bytes wait");
+  if (at_once) {
+    if (!handle(to, connection->out.send(std::move(item), env_.transport, to))) return false;
+  } else {
+    connection->out.push(std::move(item));
   }
-  if (!waited) writable(to);
+  if (connection->out.empty()) return true;
+  queued_ = true;
+  if (!waited) env_.transport.wait_writable(to);
+  watch_bound(to, *connection);
+  return find(to) != nullptr;
+}
+
+/// False: the connection is closed.
+bool SessionLayer::handle(ConnectionId id, OutQueue::Sent sent) {
+  if (sent == OutQueue::Sent::kGone) end(id, End::kGone, "the peer is gone");
+  if (sent == OutQueue::Sent::kTooLarge)
+    end(id, End::kFault, "a notification for it is over the limit of a message");
+  return sent != OutQueue::Sent::kGone && sent != OutQueue::Sent::kTooLarge;
+}
+
+/// Answers come one to a request: whom so many wait for asks without reading them. Of notifications one event may
+/// bring a client more than any bound.
+void SessionLayer::watch_bound(ConnectionId id, Connection& connection) {
+  const std::size_t bytes = connection.out.bytes();
+  if (bytes <= settings_.queue_bound) return timers_.cancel(connection.drain_limit);
+  if (connection.channel != Channel::kEvent) {
+    return end(id, End::kFault, "asks and does not read the answers: " + std::to_string(bytes) + " bytes wait");
+  }
+  if (connection.drain_limit.number != 0) return;
+  connection.drain_limit = timers_.arm(env_.now() + settings_.drain_time, [this, id] { drain_time_over(id); });
+}
+
+void SessionLayer::drain_time_over(ConnectionId id) {
+  writable(id);  // what it has made room for counts
+  Connection* connection = find(id);
+  if (connection == nullptr) return;
+  connection->drain_limit = {};
+  const std::size_t bytes = connection->out.bytes();
+  if (bytes <= settings_.queue_bound) return;
+  end(id, End::kFault, "does not drain its notifications: " + std::to_string(bytes) + " bytes wait");
+}
+
+void SessionLayer::enforce_bounds() {
+  if (!std::exchange(queued_, false)) return;
+  most_waited_ = std::max(most_waited_, accounts_.waiting());
+  for (;;) {
+    const auto overdraft = accounts_.overdraft();
+    if (overdraft.of == Accounts::Overdraft::Of::kNobody) return;
+    ConnectionId id = 0;
+    const Connection* worst = most_waiting(overdraft, &id);
+    if (worst == nullptr) return;
+    const bool one_user = overdraft.of == Accounts::Overdraft::Of::kUser;
+    end(id, End::kFault,
+        std::string(one_user ? "its user is over user-queue-bound" : "all are over total-queue-bound") +
+            " and it has the most to read: " + std::to_string(worst->out.bytes()) + " bytes wait");
+  }
+}
+
+/// Among those whom the overdraft is of. Who has less to read than the queue bound comes after all who have more.
+SessionLayer::Connection* SessionLayer::most_waiting(const Accounts::Overdraft& overdraft, ConnectionId* id) {
+  Connection* most = nullptr;
+  for (auto& [candidate, connection] : connections_) {
+    if (connection.out.empty() || !overdraft.covers(connection.share.account())) continue;
+    if (most != nullptr && connection.out.bytes() <= most->out.bytes()) continue;
+    most = &connection;
+    *id = candidate;
+  }
+  return most;
+}
+
+void SessionLayer::note_freed() {
+  if (most_waited_ >= accounts_.waiting() + kMuchFreed) return_memory_soon();
+}
+
+void SessionLayer::return_memory_soon() {
+  if (return_memory_.number != 0) return;
+  return_memory_ = timers_.arm(env_.now() + kBetweenReturns, [this] {
+    return_memory_ = {};
+    most_waited_ = accounts_.waiting();
+    env_.return_memory();
+  });
+}
+
+/// With an answer, so that the client can say why. A line in the log at most now and then: many may try again and
+/// again.
+void SessionLayer::refuse(ConnectionId id, const std::string& why) {
+  answer(id, WYX_NO_MEMORY);
+  const Connection* connection = find(id);
+  if (connection == nullptr) return;
+  ++refused_;
+  if (env_.now() >= next_refusal_line_) {
+    env_.log->warn("{}: refused: {} ({} since the last such line)", describe(*connection), why, refused_);
+    refused_ = 0;
+    next_refusal_line_ = env_.now() + kBetweenRefusalLines;
+  }
+  drop(id);
 }
 
 void SessionLayer::end(ConnectionId id, End how, const std::string& why) {
@@ -317,12 +534,15 @@ void SessionLayer::end_session(std::uint64_t number, End how, const std::string&
   drop(request);
   if (event != 0) drop(event);
   env_.ordering.submit(SessionGoneEvent{id_of(number)});
+  return_memory_soon();
 }
 
 void SessionLayer::drop(ConnectionId id) {
   const auto found = connections_.find(id);
   timers_.cancel(found->second.handshake);
+  timers_.cancel(found->second.drain_limit);
   connections_.erase(found);
+  note_freed();
   env_.transport.close(id);
 }
 

@@ -13,7 +13,11 @@
 //
 //   (1) once the session's event channel is attached; before that: close.
 //
-// A session lives while both its connections do. However it ends, its providers fail and its subscriptions end.
+// A session lives while both its connections and the process that opened it do. However it ends, its providers
+// fail and its subscriptions end.
+//
+// A client that does not read has what waits for it up to the queue bound, and for a while more: one event may
+// bring it any number of notifications at once.
 #pragma once
 
 #include <spdlog/logger.h>
@@ -25,6 +29,7 @@
 #include <unordered_map>
 
 #include "common/client_log.h"
+#include "daemon/accounts.h"
 #include "daemon/ordering.h"
 #include "daemon/out_queue.h"
 #include "daemon/pinger.h"
@@ -40,9 +45,11 @@ class SessionLayer : private PingSink {
  public:
   struct Settings {
     std::uint32_t node_number = 0;
-    std::size_t queue_bound = 0;       // bytes that may wait for each of a client's channels
+    std::size_t queue_bound = 0;  // bytes that may wait for each of a client's channels
+    Duration drain_time{10'000};  // that more may wait for its event channel
+    ClientLimits limits{};
     Duration handshake_limit{10'000};  // to say Hello or Attach, and to attach after Hello
-    Limits engine;
+    Limits engine{};
   };
   /// What it is given of the outside world.
   struct Environment {
@@ -51,7 +58,8 @@ class SessionLayer : private PingSink {
     std::function<Time()> now;
     std::function<std::uint64_t()> random;  // not to be guessed by a client
     std::shared_ptr<spdlog::logger> log;
-    std::function<void()> continue_soon;  // asks for one call of continue_work, after what else is ready
+    std::function<void()> continue_soon;          // asks for one call of continue_work, after what else is ready
+    std::function<void()> return_memory = [] {};  // that was freed, to the system
   };
 
   SessionLayer(const Settings& settings, Environment environment);
@@ -64,6 +72,11 @@ class SessionLayer : private PingSink {
   void writable(ConnectionId id);
   /// The peer is gone; `why` is for the log.
   void lost(ConnectionId id, const std::string& why);
+
+  /// What was done for this connection has failed; `why` is for the log.
+  void failed(ConnectionId id, const std::string& why);
+  /// While it is so, whatever would need more memory for long is refused. Closes the client that most waits for.
+  void set_short_of_memory(bool is_short);
 
   /// When run_timers is to be called next.
   std::optional<Time> next_deadline() const { return timers_.next(); }
@@ -91,26 +104,32 @@ class SessionLayer : private PingSink {
   };
   /// In the order of their numbers.
   std::vector<SessionStatus> status() const;
-  std::vector<Engine::GroupStatus> groups() const { return engine_.status(); }
+  std::vector<Engine::GroupStatus> groups() const { return engine_->status(); }
 
   /// Into the log, unless there have been too many such lines of late. `user`: whose doing it is, if anybody's.
   void log_about(std::optional<std::uint32_t> user, spdlog::level::level_enum level, const std::string& line);
 
-  /// Counts for what is queued from now on.
-  void set_queue_bound(std::size_t bytes) { settings_.queue_bound = bytes; }
+  /// Counts for what is queued and who connects from now on.
+  void set_bounds(std::size_t queue_bound, Duration drain_time, const ClientLimits& limits);
 
  private:
   enum class Channel { kFresh, kRequest, kEvent };
   struct Connection {
-    Peer peer;
+    Connection(const Peer& of, Accounts& accounts, RecentPackets& recent)
+        : peer(of), share(accounts, of.uid), out(share.account(), recent) {}
+
+    const Peer peer;
     Channel channel = Channel::kFresh;
     std::uint64_t session = 0;  // 0: none yet
+    ConnectionShare share;
     wire::Assembler in{wire::kMaxClientMessage};
     OutQueue out;
     Timers::Id handshake;
+    Timers::Id drain_limit;  // while more than the queue bound waits
   };
   struct Session {
-    Session(std::uint64_t number, SessionLayer& layer) : pinger(number, layer.timers_, layer.env_.now, layer) {}
+    Session(std::uint64_t number, Account& account, SessionLayer& layer)
+        : share(layer.accounts_, account), pinger(number, layer.timers_, layer.env_.now, layer) {}
 
     ConnectionId request = 0;
     ConnectionId event = 0;  // 0: not attached yet
@@ -118,12 +137,19 @@ class SessionLayer : private PingSink {
     std::string program;
     bool answer_due = false;  // of a Call that is being ordered
     Timers::Id attach_limit;
+    SessionShare share;
     Pinger pinger;
   };
   enum class End { kQuit, kGone, kFault };
   static constexpr std::size_t kFewTimers = 64;
   static constexpr std::chrono::seconds kLongPhase{60};  // after which the log names those who have not voted
   static constexpr std::size_t kNamedVoters = 8;
+  static constexpr std::size_t kFlushShare = 256 * 1024;       // bytes to one client before others are served
+  static constexpr std::size_t kEventShare = 1024 * 1024;      // bytes of one event that are sent at once
+  static constexpr std::size_t kWorthClosing = 256 * 1024;     // bytes that wait, when memory is short
+  static constexpr std::size_t kMuchFreed = 16 * 1024 * 1024;  // bytes
+  static constexpr Duration kBetweenReturns{1'000};            // of memory to the system
+  static constexpr Duration kBetweenRefusalLines{1'000};
 
   // One message of a client; each may close the connection it came on.
   void on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
@@ -143,15 +169,32 @@ class SessionLayer : private PingSink {
   void ordered(const Event& event);
   void trace(const Event& event, const Outcome& outcome);
   void answer_request(SessionId asker, wyx_rc_t rc);
-  void deliver(const Delivery& delivery);
+  void deliver(const Event& event, const Outcome& outcome);
+  template <typename Wanted>
+  void deliver_to(const std::vector<Delivery>& deliveries, Wanted wanted);
+  void deliver_run();
+  void deliver_to_session(std::span<const Delivery* const> to, const std::shared_ptr<Outgoing>& what);
+  void begin_anew(const std::string& why);
   void arm(const TimerRequest& timer);
   void drop_stale_timers();
   void warn_of_missing_votes(const TimerId& phase);
   std::string describe(const MissingVoter& voter);
   SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
 
-  void send(ConnectionId to, const wire::Encoded& message, Token token = -1);
-  void answer(ConnectionId to, wyx_rc_t rc) { send(to, answers_.at(rc)); }
+  void send(ConnectionId to, const wire::ServerMessage& message) { put(to, {packets_of(message)}, true); }
+  void answer(ConnectionId to, wyx_rc_t rc) { put(to, {answers_.at(rc)}, true); }
+  static EncodedPtr packets_of(const wire::ServerMessage& message) {
+    return std::make_shared<const wire::Encoded>(wire::encode(message));
+  }
+  bool put(ConnectionId to, OutQueue::Item item, bool at_once);
+  bool handle(ConnectionId id, OutQueue::Sent sent);
+  void watch_bound(ConnectionId id, Connection& connection);
+  void drain_time_over(ConnectionId id);
+  void enforce_bounds();
+  Connection* most_waiting(const Accounts::Overdraft& overdraft, ConnectionId* id);
+  void note_freed();
+  void return_memory_soon();
+  void refuse(ConnectionId id, const std::string& why);
 
   /// Closes a connection and, where it has one, its session, with a line in the log.
   void end(ConnectionId id, End how, const std::string& why);
@@ -165,8 +208,10 @@ class SessionLayer : private PingSink {
   Settings settings_;
   const Environment env_;
   platform::ClientLog client_log_;
-  Engine engine_;
+  std::unique_ptr<Engine> engine_;
   Timers timers_;
+  Accounts accounts_;
+  RecentPackets recent_;
   std::unordered_map<ConnectionId, Connection> connections_;
   std::unordered_map<std::uint64_t, Session> sessions_;
   struct PhaseTimer {
@@ -174,11 +219,23 @@ class SessionLayer : private PingSink {
     Timers::Id timer;
     Timers::Id warning;
   };
-  std::unordered_map<std::string, PhaseTimer> phase_timers_;        // by group, which runs one protocol at a time
-  std::size_t sweep_timers_at_ = kFewTimers;                        // phase timers, those of ended phases included
-  std::unordered_map<const Notification*, wire::Encoded> encoded_;  // of the outcome being delivered
-  std::array<wire::Encoded, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
+  std::unordered_map<std::string, PhaseTimer> phase_timers_;  // by group, which runs one protocol at a time
+  std::size_t sweep_timers_at_ = kFewTimers;                  // phase timers, those of ended phases included
+  // Of the outcome being delivered.
+  std::unordered_map<const Notification*, std::shared_ptr<Outgoing>> outgoing_;
+  std::vector<const Delivery*> run_;  // of one notification
+  std::size_t sent_at_once_ = 0;      // bytes
+
+  std::array<EncodedPtr, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
+  const EncodedPtr fanout_end_ = packets_of(wire::FanoutEnd{});
   std::uint64_t last_session_ = 0;
+  std::uint64_t last_forgotten_ = 0;  // sessions up to this one are not the engine's
+  bool queued_ = false;               // something, since the bounds were enforced
+  bool short_of_memory_ = false;
+  std::size_t most_waited_ = 0;  // bytes, since memory was returned
+  Timers::Id return_memory_;
+  std::size_t refused_ = 0;  // since the last line that says so
+  Time next_refusal_line_{};
   bool said_farewell_ = false;  // nothing is sent after it
   bool continue_due_ = false;   // was asked for
 };

@@ -28,6 +28,9 @@ class Transport {
                            std::span<const std::byte> slice) = 0;
   /// Asks for one call of SessionLayer::writable as soon as there is room.
   virtual void wait_writable(ConnectionId connection) = 0;
+  /// Asks for a call of SessionLayer::lost when the process at the other end ends, after what it has sent was
+  /// received: others may hold its socket. False: it has ended already.
+  virtual bool watch_process(ConnectionId connection) = 0;
   /// What was sent before still arrives. The session layer never names `connection` again.
   virtual void close(ConnectionId connection) = 0;
 };
