@@ -186,24 +186,37 @@ TEST(ClientWithoutSession, Endpoint_thatMakesNoSense) {
     EXPECT_EQ(setup().rc, WYX_BAD_PARAMETER) << value;
     int node = -1;
     EXPECT_EQ(wyx_get_node_number(&node), WYX_BAD_PARAMETER) << value;
+    EXPECT_THAT(last_failure(), testing::StartsWith("endpoint-22-"));
   }
+  setenv("GSD_ENDPOINT", "embedded:", 1);
+  for (const char* value : {"0", "86401", "-1", "1s", " 1", "99999999999"}) {
+    setenv("GSD_REQUEST_LIMIT", value, 1);
+    EXPECT_EQ(setup().rc, WYX_BAD_PARAMETER) << value;
+    EXPECT_THAT(last_failure(), testing::StartsWith("request-limit-22-"));
+  }
+  unsetenv("GSD_REQUEST_LIMIT");
 }
 
-TEST(ClientWithoutSession, NoDaemon_isSaidAtOnceAndCaptured) {
+TEST(ClientWithoutSession, NoDaemon_isSaidAtOnceAndCaptured_onStandardErrorWhenAsked) {
   const TempDir dir;
-  setenv("GSD_ENDPOINT", ("unix:" + dir / "none").c_str(), 1);
-  char before[64], after[64];
-  ASSERT_EQ(wyx_get_ffdc_id(before), WYX_OK);
+  const std::string path = dir / "none";
+  setenv("GSD_ENDPOINT", ("unix:" + path).c_str(), 1);
+  testing::internal::CaptureStderr();
   const SetupResult refused = setup();
   EXPECT_EQ(refused.rc, WYX_CONNECT_FAILED);
   EXPECT_EQ(refused.descriptor, -1);
+  EXPECT_EQ(testing::internal::GetCapturedStderr(), "");
+  EXPECT_THAT(last_failure(), testing::MatchesRegex("connect-absent-2-[0-9]+-[0-9]+-[0-9]{8}T[0-9]{6}Z"));
+
+  setenv("GSD_DEBUG", "1", 1);
+  testing::internal::CaptureStderr();
   int node = -7;
   EXPECT_EQ(wyx_get_node_number(&node), WYX_CONNECT_FAILED);
+  EXPECT_EQ(testing::internal::GetCapturedStderr(),
+            "wyx_r: cannot connect to " + path + ": No such file or directory (" + last_failure() + ")\n");
+  unsetenv("GSD_DEBUG");
   EXPECT_EQ(wyx_get_domain_master_node_number(&node), WYX_CONNECT_FAILED);
   EXPECT_EQ(node, -7);
-  ASSERT_EQ(wyx_get_ffdc_id(after), WYX_OK);
-  EXPECT_STRNE(before, after);
-  EXPECT_TRUE(std::string(after).starts_with("connect-2-")) << after;
 }
 
 TEST(ClientWithoutSession, Queries_askTheDaemonForItsNode_limitsAndVersionsNobody) {

@@ -151,6 +151,11 @@ TEST_F(ClientOfAFake, SetupThatFails_leavesTheDeadSessionToTellItsClients) {
   });
   EXPECT_EQ(setup().rc, WYX_NO_MEMORY);
   refused.get();
+  EXPECT_THAT(last_failure(), testing::StartsWith("hello-refused-5-"));
+  auto closed = std::async(std::launch::async, [this] { fake.accept().receive<wire::Hello>(); });
+  EXPECT_EQ(setup().rc, WYX_CONNECT_FAILED);
+  closed.get();
+  EXPECT_THAT(last_failure(), testing::StartsWith("hello-closed-104-"));
   dispatch_next();
   EXPECT_EQ(told(token), "died\n");
 }
@@ -170,6 +175,20 @@ TEST_F(ClientOfAFake, Quit_saysSoAndComesBackAlsoWhenTheDaemonHangsOnARequest) {
   EXPECT_EQ(sending.get(), WYX_NO_INIT);
 }
 
+TEST_F(ClientOfAFake, AnswerThatDoesNotCome_endsTheSessionAtTheLimit) {
+  session.close();
+  setenv("GSD_REQUEST_LIMIT", "1", 1);
+  open_with_fake();
+  unsetenv("GSD_REQUEST_LIMIT");
+  const wyx_token_t token = provider();
+  session.event.send(notify(token, AnnouncementNotification{WYX_RESPONSIVENESS_RESPONSE, nullptr}));
+  EXPECT_EQ(send_message(token, "x"), WYX_NO_INIT);
+  EXPECT_THAT(last_failure(), testing::StartsWith("request-timeout-110-"));
+  dispatch_next();
+  EXPECT_EQ(told(token, 2), "announcement <response>\ndied\n");
+  expect_quiet_end();
+}
+
 // --------------------------------------------------------------------------------------- what the daemon says
 
 TEST_F(ClientOfAFake, Nonsense_endsTheSessionAndIsCaptured) {
@@ -179,9 +198,7 @@ TEST_F(ClientOfAFake, Nonsense_endsTheSessionAndIsCaptured) {
   EXPECT_EQ(told(token), "died\n");
   EXPECT_EQ(send_message(token, "x"), WYX_NO_INIT);
   expect_quiet_end();
-  char id[64];
-  ASSERT_EQ(wyx_get_ffdc_id(id), WYX_OK);
-  EXPECT_TRUE(std::string(id).starts_with("malformed-")) << id;
+  EXPECT_THAT(last_failure(), testing::StartsWith("event-malformed-"));
 }
 
 TEST_F(ClientOfAFake, AnAnswerOfTheWrongKind_endsTheSession) {
@@ -246,7 +263,10 @@ TEST_F(ClientOfAFake, EveryNotification_isHandedOutWithAllItsParts) {
     std::get<ProtocolNotification>(all.back()).type = type;
   }
   for (const Notification& n : all) {
-    const bool to_subscriber = std::holds_alternative<SubscriptionNotification>(n);
+    const auto* error = std::get_if<DelayedErrorNotification>(&n);
+    const bool to_subscriber = std::holds_alternative<SubscriptionNotification>(n) ||
+                               (error && (std::holds_alternative<SubscribeRequest>(error->failing_request) ||
+                                          std::holds_alternative<UnsubscribeRequest>(error->failing_request)));
     const wyx_token_t token = to_subscriber ? subscriber() : provider();
     session.event.send(notify(token, n));
     dispatch_next();
@@ -258,12 +278,23 @@ TEST_F(ClientOfAFake, EveryNotification_isHandedOutWithAllItsParts) {
 
 TEST_F(ClientOfAFake, RefusedJoin_endsWithItsDelayedError) {
   const wyx_token_t token = provider();
-  session.event.send(notify(token, DelayedErrorNotification{WYX_STATE_VALUE_CHANGE, WYX_COLLIDE, {}, nullptr}));
+  session.event.send(
+      notify(token, DelayedErrorNotification{WYX_PROVIDER_MESSAGE, WYX_COLLIDE, MessageRequest{}, nullptr}));
   dispatch_next();
   EXPECT_EQ(answered([&] { return send_message(token, "x"); }), WYX_OK);
   session.event.send(notify(token, DelayedErrorNotification{WYX_JOIN, WYX_COLLIDE, {}, nullptr}));
   dispatch_next();
   EXPECT_EQ(send_message(token, "x"), WYX_BAD_MEMBER_TOKEN);
+}
+
+TEST_F(ClientOfAFake, NotificationForTheOtherKindOfClient_isDropped) {
+  const wyx_token_t member = provider(), watcher = subscriber();
+  session.event.send(notify(watcher, DelayedErrorNotification{WYX_JOIN, WYX_COLLIDE, JoinRequest{}, nullptr}));
+  session.event.send(state_for(member, "x"));
+  dispatch_next();
+  EXPECT_EQ(recorder().count(), 0u);
+  session.event.send(state_for(watcher, "y"));
+  EXPECT_EQ(told(watcher), "subscription {state}, state 'y'\n") << "it is still there";
 }
 
 TEST_F(ClientOfAFake, Pings_areAnsweredInsideDispatchOnly) {

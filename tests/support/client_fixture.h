@@ -25,6 +25,12 @@ inline SetupResult setup() {
   return result;
 }
 
+inline std::string last_failure() {
+  char id[64] = "";
+  EXPECT_EQ(wyx_get_ffdc_id(id), WYX_OK);
+  return id;
+}
+
 /// A group with everything at its plainest; change what a test is about.
 struct Group {
   explicit Group(std::string name_of_group) : name(std::move(name_of_group)) {
