@@ -42,4 +42,15 @@ std::string printable(std::string_view text, std::string_view kept) {
   return result;
 }
 
+std::size_t utf8_length(std::string_view text) {
+  std::size_t at = 0;
+  std::uint32_t number = 0;
+  while (at < text.size()) {
+    const std::size_t length = character_in(text.substr(at), &number);
+    if (length == 0) break;
+    at += length;
+  }
+  return at;
+}
+
 }  // namespace platform

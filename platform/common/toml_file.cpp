@@ -6,6 +6,8 @@
 #include <fstream>
 #include <sstream>
 
+#include "common/printable.h"
+
 namespace platform {
 namespace {
 
@@ -32,13 +34,18 @@ std::string content_of(const std::string& path) {
   return content.str();
 }
 
-/// The parser calls itself for each bracket and takes a time that grows with the square of a key's length.
+/// The parser calls itself for each bracket, takes a time that grows with the square of a key's length, and reads
+/// outside its text to tell where it is no UTF-8.
 void check_bounds(const std::string& path, const std::string& content) {
   if (content.size() > kMaxSize)
     throw SettingError(path + ": is longer than " + std::to_string(kMaxSize) + " bytes");
   const auto brackets = std::count_if(content.begin(), content.end(), [](char c) { return c == '[' || c == '{'; });
   if (brackets > kMaxBrackets)
     throw SettingError(path + ": has more than " + std::to_string(kMaxBrackets) + " brackets");
+  const std::size_t good = utf8_length(content);
+  if (good == content.size()) return;
+  const auto line = 1 + std::count(content.begin(), content.begin() + static_cast<std::ptrdiff_t>(good), '\n');
+  throw SettingError(path + ":" + std::to_string(line) + ": is no UTF-8 text");
 }
 
 }  // namespace

@@ -136,7 +136,9 @@ TEST(Lock, Failures_are_named_and_a_set_that_goes_is_made_again) {
     state.sem_perm.mode = mode;
     if (mode == 0664 && geteuid() == 0) state.sem_perm.uid = 65534;
     semctl(set, 0, IPC_SET, &state);
-    if (mode == 0666 || geteuid() == 0) EXPECT_EQ(take(path, 'y'), "16 DAE_EM_EXCLFOREIGN");
+    if (mode == 0666 || geteuid() == 0) {
+      EXPECT_EQ(take(path, 'y'), "16 DAE_EM_EXCLFOREIGN");
+    }
     semctl(set, 0, IPC_RMID);
   }
   unlink(path);

@@ -40,6 +40,7 @@ TEST(DefinitionFile, Mistakes_AreToldWithTheirLine) {
       {"queue-key = 5", "x.toml:3: queue-key: is for transport = \"queue\" only"},
       {"normal-signal = \"SIGUSR1\"", "x.toml:3: normal-signal: is for transport = \"signals\" only"},
       {"transport = \"signals\"\nforced-signal = \"SIGRTMIN\"", "x.toml:4: forced-signal: must be the name"},
+      {"group = '\xff'", "x.toml:3: is no UTF-8 text"},
       {"environment = { \"A B\" = \"x\" }", "x.toml:3: environment: names are made of letters"},
       {"pass-environment = [\"KPL_SUBSYSTEM\"]", "pass-environment: 'KPL_SUBSYSTEM' is set by kplmstr"},
       {"ping-limit = 1", "x.toml:3: ping-limit: needs a 'ping-interval' too"},
