@@ -1,20 +1,16 @@
-// Tells a service manager how the daemon is, in the datagrams of sd_notify(3).
+// Tells a service manager how the daemon is, through libsystemd where it is: nothing depends on its being there.
 #pragma once
 
 #include <chrono>
 #include <optional>
 #include <string>
 
-#include "common/descriptor.h"
-
 namespace platform {
 
-/// Where there is no service manager, or it does not listen, nothing happens. One that is too busy to listen holds
-/// up nothing but start, reload and stop, and these for a second at most.
+/// Where there is no service manager, no libsystemd, or nobody that listens, nothing happens. The manager's variables
+/// stay in the environment: whoever starts processes gives them one of their own.
 class ServiceManager {
  public:
-  /// Takes what the manager has put into the environment out of it: processes that this one starts shall not speak
-  /// for it. Before there are other threads.
   ServiceManager();
 
   /// `status` is for people.
@@ -26,13 +22,14 @@ class ServiceManager {
   /// How often `alive` is to be told so that the manager does not take the daemon for hung; nothing: it does not
   /// ask.
   std::optional<std::chrono::milliseconds> alive_every() const { return alive_every_; }
-  void alive() const;
+  void alive() const { tell("WATCHDOG=1"); }
 
  private:
-  void tell(const std::string& what, int flags = 0) const;
+  using Notify = int (*)(int unset_environment, const char* state);
 
-  std::string address_;  // as in sun_path; empty: none
-  Descriptor socket_;
+  void tell(const std::string& what) const;
+
+  Notify notify_ = nullptr;  // null: there is nobody to tell
   std::optional<std::chrono::milliseconds> alive_every_;
 };
 
