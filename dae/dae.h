@@ -86,7 +86,7 @@ enum {
   DAE_E_NOPSALLOC = 12,  ///< policy not available: "DAE_EM_NOPSALLOC"
   DAE_E_AINVALID = 13,   ///< no such policy: "DAE_EM_AINVALID"
   DAE_E_EXCLINVALID = 15,  ///< null path or zero id: "DAE_EM_EXCLINVALID"
-  DAE_E_EXCLFAILED = 16,   ///< the lock's key or semaphore failed: CALL, or "DAE_EM_EXCLFOREIGN": others can change it
+  DAE_E_EXCLFAILED = 16,   ///< the lock's key or semaphore failed: CALL, or "DAE_EM_EXCLFOREIGN"
   DAE_E_EXCLBUSY = 17      ///< another instance runs: "DAE_EM_EXCLBUSY"
 };
 

@@ -5,8 +5,9 @@
 // descriptor 0, or a System V message queue. A request is a `kplreq`: on the socket the bytes from `kplreq.kplhdr`
 // on (156 of them, then extra data), on the queue the type word first. Whoever asks, the master itself or a
 // command for which it forwards, waits on a local datagram socket and names it in the header as the return
-// address. The subsystem answers straight to that address, with any number of interim packets and one last one. The
-// master keeps the address until the subsystem has answered or ended, so that nobody else gets what comes late.
+// address. The subsystem answers straight to that address, with any number of interim packets and one last one.
+// The master keeps the address until the subsystem has answered or ended, so that nobody else gets what comes
+// late.
 //
 // The return address (`kplhdr.retaddr`) is a local-socket address that needs no length beside it:
 //   - `sun_family` is AF_UNIX; any other value means that no answer is wanted;
@@ -167,7 +168,8 @@ KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int co
 /// one served. `subsystem` names a subsystem; when null or "", the one whose process is `pid`.
 ///
 /// A query is a run of calls: `*cont` is KPL_CONT_FIRST at its first, and each call fills `reply` (a `statrep` of
-/// at most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and sets
+/// at most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and
+/// sets
 /// `*cont` to KPL_CONT_END with the last records, to KPL_CONT_STATUS before. The first call asks and waits for the
 /// whole answer, 5 seconds in all; the others only hand out what came, and free it with the last.
 ///
