@@ -30,8 +30,8 @@ namespace {
 
 constinit Descriptor* first_descriptor GS_GUARDED_BY(process_mutex) = nullptr;
 
-void hold() GS_ANNOTATION(no_thread_safety_analysis) { process_mutex.lock(); }
-void release() GS_ANNOTATION(no_thread_safety_analysis) { process_mutex.unlock(); }
+void hold() ZN_ANNOTATION(no_thread_safety_analysis) { process_mutex.lock(); }
+void release() ZN_ANNOTATION(no_thread_safety_analysis) { process_mutex.unlock(); }
 
 int above_standard(int fd) {
   if (fd < 0 || fd > STDERR_FILENO) return fd;
@@ -45,7 +45,7 @@ int above_standard(int fd) {
 }  // namespace
 
 /// Runs in the child, whose only thread holds the mutex.
-void let_go_in_child() GS_ANNOTATION(no_thread_safety_analysis) {
+void let_go_in_child() ZN_ANNOTATION(no_thread_safety_analysis) {
   generation.fetch_add(1, std::memory_order_relaxed);
   while (Descriptor* descriptor = first_descriptor) {
     descriptor->silence();
