@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstdlib>
 
+#include "fuzz/input.h"
 #include "gs/daemon_memory.h"
 #include "gs/made_up_request.h"
 #include "gs/wire_samples.h"
@@ -17,29 +18,6 @@ void require(bool condition, const char* what) {
   fprintf(stderr, "the well-behaved client: %s\n", what);
   abort();
 }
-
-/// The input, byte by byte; zeros once it is used up.
-class Input {
- public:
-  Input(const std::uint8_t* data, std::size_t size) : left_(data, size) {}
-  bool empty() const { return left_.empty(); }
-  std::uint8_t byte() {
-    if (left_.empty()) return 0;
-    const std::uint8_t value = left_.front();
-    left_ = left_.subspan(1);
-    return value;
-  }
-  std::uint16_t word() { return static_cast<std::uint16_t>(byte() | byte() << 8); }
-  wire::Packet bytes(std::size_t count) {
-    count = std::min(count, left_.size());
-    const auto taken = std::as_bytes(left_.first(count));
-    left_ = left_.subspan(count);
-    return {taken.begin(), taken.end()};
-  }
-
- private:
-  std::span<const std::uint8_t> left_;
-};
 
 class Run {
  public:
@@ -103,11 +81,7 @@ class Run {
     static const auto kMessages = wire::samples::client_messages();
     const ConnectionId to = some();
     auto packets = wire::packets_of(kMessages[input_.byte() % kMessages.size()]);
-    for (int flips = input_.byte() % 4; flips > 0; --flips) {
-      wire::Packet& packet = packets[0];
-      packet[input_.word() % packet.size()] ^= std::byte{input_.byte()};
-    }
-    if (input_.byte() % 8 == 1) packets[0].resize(input_.word() % packets[0].size());
+    fuzz::damage(input_, packets);
     for (const wire::Packet& packet : packets) daemon_.layer.received(to, packet);
   }
 
@@ -116,16 +90,9 @@ class Run {
     daemon_.layer.received(to, input_.bytes(input_.byte()));
   }
 
-  /// A header that is right, or nearly, around any payload.
   void framed_payload() {
     const ConnectionId to = some();
-    const auto payload = input_.bytes(input_.byte());
-    auto packet = wire::packets_of(wire::ClientMessage(wire::Quit{}))[0];
-    packet.resize(wire::kHeaderSize);
-    const std::uint32_t length = static_cast<std::uint32_t>(payload.size()) + (input_.byte() == 1 ? 1 : 0);
-    std::memcpy(packet.data() + 12, &length, sizeof length);
-    packet.insert(packet.end(), payload.begin(), payload.end());
-    daemon_.layer.received(to, packet);
+    daemon_.layer.received(to, fuzz::framed_payload(input_));
   }
 
   void change_wire() {
@@ -140,8 +107,8 @@ class Run {
     daemon_.say(to, wire::Call{made_up_.request()});
   }
 
-  Input input_;
-  test::MadeUp<Input> made_up_{input_};
+  fuzz::Input input_;
+  test::MadeUp<fuzz::Input> made_up_{input_};
   static ClientLimits limits() {
     ClientLimits limits;
     limits.user_queue_bound = 2 * kQueueBound;

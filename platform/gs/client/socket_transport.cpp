@@ -163,6 +163,7 @@ std::optional<Incoming> SocketTransport::accept(wire::ServerMessage message) {
   if (const auto* ping = std::get_if<wire::Ping>(&message)) {
     return Incoming{Incoming::Kind::kPing, -1, nullptr, ping->number};
   }
+  if (!std::holds_alternative<wire::Farewell>(message)) return malformed();
   lose("farewell", ECONNRESET, "the daemon stops");
   return Incoming{Incoming::Kind::kGone, -1, nullptr, 0};
 }
