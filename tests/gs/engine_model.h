@@ -24,6 +24,7 @@ struct ProviderView {
   wyx_vote_value_t default_vote = WYX_NULL_VOTE;  // that it gave in the running protocol
   std::uint64_t seqnum = 0;                       // of the last event it saw; 0: none
   std::map<wyx_request_t, int> pending;           // answered WYX_OK and not ended
+  std::map<ProviderId, std::uint32_t> unheard;    // announcements' summaries, by whom they are about
 };
 
 struct SubscriberView {
@@ -108,7 +109,7 @@ class Model {
   void accept(const Endpoint& from, const JoinRequest& r) {
     if (providers_.contains(from) || subscribers_.contains(from)) error(from, "joins with a token that is in use");
     const ProviderId id{r.instance, static_cast<std::int16_t>(from.session.node)};
-    providers_[from] = {r.attributes.group_name, id, r.attributes, {}, false, false, WYX_NULL_VOTE, 0, {}};
+    providers_[from] = {r.attributes.group_name, id, r.attributes, {}, false, false, WYX_NULL_VOTE, 0, {}, {}};
   }
   template <typename Proposal>
   void accept(const Endpoint&, const Proposal&) {}
@@ -169,12 +170,19 @@ class Model {
       if (session.node == event.node) lose(session, event.leave_code);
   }
   void before(const HostCameEvent& event, const Outcome&) { gone_hosts_.erase(event.node); }
-  void before(const ResponsivenessEvent& event, const Outcome&) { announced_ = event.session; }
+  void before(const ResponsivenessEvent& event, const Outcome&) {
+    const std::uint32_t summary = event.responding ? WYX_RESPONSIVENESS_RESPONSE : WYX_RESPONSIVENESS_NO_RESPONSE;
+    for (const auto& [endpoint, about] : providers_) {
+      if (endpoint.session != event.session || !about.joined) continue;
+      for (auto& [to, view] : providers_)
+        if (view.joined && view.group == about.group) view.unheard[about.id] = summary;
+    }
+  }
   void before(const ContinueEvent&, const Outcome&) {}
   void before(const TimerExpiredEvent& event, const Outcome& outcome) {
     const std::string& name = event.timer.group;
-    const bool awaited = groups_.contains(name) && groups_[name].timer == event.timer && !groups_[name].unfinished;
-    if (awaited == outcome.deliveries.empty())
+    const bool awaited = groups_.contains(name) && groups_[name].timer == event.timer;
+    if ((awaited && !groups_[name].unfinished) == outcome.deliveries.empty())
       errors_ += name + (awaited ? ": the end of its time is ignored\n" : ": obeys a timer that is over\n");
     for (auto& [endpoint, view] : providers_)
       if (awaited && view.group == name && view.asked) cast_default(view, WYX_TIME_LIMIT_EXCEEDED);
@@ -337,7 +345,8 @@ class Model {
     if (*p.current_state != group.value) complain(name, n, "has another state value than the group");
     if (approved && p.new_attributes) group.attributes = *p.new_attributes;
 
-    if (p.leave_codes != group.leave_codes) complain(name, n, "has other leave codes");
+    if ((p.leave_codes ? *p.leave_codes : std::vector<LeaveCode>()) != group.leave_codes)
+      complain(name, n, "has other leave codes");
     if (n.type != WYX_N_PHASE_NOTIFICATION && p.changing_providers) change_membership(group, n);
     if (*p.current_providers != group.members)
       complain(name, n, "has other members than the last one and the change");
@@ -398,11 +407,13 @@ class Model {
       providers_.erase(it);
       return;
     }
-    for (ProviderId id : *n.providers)
-      if (std::ranges::none_of(providers_, [&](const auto& p) {
-            return p.first.session == announced_ && p.second.id == id && p.second.group == it->second.group;
-          }))
+    for (ProviderId id : *n.providers) {
+      const auto unheard = it->second.unheard.find(id);
+      if (unheard == it->second.unheard.end() || std::ranges::count(groups_[it->second.group].members, id) == 0)
         error(to, "hears of a client that is not in its group");
+      else if (unheard->second == n.summary)
+        it->second.unheard.erase(unheard);
+    }
   }
 
   void receive(const Endpoint& to, const DelayedErrorNotification& n) {
@@ -433,7 +444,8 @@ class Model {
     } else if (n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) {
       for (ProviderId id : *n.changing_membership) view.members.erase(id);
     }
-    if ((n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) && n.leave_codes.size() != n.changing_membership->size())
+    if ((n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) &&
+        (!n.leave_codes || n.leave_codes->size() != n.changing_membership->size()))
       error(to, "misses leave codes");
   }
 
@@ -470,6 +482,7 @@ class Model {
       if (at_rest && owed(view)) error(endpoint, "has a request that was answered WYX_OK and never ended");
       if (!view.joined) continue;
       alive.insert(view.id);
+      if (at_rest && !view.unheard.empty()) error(endpoint, "was not told of a client that does not respond");
       if (at_rest && view.seqnum != status.seqnum) error(endpoint, "has not seen the group's last event");
     }
     if (status.members.empty()) group.members.clear();  // nobody was left to be told
@@ -503,7 +516,6 @@ class Model {
   std::set<std::uint32_t> gone_hosts_;
   std::optional<DelayedErrorNotification> refused_;  // must come in this step, to refused_to_
   Endpoint refused_to_;
-  SessionId announced_;
 };
 
 }  // namespace gs::test

@@ -104,7 +104,7 @@ TEST_F(EngineProtocols, Vote_results_of_many_large_values_are_bounded_and_hold_e
   const Bytes value(kMaxStateValue, 'v');
   for (std::size_t who = 1; who <= kVoters; ++who) vote(static_cast<int>(who), WYX_VOTE_APPROVE, value, value);
   const auto& approved = std::get<ProtocolNotification>(*last.deliveries.at(0).what);
-  const std::vector<VoteResult>& results = approved.proposal.current_vote_results;
+  const std::vector<VoteResult>& results = *approved.proposal.current_vote_results;
   EXPECT_EQ(results.size(), kVoters);
   std::size_t bytes = 0;
   for (const VoteResult& r : results)
@@ -145,6 +145,21 @@ TEST_F(EngineSlices, Many_failures_of_one_death_are_told_in_parts_and_others_are
   EXPECT_GE(parts, told / (kSlice + kMembers));
   EXPECT_EQ(engine.status().size(), before - 50);
   EXPECT_EQ(request(2, StateChangeRequest{1, kOnePhase, "x"}), WYX_OK);
+}
+
+TEST_F(EngineSlices, Silence_in_many_groups_is_told_in_parts_and_changes_that_undo_each_other_are_left_out) {
+  constexpr std::size_t kGroups = 50;
+  for (std::int16_t i = 0; i < static_cast<int>(kGroups); ++i)
+    for (const int who : {1, 2, 3, 4})
+      ASSERT_EQ(request(who, provider(i, static_cast<std::int16_t>(who), "g" + std::to_string(i))), WYX_OK);
+  std::size_t told = 0;
+  for (int i = 0; i < 9; ++i, told += last.deliveries.size()) apply(ResponsivenessEvent{session(1), i % 2 == 1});
+  for (; engine.busy(); told += last.deliveries.size()) {
+    EXPECT_LE(last.deliveries.size(), kSlice + 4);
+    apply(ContinueEvent{});
+  }
+  EXPECT_LE(told, 9 * (kSlice + 4) + 2 * 4 * kGroups);
+  EXPECT_EQ(request(1, StateChangeRequest{0, kOnePhase, "x"}), WYX_OK);
 }
 
 class EngineLongestPhase : public Script {

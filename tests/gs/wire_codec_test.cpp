@@ -111,14 +111,17 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
       [](N& n) { n.protocol = static_cast<wyx_request_t>(12); },
       [](N& n) { n.summary = 0x80000; },
       [](N& n) { n.proposal.whats_changed = 0x40000; },
-      [](N& n) { n.proposal.leave_codes.push_back({}); },
+      [](N& n) { n.proposal.leave_codes = samples::list(std::vector<LeaveCode>(2)); },
       [](N& n) { n.proposal.changing_providers = nullptr; },
       [](N& n) { n.protocol = WYX_SUBSCRIPTION; },
       [](N& n) { n.proposal.phase = 0; },
       [](N& n) { n.proposal.current_providers = nullptr; },
       [](N& n) { n.proposal.expel_info.reset(); },
       [](N& n) { n.proposal.whats_changed |= WYX_MERGE_GROUP_INFO; },
-      [](N& n) { n.proposal.current_vote_results[0].vote = static_cast<wyx_vote_value_t>(128); }};
+      [](N& n) {
+        n.proposal.current_vote_results =
+            samples::list<VoteResult>({{{1, 2}, static_cast<wyx_vote_value_t>(128)}});
+      }};
   std::vector<Notification> bad = {
       DelayedErrorNotification{WYX_JOIN, static_cast<wyx_rc_t>(38), JoinRequest{}, nullptr},
       DelayedErrorNotification{WYX_JOIN, WYX_COLLIDE, VoteRequest{}, nullptr},
@@ -140,7 +143,8 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
   N huge = samples::full_protocol();
   const auto value = std::make_shared<const Bytes>(kMaxStateValue, 'v');
   const VoteResult large{{1, 1}, WYX_VOTE_APPROVE, 0, 0, value, value};
-  huge.proposal.current_vote_results.assign(kMaxServerMessage / (2 * kMaxStateValue), large);
+  huge.proposal.current_vote_results =
+      samples::list(std::vector<VoteResult>(kMaxServerMessage / (2 * kMaxStateValue), large));
   EXPECT_FALSE(encode(ServerMessage(Notify{1, std::make_shared<const Notification>(huge)})));
 }
 

@@ -53,6 +53,10 @@ inline std::vector<ClientMessage> client_messages() {
 inline SharedMembership members(std::initializer_list<ProviderId> ids) {
   return std::make_shared<const Membership>(ids);
 }
+template <typename T>
+std::shared_ptr<const std::vector<T>> list(std::vector<T> values) {
+  return std::make_shared<const std::vector<T>>(std::move(values));
+}
 inline SharedBytes bytes(Bytes value) { return std::make_shared<const Bytes>(std::move(value)); }
 
 /// `state_size`: bytes of each state value, so that a message of many packets can be had.
@@ -70,15 +74,16 @@ inline ProtocolNotification full_protocol(std::size_t state_size = 5) {
   p.whats_changed = WYX_EXPEL_INFORMATION | WYX_CURRENT_STATE_VALUE;
   p.current_providers = members({{1, 2}, {3, 4}});
   p.changing_providers = members({{3, 4}});
-  p.leave_codes = {{WYX_PROVIDER_EXPELLED, 17}};
+  p.leave_codes = list<LeaveCode>({{WYX_PROVIDER_EXPELLED, 17}});
   p.expel_info = ExpelInfo{4, "flag"};
   p.current_state = bytes(Bytes(state_size, 's'));
   p.proposed_state = bytes(Bytes(state_size, 't'));
   p.message = bytes("message");
   p.new_attributes = std::make_shared<const GroupAttributes>(attributes());
-  p.current_vote_results = {{{1, 2}, WYX_VOTE_APPROVE, WYX_EXPLICIT_APPROVE, 0, bytes("x"), nullptr},
-                            {{3, 4}, WYX_VOTE_REJECT, WYX_PROVIDER_FAILED, WYX_HOST_FAILURE, nullptr, bytes("")}};
-  p.changing_vote_results = {{{5, 6}, WYX_VOTE_CONTINUE, 0, 0, nullptr, nullptr}};
+  p.current_vote_results =
+      list<VoteResult>({{{1, 2}, WYX_VOTE_APPROVE, WYX_EXPLICIT_APPROVE, 0, bytes("x"), nullptr},
+                        {{3, 4}, WYX_VOTE_REJECT, WYX_PROVIDER_FAILED, WYX_HOST_FAILURE, nullptr, bytes("")}});
+  p.changing_vote_results = list<VoteResult>({{{5, 6}, WYX_VOTE_CONTINUE, 0, 0, nullptr, nullptr}});
   return n;
 }
 
@@ -96,11 +101,8 @@ inline std::vector<Notification> notifications() {
       plain_protocol(),
       AnnouncementNotification{WYX_RESPONSIVENESS_NO_RESPONSE, members({{8, 9}})},
       AnnouncementNotification{WYX_GROUP_DISSOLVED, nullptr},
-      SubscriptionNotification{WYX_SUBSCRIPTION_STATE | WYX_SUBSCRIPTION_DELTA_LEAVE,
-                               bytes("state"),
-                               members({{1, 1}}),
-                               members({{2, 2}}),
-                               {{WYX_PROVIDER_FAILURE, 3}},
+      SubscriptionNotification{WYX_SUBSCRIPTION_STATE | WYX_SUBSCRIPTION_DELTA_LEAVE, bytes("state"),
+                               members({{1, 1}}), members({{2, 2}}), list<LeaveCode>({{WYX_PROVIDER_FAILURE, 3}}),
                                44},
       SubscriptionNotification{WYX_SUBSCRIPTION_MEMBERSHIP, bytes(""), members({}), nullptr, {}, 45}};
   for (const Request& request : requests()) {

@@ -103,13 +103,18 @@ auto shared(const Record* record) {
   using Value = decltype(value(*record));
   return record ? std::make_shared<const Value>(value(*record)) : nullptr;
 }
-inline std::vector<gs::LeaveCode> value(const wyx_leave_code_entry_t* codes, std::size_t count) {
+/// Null for an empty list, as the engine has it.
+template <typename T>
+std::shared_ptr<const std::vector<T>> list(std::vector<T> all) {
+  return all.empty() ? nullptr : std::make_shared<const std::vector<T>>(std::move(all));
+}
+inline gs::SharedLeaveCodes value(const wyx_leave_code_entry_t* codes, std::size_t count) {
   std::vector<gs::LeaveCode> all;
   for (std::size_t i = 0; codes != nullptr && i < count; ++i)
     all.push_back({codes[i].gs_voluntary_or_failure, codes[i].gs_voluntary_leave_code});
-  return all;
+  return list(std::move(all));
 }
-inline std::vector<gs::VoteResult> value(const wyx_vote_results_t* results) {
+inline gs::SharedVoteResults value(const wyx_vote_results_t* results) {
   std::vector<gs::VoteResult> all;
   for (unsigned i = 0; results != nullptr && i < results->gs_count; ++i) {
     const wyx_vote_result_t& r = *results->gs_vote_results[i];
@@ -117,7 +122,7 @@ inline std::vector<gs::VoteResult> value(const wyx_vote_results_t* results) {
                    static_cast<std::uint32_t>(r.gs_leave_code), shared(r.gs_proposed_state_value),
                    shared(r.gs_provider_message)});
   }
-  return all;
+  return list(std::move(all));
 }
 inline gs::Proposal value(const wyx_proposal_t& p) {
   gs::Proposal proposal;

@@ -86,8 +86,8 @@ wyx_proposal_t* Records::proposal(const Proposal& p) {
   proposal_.gs_whats_changed = static_cast<wyx_whats_changed_t>(p.whats_changed);
   proposal_.gs_current_providers = fill(current_, p.current_providers);
   proposal_.gs_changing_providers = fill(changing_, p.changing_providers);
-  if (!p.leave_codes.empty()) {
-    leave_info_ = {static_cast<unsigned>(p.leave_codes.size()), leave_codes(p.leave_codes)};
+  if (p.leave_codes) {
+    leave_info_ = {static_cast<unsigned>(p.leave_codes->size()), leave_codes(p.leave_codes)};
     proposal_.gs_leave_info = &leave_info_;
   }
   if (p.expel_info) {
@@ -106,10 +106,10 @@ wyx_proposal_t* Records::proposal(const Proposal& p) {
   return &proposal_;
 }
 
-wyx_leave_code_entry_t* Records::leave_codes(const std::vector<LeaveCode>& codes) {
-  if (codes.empty()) return nullptr;
+wyx_leave_code_entry_t* Records::leave_codes(const SharedLeaveCodes& codes) {
+  if (!codes) return nullptr;
   leave_codes_.clear();
-  for (const LeaveCode& code : codes) leave_codes_.push_back({code.voluntary_or_failure, code.voluntary_code});
+  for (const LeaveCode& code : *codes) leave_codes_.push_back({code.voluntary_or_failure, code.voluntary_code});
   return leave_codes_.data();
 }
 
@@ -218,15 +218,15 @@ wyx_group_attributes_t* Records::fill(wyx_group_attributes_t& record, const Grou
   return &record;
 }
 
-wyx_vote_results_t* Records::fill(VoteResults& storage, const std::vector<VoteResult>& votes) {
-  if (votes.empty()) return nullptr;
+wyx_vote_results_t* Records::fill(VoteResults& storage, const SharedVoteResults& votes) {
+  if (!votes) return nullptr;
   // Sized once: the records point at one another.
-  storage.results.assign(votes.size(), {});
-  storage.states.assign(votes.size(), {});
-  storage.messages.assign(votes.size(), {});
+  storage.results.assign(votes->size(), {});
+  storage.states.assign(votes->size(), {});
+  storage.messages.assign(votes->size(), {});
   storage.pointers.clear();
-  for (std::size_t i = 0; i < votes.size(); ++i) {
-    const VoteResult& vote = votes[i];
+  for (std::size_t i = 0; i < votes->size(); ++i) {
+    const VoteResult& vote = (*votes)[i];
     wyx_vote_result_t& result = storage.results[i];
     result.gs_voter = to_record(vote.voter);
     result.gs_vote_value = vote.vote;
@@ -242,7 +242,7 @@ wyx_vote_results_t* Records::fill(VoteResults& storage, const std::vector<VoteRe
     }
     storage.pointers.push_back(&result);
   }
-  storage.record = {static_cast<unsigned>(votes.size()), storage.pointers.data()};
+  storage.record = {static_cast<unsigned>(votes->size()), storage.pointers.data()};
   return &storage.record;
 }
 

@@ -43,14 +43,14 @@ class Records {
   };
 
   wyx_proposal_t* proposal(const Proposal& p);
-  wyx_leave_code_entry_t* leave_codes(const std::vector<LeaveCode>& codes);
+  wyx_leave_code_entry_t* leave_codes(const SharedLeaveCodes& codes);
   wyx_proposal_info_t* failing_request(const Request& request, const Client& client);
 
   static wyx_membership_t* fill(ProviderArray& storage, const Membership& members);
   static wyx_membership_t* fill(ProviderArray& storage, const SharedMembership& members);
   static wyx_state_value_t* fill(wyx_state_value_t& record, const SharedBytes& bytes);
   static wyx_group_attributes_t* fill(wyx_group_attributes_t& record, const GroupAttributes& attributes);
-  static wyx_vote_results_t* fill(VoteResults& storage, const std::vector<VoteResult>& votes);
+  static wyx_vote_results_t* fill(VoteResults& storage, const SharedVoteResults& votes);
 
   std::shared_ptr<const Notification> source_;
   const Proposal* built_ = nullptr;  // of source_: proposal_ was built from it

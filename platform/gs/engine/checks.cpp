@@ -106,5 +106,6 @@ std::size_t room_for(const VoteRequest& request) {
   return (request.proposed_state ? request.proposed_state->size() : 0) +
          (request.message ? request.message->size() : 0);
 }
+std::size_t room_for(const SubscribeRequest&) { return 512; }  // with its place in every table
 
 }  // namespace gs

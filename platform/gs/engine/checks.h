@@ -25,5 +25,6 @@ std::size_t room_for(const StateChangeRequest& request);
 std::size_t room_for(const MessageRequest& request);
 std::size_t room_for(const ExpelRequest& request);
 std::size_t room_for(const VoteRequest& request);
+std::size_t room_for(const SubscribeRequest& request);
 
 }  // namespace gs

@@ -169,7 +169,9 @@ wyx_rc_t Engine::State::check(const Payer& from, const SubscribeRequest& request
   const Group* group = find_group(request.group_name);
   const bool waits = request.control & WYX_SUBSCRIBE_PERSISTENCE;
   if (!waits && !(group && group->born())) return WYX_UNKNOWN_GROUP;
-  return check_new_client(from);
+  if (subscribers.count(request.group_name) >= kMaxSubscribers) return WYX_NO_MEMORY;
+  if (wyx_rc_t rc = check_new_client(from); rc != WYX_OK) return rc;
+  return check_room(from, request);
 }
 
 wyx_rc_t Engine::State::check(const Payer& from, const UnsubscribeRequest& request) const {
@@ -231,10 +233,11 @@ void Engine::State::perform(const Payer& from, const VoteRequest& request, Outco
 }
 
 void Engine::State::perform(const Payer& from, const SubscribeRequest& request, Outcome& out) {
-  const Subscriber subscriber{{from.session, request.token}, request.control};
-  clients.add(subscriber.to, {request.group_name, nullptr, subscribers.add(request.group_name, subscriber)});
+  const Endpoint to{from.session, request.token};
+  Subscriber subscriber{to, request.control, Ledger::Charge(ledger, from, room_for(request))};
+  clients.add(to, {request.group_name, nullptr, subscribers.add(request.group_name, std::move(subscriber))});
   const Group* group = find_group(request.group_name);
-  if (group && group->born()) SubscriberTable::greet(subscriber, group->view(), out.deliveries);
+  if (group && group->born()) SubscriberTable::greet(to, request.control, group->view(), out.deliveries);
 }
 
 void Engine::State::perform(const Payer& from, const UnsubscribeRequest& request, Outcome&) {
@@ -279,9 +282,12 @@ void Engine::State::apply(const ResponsivenessEvent& event, Outcome& out) {
     if (client.provider && client.provider->stage == Member::Stage::kJoined)
       concerned[client.group].push_back(client.provider->id);
   }
-  Surroundings env = surroundings(out);
   const std::uint32_t summary = event.responding ? WYX_RESPONSIVENESS_RESPONSE : WYX_RESPONSIVENESS_NO_RESPONSE;
-  for (const auto& [name, ids] : concerned) groups.at(name).announce(summary, ids, env);
+  for (auto& [name, ids] : concerned) {
+    groups.at(name).announce({event.session, summary, std::make_shared<const Membership>(std::move(ids))});
+    stand_in_line(name);
+  }
+  go_on(out);
 }
 
 void Engine::State::apply(const ContinueEvent&, Outcome& out) { go_on(out); }

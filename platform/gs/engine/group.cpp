@@ -109,11 +109,16 @@ void Group::lose(const MemberPtr& member, std::uint32_t leave_code) {
     failures_.push_back(member);
 }
 
-void Group::announce(std::uint32_t summary, const Membership& about, Surroundings& env) const {
-  AnnouncementNotification announcement{summary, std::make_shared<const Membership>(about)};
-  auto note = std::make_shared<const Notification>(std::move(announcement));
-  for (const MemberPtr& m : members_)
-    if (!m->gone()) env.deliveries.push_back({m->to, note});
+/// Of a client that changes faster than it can be told, at most two wait: the last one says how it is now.
+void Group::announce(Announcement announcement) {
+  const auto same_client = [&](const Announcement& a) { return a.about == announcement.about; };
+  const auto last = std::find_if(announcements_.rbegin(), announcements_.rend(), same_client);
+  if (last == announcements_.rend()) return announcements_.push_back(std::move(announcement));
+  if (last->summary == announcement.summary) return;
+  if (std::any_of(std::next(last), announcements_.rend(), same_client))
+    announcements_.erase(std::next(last).base());
+  else
+    announcements_.push_back(std::move(announcement));
 }
 
 // --------------------------------------------------------------------------------------------------- the queue
@@ -122,13 +127,24 @@ void Group::settle(Surroundings& env) {
   while (unfinished() && env.work_left > 0) {
     const std::size_t told = env.deliveries.size();
     const std::size_t looked_at = members_.size() + queue_.size();
-    if (run_)
+    if (!announcements_.empty())
+      send_announcement(env);
+    else if (run_)
       end_phase(env);
     else
       start_next(env);
     const std::size_t work = work_of_looking_at(looked_at) + work_of(std::span(env.deliveries).subspan(told));
     env.work_left -= std::min(work, env.work_left);
   }
+}
+
+void Group::send_announcement(Surroundings& env) {
+  Announcement& next = announcements_.front();
+  const auto note =
+      std::make_shared<const Notification>(AnnouncementNotification{next.summary, std::move(next.ids)});
+  announcements_.pop_front();
+  for (const MemberPtr& m : members_)
+    if (!m->gone()) env.deliveries.push_back({m->to, note});
 }
 
 void Group::start_next(Surroundings& env) {
@@ -186,7 +202,7 @@ void Group::start_leave(Surroundings& env) {
     }
     const LeaveCode code{run.traits->leave_code, leave->leave_code};
     add_changing(run, dequeue(it).who, code);
-    if (!batches(WYX_BATCH_LEAVES)) break;
+    if (!batches(WYX_BATCH_LEAVES) || run.changing.size() == kMaxBatch) break;
   }
   start(std::move(run), env);
 }
@@ -212,7 +228,7 @@ void Group::start_join(Surroundings& env) {
     if (!run) run = new_run(WYX_JOIN, {attributes_->num_phases, attributes_->time_limit}, queued.who->id);
     queued.who->stage = Member::Stage::kJoining;
     add_changing(*run, queued.who, {});
-    if (!batches(WYX_BATCH_JOINS)) break;
+    if (!batches(WYX_BATCH_JOINS) || run->changing.size() == kMaxBatch) break;
   }
   if (run) start(std::move(*run), env);
 }
@@ -227,7 +243,9 @@ Group::Run Group::new_run(wyx_request_t type, const ProtocolTerms& terms, Provid
 
 void Group::add_changing(Run& run, MemberPtr member, LeaveCode code) const {
   run.changing.push_back(std::move(member));
-  if (run.traits->type != WYX_JOIN) run.leave_codes.push_back(code);
+  if (run.traits->type == WYX_JOIN) return;
+  if (!run.leave_codes) run.leave_codes = std::make_shared<std::vector<LeaveCode>>();
+  run.leave_codes->push_back(code);
 }
 
 // ------------------------------------------------------------------------------------------------------- state
@@ -290,6 +308,12 @@ void Group::add_to(Digest& digest) const {
       digest.add(std::get<LeaveRequest>(q.request).leave_code);
     }
   }
+  digest.add(announcements_.size());
+  for (const Announcement& a : announcements_) {
+    digest.add(Endpoint{a.about, -1});
+    digest.add(a.summary);
+    for (const ProviderId id : *a.ids) digest.add(id);
+  }
   digest.add(run_.has_value());
   if (run_) add_to(digest, *run_);
 }
@@ -301,9 +325,9 @@ void Group::add_to(Digest& digest, const Run& run) {
   digest.add(run.phase);
   digest.add(run.proposed_by);
   add_members(digest, run.changing);
-  for (const LeaveCode& code : run.leave_codes) {
-    digest.add(code.voluntary_or_failure);
-    digest.add(code.voluntary_code);
+  for (std::size_t i = 0; run.leave_codes && i < run.leave_codes->size(); ++i) {
+    digest.add((*run.leave_codes)[i].voluntary_or_failure);
+    digest.add((*run.leave_codes)[i].voluntary_code);
   }
   digest.add(run.expel_info ? run.expel_info->deactivate_phase : -1);
   digest.add(run.expel_info ? run.expel_info->flag : Bytes());

@@ -36,6 +36,13 @@ struct Surroundings {
 Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
                        std::shared_ptr<const GroupAttributes> group_attributes = nullptr);
 
+/// A client does not respond, or does again: to be told to all members.
+struct Announcement {
+  SessionId about;
+  std::uint32_t summary = 0;  // flags of wyx_summary_code_t
+  SharedMembership ids;       // its providers in the group
+};
+
 /// Lives from the first join's request until it has neither members nor work. Members that have died or said
 /// goodbye stay in the membership until their failure leave is approved, and are sent nothing.
 ///
@@ -68,18 +75,21 @@ class Group {
   bool awaits(const TimerId& timer) const;
   /// Ignored unless that phase runs and has a time limit.
   void expire(const TimerId& timer);
-  void announce(std::uint32_t summary, const Membership& about, Surroundings& env) const;
+  /// Comes before whatever else the group has left to do, so while those it is about are still members.
+  void announce(Announcement announcement);
 
   /// Runs the protocol and the queue on until they wait for a vote, there is nothing left to do, or the event's
   /// work is used up. A protocol's start, a phase's end with what follows at once, is one step.
   void settle(Surroundings& env);
-  bool unfinished() const { return run_ ? run_->missing == 0 : !failures_.empty() || !queue_.empty(); }
+  bool unfinished() const {
+    return !announcements_.empty() || (run_ ? run_->missing == 0 : !failures_.empty() || !queue_.empty());
+  }
   /// Whether it stands in the engine's line of unfinished groups.
   bool in_line() const { return in_line_; }
   void set_in_line(bool is) { in_line_ = is; }
 
   bool born() const { return !members_.empty(); }
-  bool finished() const { return members_.empty() && !run_ && queue_.empty(); }
+  bool finished() const { return members_.empty() && !run_ && queue_.empty() && announcements_.empty(); }
   const std::string& name() const { return name_; }
   std::shared_ptr<const GroupAttributes> attributes() const { return attributes_; }
   const Membership& member_ids() const { return *member_ids_; }
@@ -107,7 +117,7 @@ class Group {
     ProviderId proposed_by;
     std::vector<MemberPtr> changing;
     SharedMembership changing_ids;
-    std::vector<LeaveCode> leave_codes;
+    std::shared_ptr<std::vector<LeaveCode>> leave_codes;  // null: a join, or no change of members
     std::optional<ExpelInfo> expel_info;
     std::shared_ptr<const GroupAttributes> new_attributes;
     Value proposed_state;
@@ -126,6 +136,7 @@ class Group {
   static void add_to(Digest& digest, const Run& run);
 
   // The queue (group.cpp).
+  void send_announcement(Surroundings& env);
   void start_next(Surroundings& env);
   bool start_failure_leave(Surroundings& env);
   void start_leave(Surroundings& env);
@@ -167,6 +178,7 @@ class Group {
   std::optional<Run> run_;
   std::deque<MemberPtr> failures_;  // gone; those that are no members when their turn comes are passed over
   Queue queue_;                     // joins and leaves
+  std::deque<Announcement> announcements_;  // that wait
   std::uint64_t last_place_ = 0;
   bool in_line_ = false;
 };

@@ -14,6 +14,11 @@ std::uint32_t summary_of(wyx_vote_value_t vote, bool by_default) {
 
 bool is_default(const Ballot& ballot) { return ballot.summary & (WYX_DEFAULT_APPROVE | WYX_DEFAULT_REJECT); }
 
+/// Null: there are none.
+SharedVoteResults as_shared(std::vector<VoteResult> results) {
+  return results.empty() ? nullptr : std::make_shared<const std::vector<VoteResult>>(std::move(results));
+}
+
 std::vector<MemberPtr> joined(const std::vector<MemberPtr>& a, const std::vector<MemberPtr>& b) {
   std::vector<MemberPtr> all = a;
   all.insert(all.end(), b.begin(), b.end());
@@ -293,6 +298,7 @@ ProtocolNotification Group::compose(const Run& run, wyx_notification_type_t type
 /// Of the phase that has just ended, when the batch control asks for them.
 void Group::add_vote_results(const Run& run, Proposal& proposal) const {
   if (run.collect == 0) return;
+  std::vector<VoteResult> current, changing;
   for (const MemberPtr& m : run.voters) {
     VoteResult result;
     result.voter = m->id;
@@ -301,8 +307,10 @@ void Group::add_vote_results(const Run& run, Proposal& proposal) const {
     result.leave_code = is_default(m->ballot) ? m->gone_code : 0;
     result.proposed_state = m->ballot.proposed_state.bytes;
     result.message = m->ballot.message.bytes;
-    (m->changing ? proposal.changing_vote_results : proposal.current_vote_results).push_back(std::move(result));
+    (m->changing ? changing : current).push_back(std::move(result));
   }
+  proposal.current_vote_results = as_shared(std::move(current));
+  proposal.changing_vote_results = as_shared(std::move(changing));
 }
 
 /// One notification for all, but for those who read their own id as the proposer's.

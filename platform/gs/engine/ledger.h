@@ -1,4 +1,4 @@
-// Who pays for what the engine keeps: providers, state values, proposals, the values of votes.
+// Who pays for what the engine keeps: providers, subscribers, state values, proposals, the values of votes.
 //
 // Each is charged to the session that brought it and to that session's user, from the request on until the engine
 // lets go of it. So a program can only use up its own room, whatever the groups are that it shares with others.

@@ -60,8 +60,8 @@ GroupView as_first(const GroupView& view) {
 
 }  // namespace
 
-std::uint64_t SubscriberTable::add(const std::string& group, const Subscriber& subscriber) {
-  groups_[group].emplace(++last_subscription_, subscriber);
+std::uint64_t SubscriberTable::add(const std::string& group, Subscriber subscriber) {
+  groups_[group].emplace(++last_subscription_, std::move(subscriber));
   return last_subscription_;
 }
 
@@ -76,9 +76,10 @@ std::size_t SubscriberTable::count(const std::string& group) const {
   return it == groups_.end() ? 0 : it->second.size();
 }
 
-void SubscriberTable::greet(const Subscriber& subscriber, const GroupView& view, std::vector<Delivery>& out) {
-  auto note = std::make_shared<Notification>(compose(first_type(subscriber.control), as_first(view)));
-  out.push_back({subscriber.to, std::move(note)});
+void SubscriberTable::greet(const Endpoint& to, std::uint32_t control, const GroupView& view,
+                            std::vector<Delivery>& out) {
+  auto note = std::make_shared<Notification>(compose(first_type(control), as_first(view)));
+  out.push_back({to, std::move(note)});
 }
 
 void SubscriberTable::born(const std::string& group, const GroupView& view, std::vector<Delivery>& out) const {

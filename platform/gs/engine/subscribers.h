@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "engine/digest.h"
+#include "engine/ledger.h"
 #include "engine/types.h"
 
 namespace gs {
@@ -14,6 +15,7 @@ namespace gs {
 struct Subscriber {
   Endpoint to;
   std::uint32_t control = 0;  // flags of wyx_subscription_ctrl_t
+  Ledger::Charge charge;      // for its being there
 };
 
 /// A group as a subscriber can see it, and what the event `seqnum` has changed in it.
@@ -21,9 +23,9 @@ struct GroupView {
   std::uint64_t seqnum = 0;
   SharedBytes state;
   SharedMembership members;
-  SharedMembership joined;             // null: nobody
-  SharedMembership left;               // null: nobody
-  std::vector<LeaveCode> leave_codes;  // one for each of `left`
+  SharedMembership joined;       // null: nobody
+  SharedMembership left;         // null: nobody
+  SharedLeaveCodes leave_codes;  // one for each of `left`
   bool state_changed = false;
 };
 
@@ -41,13 +43,13 @@ struct GroupView {
 class SubscriberTable {
  public:
   /// Returns the subscription's number, greater than those before it.
-  std::uint64_t add(const std::string& group, const Subscriber& subscriber);
+  std::uint64_t add(const std::string& group, Subscriber subscriber);
   /// It must be one of the group's.
   void remove(const std::string& group, std::uint64_t subscription);
   std::size_t count(const std::string& group) const;
 
   /// The first notification of a group that is there already.
-  static void greet(const Subscriber& subscriber, const GroupView& view, std::vector<Delivery>& out);
+  static void greet(const Endpoint& to, std::uint32_t control, const GroupView& view, std::vector<Delivery>& out);
   /// To all that wait for the group.
   void born(const std::string& group, const GroupView& view, std::vector<Delivery>& out) const;
   void changed(const std::string& group, const GroupView& view, std::vector<Delivery>& out) const;

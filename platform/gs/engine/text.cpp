@@ -81,11 +81,11 @@ const char* vote_name(wyx_vote_value_t vote) {
   return vote >= 0 && vote < std::ssize(kVotes) ? kVotes[vote] : "?";
 }
 
-std::string vote_results_text(const char* title, const std::vector<VoteResult>& results) {
-  if (results.empty()) return "";
+std::string vote_results_text(const char* title, const SharedVoteResults& results) {
+  if (!results) return "";
   std::string all = std::string(", ") + title + "[";
-  for (const VoteResult& r : results) {
-    all += (&r == &results.front() ? "" : "; ") + text(r.voter) + " " + vote_name(r.vote) + " " +
+  for (const VoteResult& r : *results) {
+    all += (&r == &results->front() ? "" : "; ") + text(r.voter) + " " + vote_name(r.vote) + " " +
            summary_text(r.summary);
     if (r.leave_code != 0) all += " " + leave_codes_text({{r.leave_code, 0}});
     if (r.proposed_state) all += " " + quoted(*r.proposed_state);
@@ -106,7 +106,7 @@ std::string body(const ProtocolNotification& n) {
   if (changes != 0) all += " {" + changes_text(changes) + "}";
   all += ", members " + text(p.current_providers);
   if (p.changing_providers) all += ", changing " + text(p.changing_providers);
-  if (!p.leave_codes.empty()) all += leave_codes_text(p.leave_codes);
+  if (p.leave_codes) all += leave_codes_text(*p.leave_codes);
   if (p.expel_info) {
     all += ", deactivate " + std::to_string(p.expel_info->deactivate_phase) + " " + quoted(p.expel_info->flag);
   }
@@ -135,7 +135,7 @@ std::string body(const SubscriptionNotification& n) {
                     "}";
   if (n.full_membership) all += ", members " + text(n.full_membership);
   if (n.changing_membership) all += ", changing " + text(n.changing_membership);
-  if (!n.leave_codes.empty()) all += leave_codes_text(n.leave_codes);
+  if (n.leave_codes) all += leave_codes_text(*n.leave_codes);
   if (n.state) all += ", state " + quoted(*n.state);
   return all + ", #" + std::to_string(n.seqnum);
 }

@@ -24,6 +24,8 @@ inline constexpr std::size_t kMaxExpelFlag = 256;              // bytes
 inline constexpr std::size_t kMaxLocalName = 256;              // characters
 inline constexpr std::size_t kMaxExpelList = 4096;             // providers
 inline constexpr std::size_t kMaxSessionClients = 4096;        // providers and subscribers of one session
+inline constexpr std::size_t kMaxSubscribers = 65'536;         // of one group
+inline constexpr std::size_t kMaxBatch = 512;                  // joins or leaves in one protocol
 inline constexpr std::size_t kMaxCollected = 4 * 1024 * 1024;  // bytes, of all values in one event's vote results
 
 /// Chosen by the client, unique among the live tokens of its session, never negative.
@@ -208,13 +210,17 @@ struct VoteResult {
   SharedBytes message;
 };
 
+using SharedLeaveCodes = std::shared_ptr<const std::vector<LeaveCode>>;
+using SharedVoteResults = std::shared_ptr<const std::vector<VoteResult>>;
+
 struct ExpelInfo {
   std::int32_t deactivate_phase = 0;
   Bytes flag;
   bool operator==(const ExpelInfo&) const = default;
 };
 
-/// An absent part is a null pointer or an empty optional; `whats_changed` has the matching bits.
+/// An absent part is a null pointer or an empty optional; `whats_changed` has the matching bits. Lists are shared:
+/// in a batch each changing provider gets a notification of its own.
 struct Proposal {
   std::uint16_t num_phases = 1;
   std::uint16_t phase = 1;  // counted from 1
@@ -222,14 +228,14 @@ struct Proposal {
   std::uint32_t whats_changed = 0;  // flags of wyx_whats_changed_t
   SharedMembership current_providers;
   SharedMembership changing_providers;
-  std::vector<LeaveCode> leave_codes;  // one for each changing provider of a leave; else empty
+  SharedLeaveCodes leave_codes;  // one for each changing provider of a leave; else null
   std::optional<ExpelInfo> expel_info;
   SharedBytes current_state;
   SharedBytes proposed_state;
   SharedBytes message;
   std::shared_ptr<const GroupAttributes> new_attributes;
-  std::vector<VoteResult> current_vote_results;
-  std::vector<VoteResult> changing_vote_results;
+  SharedVoteResults current_vote_results;
+  SharedVoteResults changing_vote_results;
 };
 
 /// `type` is WYX_N_PHASE_NOTIFICATION, WYX_APPROVED_NOTIFICATION or WYX_REJECTED_NOTIFICATION.
@@ -250,7 +256,7 @@ struct SubscriptionNotification {
   SharedBytes state;
   SharedMembership full_membership;
   SharedMembership changing_membership;
-  std::vector<LeaveCode> leave_codes;  // one for each changing provider of a leave
+  SharedLeaveCodes leave_codes;  // one for each changing provider of a leave; else null
   std::uint64_t seqnum = 0;
 };
 struct DelayedErrorNotification {

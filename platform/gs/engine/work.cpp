@@ -7,10 +7,11 @@ constexpr std::size_t kBytesOfUnit = 4096;
 
 std::size_t size_of(const SharedBytes& bytes) { return bytes ? bytes->size() : 0; }
 std::size_t size_of(const SharedMembership& ids) { return ids ? ids->size() * sizeof(ProviderId) : 0; }
-std::size_t size_of(const std::vector<LeaveCode>& codes) { return codes.size() * sizeof(LeaveCode); }
-std::size_t size_of(const std::vector<VoteResult>& results) {
-  std::size_t bytes = results.size() * sizeof(VoteResult);
-  for (const VoteResult& r : results) bytes += size_of(r.proposed_state) + size_of(r.message);
+std::size_t size_of(const SharedLeaveCodes& codes) { return codes ? codes->size() * sizeof(LeaveCode) : 0; }
+std::size_t size_of(const SharedVoteResults& results) {
+  if (!results) return 0;
+  std::size_t bytes = results->size() * sizeof(VoteResult);
+  for (const VoteResult& r : *results) bytes += size_of(r.proposed_state) + size_of(r.message);
   return bytes;
 }
 

@@ -51,9 +51,10 @@ std::size_t bulk(const SharedBytes& bytes) { return bytes ? bytes->size() : 0; }
 std::size_t bulk(const std::optional<Bytes>& bytes) { return bytes ? bytes->size() : 0; }
 std::size_t bulk(const SharedMembership& members) { return members ? members->size() * sizeof(ProviderId) : 0; }
 
-std::size_t bulk(const std::vector<VoteResult>& results) {
+std::size_t bulk(const SharedVoteResults& results) {
+  if (!results) return 0;
   std::size_t total = 0;
-  for (const VoteResult& r : results) total += 64 + bulk(r.proposed_state) + bulk(r.message);
+  for (const VoteResult& r : *results) total += 64 + bulk(r.proposed_state) + bulk(r.message);
   return total;
 }
 

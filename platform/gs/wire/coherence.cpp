@@ -49,7 +49,7 @@ const char* contradiction_in(const SubscriptionNotification& n) {
   if ((n.type & kDeltas) != 0 && !n.changing_membership) return "a change of members without them";
   if ((n.type & WYX_SUBSCRIPTION_STATE) != 0 && !n.state) return "a change of a state value without it";
   if ((n.type & WYX_SUBSCRIPTION_MEMBERSHIP) != 0 && !n.full_membership) return "a membership without it";
-  if ((n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) == 0 && !n.leave_codes.empty()) return "leave codes without a leave";
+  if ((n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) == 0 && n.leave_codes) return "leave codes without a leave";
   return nullptr;
 }
 

@@ -89,16 +89,16 @@ class Reader {
   }
 
   /// One for each of `changing`, or none.
-  std::vector<LeaveCode> leave_codes(const FbLeaveCodes* codes, const FbProviders* changing) {
+  SharedLeaveCodes leave_codes(const FbLeaveCodes* codes, const FbProviders* changing) {
     if (codes == nullptr) return {};
     if (changing == nullptr || codes->size() != changing->size()) fail("leave codes that match no providers");
+    if (codes->size() == 0 || !take(codes->size() * sizeof(fb::LeaveCode))) return {};
     std::vector<LeaveCode> result;
-    if (!take(codes->size() * sizeof(fb::LeaveCode))) return result;
     result.reserve(codes->size());
     for (const fb::LeaveCode* code : *codes) {
       result.push_back({flags(code->voluntary_or_failure(), kLeaveCodeBits), code->voluntary_code()});
     }
-    return result;
+    return std::make_shared<const std::vector<LeaveCode>>(std::move(result));
   }
 
   GroupAttributes value(const fb::Attributes* a) {
@@ -178,16 +178,16 @@ class Reader {
 
   // ----------------------------------------------------------------------------------------- notifications
 
-  std::vector<VoteResult> votes(const FbVoteResults* results) {
+  SharedVoteResults votes(const FbVoteResults* results) {
+    if (results == nullptr || results->size() == 0 || !take(results->size() * sizeof(fb::ProviderId))) return {};
     std::vector<VoteResult> values;
-    if (results == nullptr || !take(results->size() * sizeof(fb::ProviderId))) return values;
     values.reserve(results->size());
     for (const fb::VoteResult* r : *results) {
       values.push_back({value(r->voter()), enumeration<wyx_vote_value_t>(r->vote()),
                         flags(r->summary(), kSummaryBits), flags(r->leave_code(), kLeaveCodeBits),
                         shared_bytes(r->proposed_state()), shared_bytes(r->message())});
     }
-    return values;
+    return std::make_shared<const std::vector<VoteResult>>(std::move(values));
   }
 
   Proposal value(const fb::Proposal* p) {

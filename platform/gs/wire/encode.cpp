@@ -40,9 +40,9 @@ ProvidersOffset put(Builder& b, const Membership& members) { return put_structs<
 ProvidersOffset put(Builder& b, const SharedMembership& members) {
   return members ? put(b, *members) : ProvidersOffset();
 }
-Offset<flatbuffers::Vector<const fb::LeaveCode*>> put(Builder& b, const std::vector<LeaveCode>& codes) {
-  if (codes.empty()) return {};
-  return put_structs<fb::LeaveCode>(b, codes);
+Offset<flatbuffers::Vector<const fb::LeaveCode*>> put(Builder& b, const SharedLeaveCodes& codes) {
+  if (!codes) return {};
+  return put_structs<fb::LeaveCode>(b, *codes);
 }
 
 Offset<fb::Attributes> put(Builder& b, const GroupAttributes& a) {
@@ -141,11 +141,11 @@ ClientBody body(Builder& b, const Quit&) { return {fb::ClientBody::Quit, fb::Cre
 
 using NotificationBody = Body<fb::Notification>;
 
-Offset<flatbuffers::Vector<Offset<fb::VoteResult>>> put(Builder& b, const std::vector<VoteResult>& results) {
-  if (results.empty()) return {};
+Offset<flatbuffers::Vector<Offset<fb::VoteResult>>> put(Builder& b, const SharedVoteResults& results) {
+  if (!results) return {};
   std::vector<Offset<fb::VoteResult>> offsets;
-  offsets.reserve(results.size());
-  for (const VoteResult& result : results) {
+  offsets.reserve(results->size());
+  for (const VoteResult& result : *results) {
     const auto voter = pack(result.voter);
     const auto state = put(b, result.proposed_state);
     const auto message = put(b, result.message);
