@@ -2,7 +2,7 @@
 
 PREFIX ?= /usr/local
 release := build/release
-SECONDS ?= 3600
+STORM_SECONDS ?= 3600
 SEED ?= 1
 MEMBERS ?= 10
 
@@ -18,9 +18,9 @@ demo: ## processes vote, talk and die, one timeline of what each saw; then daemo
 test: ## the whole suite: release build, address+undefined sanitizers, thread sanitizer
 	@scripts/test.sh release asan tsan
 
-storm: ## processes killed and stopped at random, what they saw compared; SECONDS=3600 SEED=1 MEMBERS=10
+storm: ## processes killed and stopped at random, what they saw compared; STORM_SECONDS=3600 SEED=1 MEMBERS=10
 	@scripts/build.sh release storm
-	@$(release)/bin/tests/storm --seconds $(SECONDS) --seed $(SEED) --members $(MEMBERS)
+	@$(release)/bin/tests/storm --seconds $(STORM_SECONDS) --seed $(SEED) --members $(MEMBERS)
 
 bench: ## figures against their bounds; tables here, JSON in build/release/bench
 	@scripts/build.sh release

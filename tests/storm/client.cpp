@@ -333,7 +333,7 @@ class Client {
   bool open_session();
   void serve();
   void obey(const std::string& line);
-  void leave_behind(bool all);
+  void leave_behind();
   void act_at_random();
   /// Also does what it was told meanwhile.
   bool readable(int milliseconds);
@@ -396,8 +396,7 @@ void Client::act_at_random() {
 void Client::obey(const std::string& line) {
   if (line == "quit") over_ = true;
   if (line == "rally") env_.rally = true;
-  if (line == "fork") leave_behind(false);
-  if (line == "fork all") leave_behind(true);
+  if (line == "fork") leave_behind();
   if (line != "report") return;
   for (auto& member : members_) std::printf("%s\n", member->report().c_str());
   for (auto& watcher : watchers_) std::printf("%s\n", watcher->report().c_str());
@@ -405,12 +404,9 @@ void Client::obey(const std::string& line) {
   std::fflush(stdout);
 }
 
-void Client::leave_behind(bool all) {
+void Client::leave_behind() {
   if (::fork() != 0) return;
   ::prctl(PR_SET_NAME, "storm-left");
-  for (int fd = 0; !all && fd < 256; fd++) {
-    if (fd != settings_.lifeline) ::close(fd);
-  }
   pollfd end{settings_.lifeline, POLLIN, 0};
   while (::poll(&end, 1, -1) < 0) {
   }

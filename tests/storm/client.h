@@ -15,10 +15,10 @@ struct ClientSettings {
 };
 
 /// Runs until the standard input ends or says "quit". The other commands, each a line:
-///   fork     leave a process behind that lives on and holds no descriptor of the session; "fork all": one that
-///   does rally    make no more requests at random; join, or subscribe to, whatever one is out of, and approve of
-///   all report   tell where it stands: "P GROUP INSTANCE SEQNUM MEMBERS OPEN" for each provider, "T GROUP
-///   MEMBERS" for
+///   fork     leave a process behind that lives on, with the descriptors of the session
+///   rally    make no more requests at random; join, or subscribe to, whatever one is out of, and approve of all
+///   report   tell where it stands: "P GROUP INSTANCE SEQNUM MEMBERS OPEN" for each provider, "T GROUP MEMBERS"
+///   for
 ///            each subscriber, then "."; INSTANCE 0: out, OPEN: requests that nothing has come of yet
 int run_client(const ClientSettings& settings);
 
