@@ -188,7 +188,8 @@ void Server::start_accepting() {
 /// Somebody may have removed or replaced the socket; who is connected does not notice, new clients would.
 void Server::look_at_path() {
   const auto leave_old = [this] {
-    on_acceptable();  // those that have found it are still served
+    for (int i = 0; i < SOMAXCONN && accept_one(); ++i) {  // those that have found it are still served
+    }
     acceptable_.reset();
   };
   if (listener_.keep_in_place(*log_, leave_old)) start_accepting();
@@ -271,7 +272,13 @@ bool Server::watch_process(ConnectionId id) {
   Connection& connection = connections_.at(id);
   auto process = process_of_peer(connection.socket.get(), connection.connected);
   if (!process) return false;
-  if (!*process) return true;  // the end of its socket has to do
+  if (!*process) {  // the end of its socket has to do
+    if (!std::exchange(told_unwatched_, true)) {
+      log_->info(
+          "connection {}: its process cannot be watched: while a child holds the socket, it counts as alive", id);
+    }
+    return true;
+  }
   connection.process = std::move(*process);
   connection.process_ended =
       make_event(connection.process.get(), EV_READ, call_connection<&Server::on_process_ended>, &connection);

@@ -38,6 +38,7 @@ class Server : private Transport {
   /// Calls `action` whenever `fd` is readable.
   void watch(int fd, std::function<void()> action) { watched_.emplace(*this, fd, EV_READ, std::move(action)); }
   void on_hangup(std::function<void()> action) { hangup_.emplace(*this, SIGHUP, EV_SIGNAL, std::move(action)); }
+  bool stopping() const { return stopping_; }
   void repeat(std::chrono::milliseconds every, std::function<void()> action);
   /// Before the clients are told.
   void on_stopping(std::function<void()> action) { stopping_action_ = std::move(action); }
@@ -137,6 +138,7 @@ class Server : private Transport {
   std::unordered_map<ConnectionId, Connection> connections_;
   ConnectionId last_connection_ = 0;
   bool stopping_ = false;
+  bool told_unwatched_ = false;  // that the process of a peer cannot be watched
   bool short_of_memory_ = false;
   std::vector<std::byte> packet_;  // of whatever connection is being read
 };

@@ -121,6 +121,7 @@ void Service::refresh() try {
 }
 
 void Service::on_hangup() {
+  if (server_->stopping()) return;  // that was told last
   manager_->reloading();
   try {
     for (const std::string& told : read_again()) server_->log().warn("{}", told);
