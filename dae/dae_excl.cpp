@@ -23,8 +23,8 @@ int take_semaphore() {
   return result;
 }
 
-/// Whether nobody but root and this process's user can change the set or take it away. False with errno 0 when
-/// somebody can.
+/// Whether nobody but root and this process's user can take the set away, and nobody but they and members of its
+/// group can change it. False with errno 0 when somebody can.
 bool is_ours() {
   semid_ds set;
   union {

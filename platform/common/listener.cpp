@@ -11,12 +11,9 @@
 namespace platform {
 namespace {
 
-constexpr mode_t kOwnerOnly = 0600;
 constexpr mode_t kOwnerAndGroup = 0660;
 constexpr char kLock[] = ".lock";
 constexpr int kMaxDigits = 10;
-
-[[noreturn]] void fail(const std::string& what, int error) { throw ListenError(what + ": " + strerror(error)); }
 
 /// The file may be somebody else's work: only what is a number is believed, and printed.
 std::string holder_of(int lock_fd) {
@@ -31,7 +28,7 @@ std::string holder_of(int lock_fd) {
 
 void make_directory_of(const std::string& path) {
   const std::string directory = path.substr(0, path.rfind('/'));
-  if (mkdir(directory.c_str(), 0755) != 0 && errno != EEXIST) fail("cannot make " + directory, errno);
+  if (mkdir(directory.c_str(), 0755) != 0 && errno != EEXIST) throw ListenError("cannot make " + directory, errno);
 }
 
 Listener::Listener(const std::string& program, const std::string& path, std::optional<unsigned> access_group)
@@ -45,28 +42,28 @@ Descriptor Listener::lock(const Place& place) const {
   const std::string name = place.name() + kLock;
   const std::string path = path_ + kLock;
   constexpr int kFlags = O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY;
-  Descriptor file(openat(place.folder(), name.c_str(), kFlags, kOwnerOnly));
-  if (!file) fail("cannot open the lock file " + path, errno);
+  Descriptor file(openat(place.folder(), name.c_str(), kFlags, NamedSocket::kOwnerOnly));
+  if (!file) throw ListenError("cannot open the lock file " + path, errno);
   const auto opened = file_of(file.get());
   if (!opened || !S_ISREG(opened->st_mode) || opened->st_uid != geteuid() || opened->st_nlink != 1) {
     throw ListenError(path + " is no lock file of this daemon's user: remove it, or choose another path");
   }
   if (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
-    if (errno != EWOULDBLOCK) fail("cannot lock " + path, errno);
+    if (errno != EWOULDBLOCK) throw ListenError("cannot lock " + path, errno);
     throw ListenError("another " + program_ + holder_of(file.get()) + " already serves " + path_);
   }
   if (!same_file(opened, place.found(kLock))) throw ListenError(path + " was removed while it was locked");
   const std::string pid = std::to_string(getpid()) + "\n";
   if (ftruncate(file.get(), 0) != 0 || pwrite(file.get(), pid.data(), pid.size(), 0) < 0) {
-    fail("cannot write " + path, errno);
+    throw ListenError("cannot write " + path, errno);
   }
   return file;
 }
 
 std::unique_ptr<NamedSocket> Listener::listen_at(Place place) const {
-  const NamedSocket::Access access{access_group_ ? kOwnerAndGroup : kOwnerOnly, access_group_};
+  const NamedSocket::Access access{access_group_ ? kOwnerAndGroup : NamedSocket::kOwnerOnly, access_group_};
   auto bound = std::make_unique<NamedSocket>(std::move(place), SOCK_SEQPACKET, access);
-  if (::listen(bound->fd(), SOMAXCONN) != 0) fail("cannot listen on " + path_, errno);
+  if (::listen(bound->fd(), SOMAXCONN) != 0) throw ListenError("cannot listen on " + path_, errno);
   return bound;
 }
 

@@ -19,6 +19,8 @@ class Listener {
  public:
   /// How often to look whether all is in place.
   static constexpr std::chrono::seconds kLookAgain{1};
+  /// How long not to accept when descriptors have run out.
+  static constexpr std::chrono::milliseconds kAcceptPause{100};
 
   /// Listens, not blocking, for whole packets. `program` names the daemon to whom it finds the path in use. Throws
   /// ListenError: the path is in use, too long, no socket, not permitted, or in a folder that others can write.
@@ -34,6 +36,8 @@ class Listener {
   /// Locks and binds anew what somebody has removed or replaced, with a line in the log. True: fd() is another
   /// now; `before` was called while the old one was still open. What stands in the way is told once.
   bool keep_in_place(spdlog::logger& log, const std::function<void()>& before);
+  /// As keep_in_place has found or left it. False: another daemon may serve the path by now.
+  bool in_place() const { return obstacle_.empty(); }
 
  private:
   std::unique_ptr<NamedSocket> listen_at(Place place) const;

@@ -52,7 +52,7 @@ std::optional<spdlog::level::level_enum> log_level(const std::string& name) {
   return std::nullopt;
 }
 
-void log_to_file(const std::string& path) {
+Descriptor open_log_file(const std::string& path) {
   const auto fail = [&](const std::string& why) { throw std::runtime_error(path + ": " + why); };
   Place place = [&] {
     try {
@@ -63,19 +63,22 @@ void log_to_file(const std::string& path) {
   }();
   // Not blocking: a pipe that nobody reads is refused, not waited for.
   constexpr int kFlags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOCTTY | O_NOFOLLOW | O_NONBLOCK;
-  const Descriptor file(openat(place.folder(), place.name().c_str(), kFlags, 0640));
+  Descriptor file(openat(place.folder(), place.name().c_str(), kFlags, 0640));
   if (!file && errno == ELOOP) fail("is a link: name the file itself");
   if (!file) fail(std::generic_category().message(errno));
   const auto opened = file_of(file.get());
   const auto folder = file_of(place.folder());
   if (!opened || !folder) fail("cannot be looked at");
-  const bool for_all = (folder->st_mode & S_IWOTH) != 0;
-  const std::string danger = for_all ? place.danger(S_IWOTH) : "";
+  const std::string danger = place.danger(S_IWOTH);
   if (!danger.empty()) fail(danger);
   const bool ours = (opened->st_uid == 0 || opened->st_uid == geteuid()) && opened->st_nlink == 1;
-  if (for_all && S_ISREG(opened->st_mode) && !ours)
-    fail("is somebody else's file, in a folder that all can write");
+  if ((folder->st_mode & S_IWOTH) != 0 && !ours) fail("is somebody else's file, in a folder that all can write");
   fcntl(file.get(), F_SETFL, O_APPEND);
+  return file;
+}
+
+void log_to_file(const std::string& path) {
+  const Descriptor file = open_log_file(path);
   dup2(file.get(), STDOUT_FILENO);
   dup2(file.get(), STDERR_FILENO);
 }

@@ -7,13 +7,19 @@
 #include <optional>
 #include <string>
 
+#include "common/descriptor.h"
+
 namespace platform {
 
 /// "error", "warning", "info" or "debug"; nothing for any other text.
 std::optional<spdlog::level::level_enum> log_level(const std::string& name);
 
-/// Standard output and error are appended to the file from here on. Throws std::runtime_error: it cannot be
-/// opened, is a link, or lies where others could have put it.
+/// Opened for appending, made where there is none. Throws std::runtime_error, whose text begins with the path: it
+/// cannot be opened, is a link or a pipe that nobody reads, or lies where somebody other than root and this
+/// process's user could have put it. The folders on the way to its own are the operator's to choose.
+Descriptor open_log_file(const std::string& path);
+
+/// Standard output and error are appended to the file from here on. Throws as open_log_file does.
 void log_to_file(const std::string& path);
 
 /// For one thread. Another one writes, so a standard error that takes nothing costs lines, which are counted, and

@@ -54,17 +54,25 @@ LogWriter::LogWriter(LostLine lost_line) : queue_(std::make_shared<Queue>(lost_l
 }
 
 LogWriter::~LogWriter() {
+  timespec until{};
+  clock_gettime(CLOCK_MONOTONIC, &until);
+  until.tv_nsec += kPatience;
+  until.tv_sec += until.tv_nsec / kSecond;
+  until.tv_nsec %= kSecond;
+  bool written = false;
   {
     MutexLock lock(queue_->mutex);
     queue_->ended = true;
     queue_->changed.notify_all();
+    while (!queue_->written && queue_->changed.wait_until(queue_->mutex, until)) {
+    }
+    written = queue_->written;
   }
-  timespec until{};
-  clock_gettime(CLOCK_REALTIME, &until);
-  until.tv_nsec += kPatience;
-  until.tv_sec += until.tv_nsec / kSecond;
-  until.tv_nsec %= kSecond;
-  if (pthread_timedjoin_np(thread_, nullptr, &until) != 0) pthread_detach(thread_);
+  if (written) {
+    pthread_join(thread_, nullptr);
+  } else {
+    pthread_detach(thread_);
+  }
 }
 
 void LogWriter::write(std::string_view line) {
@@ -94,7 +102,11 @@ void* LogWriter::run(void* queue) noexcept {
     {
       MutexLock lock(q.mutex);
       while (q.lines.empty() && !q.ended) q.changed.wait(q.mutex);
-      if (q.lines.empty()) return nullptr;
+      if (q.lines.empty()) {
+        q.written = true;
+        q.changed.notify_all();
+        return nullptr;
+      }
       lines.swap(q.lines);
       std::swap(lost, q.lost);
     }

@@ -39,10 +39,11 @@ class LogWriter {
 
     const LostLine lost_line;
     Mutex mutex;
-    Condition changed;  // notified when lines come to an empty queue, and at the end
+    Condition changed;  // notified when lines come to an empty queue, and at both ends
     std::string lines ZN_GUARDED_BY(mutex);
     std::uint64_t lost ZN_GUARDED_BY(mutex) = 0;  // behind those lines
-    bool ended ZN_GUARDED_BY(mutex) = false;
+    bool ended ZN_GUARDED_BY(mutex) = false;      // no more lines come
+    bool written ZN_GUARDED_BY(mutex) = false;    // and none waits: the thread ends
   };
 
   static void* run(void* queue) noexcept;

@@ -58,6 +58,10 @@ class Condition {
 
   /// A cancellation point; a cancelled wait unwinds with `mutex` held.
   void wait(Mutex& mutex) ZN_REQUIRES(mutex) { pthread_cond_wait(&condition_, &mutex.mutex_); }
+  /// `until`: of CLOCK_MONOTONIC. False: it has come.
+  bool wait_until(Mutex& mutex, const timespec& until) ZN_REQUIRES(mutex) {
+    return pthread_cond_clockwait(&condition_, &mutex.mutex_, CLOCK_MONOTONIC, &until) == 0;
+  }
   void notify_all() { pthread_cond_broadcast(&condition_); }
 
  private:

@@ -11,10 +11,6 @@
 namespace platform {
 namespace {
 
-constexpr mode_t kOwnerOnly = 0600;
-
-[[noreturn]] void fail(const std::string& what, int error) { throw ListenError(what + ": " + strerror(error)); }
-
 /// What a dead daemon has left; anything else stays.
 void remove_old(const Place& place) {
   const auto old = place.found();
@@ -25,7 +21,7 @@ void remove_old(const Place& place) {
                       ": remove it, or choose another path");
   }
   if (unlinkat(place.folder(), place.name().c_str(), 0) != 0)
-    fail("cannot remove the old socket " + place.path(), errno);
+    throw ListenError("cannot remove the old socket " + place.path(), errno);
 }
 
 void bind_to(int socket, const Place& place) {
@@ -38,14 +34,16 @@ void bind_to(int socket, const Place& place) {
 
   // Made for the owner alone and opened to others afterwards: there is no moment at which just anybody could
   // connect.
-  const mode_t old_mask = umask(0777 & ~kOwnerOnly);
+  const mode_t old_mask = umask(0777 & ~NamedSocket::kOwnerOnly);
   const int result = bind(socket, reinterpret_cast<sockaddr*>(&address), sizeof address);
   const int error = errno;
   umask(old_mask);
-  if (result != 0) fail("cannot bind " + place.path(), error);
+  if (result != 0) throw ListenError("cannot bind " + place.path(), error);
 }
 
 }  // namespace
+
+ListenError::ListenError(const std::string& what, int error) : std::runtime_error(what + ": " + strerror(error)) {}
 
 Place socket_place(const std::string& path) try {
   Place place(path);
@@ -58,7 +56,7 @@ Place socket_place(const std::string& path) try {
 
 NamedSocket::NamedSocket(Place place, int type)
     : place_(std::move(place)), socket_(socket(AF_UNIX, type | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)) {
-  if (!socket_) fail("cannot make a socket", errno);
+  if (!socket_) throw ListenError("cannot make a socket", errno);
   remove_old(place_);
   bind_to(socket_.get(), place_);
   file_ = Descriptor(openat(place_.folder(), place_.name().c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
@@ -75,10 +73,10 @@ NamedSocket::NamedSocket(Place place, int type, const Access& access) : NamedSoc
 /// Through the descriptor: no name is looked up, so no link is followed.
 void NamedSocket::open_to(const Access& access) const {
   if (access.group && fchownat(file_.get(), "", static_cast<uid_t>(-1), *access.group, AT_EMPTY_PATH) != 0)
-    fail("cannot give " + place_.path() + " to the access group", errno);
+    throw ListenError("cannot give " + place_.path() + " to the access group", errno);
   const std::string file = "/proc/self/fd/" + std::to_string(file_.get());
   if (access.mode != kOwnerOnly && chmod(file.c_str(), access.mode) != 0)
-    fail("cannot open " + place_.path() + " to others", errno);
+    throw ListenError("cannot open " + place_.path() + " to others", errno);
 }
 
 NamedSocket::~NamedSocket() {

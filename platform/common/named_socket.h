@@ -15,6 +15,8 @@ namespace platform {
 class ListenError : public std::runtime_error {
  public:
   using std::runtime_error::runtime_error;
+  /// `error`: a number, behind `what` as its text.
+  ListenError(const std::string& what, int error);
 };
 
 /// The place of a socket. Throws ListenError: no such folder, or one in which others could exchange the socket.
@@ -23,8 +25,9 @@ Place socket_place(const std::string& path);
 /// The name goes with the object, if it is still this socket's.
 class NamedSocket {
  public:
+  static constexpr mode_t kOwnerOnly = 0600;
   struct Access {
-    mode_t mode = 0600;
+    mode_t mode = kOwnerOnly;
     std::optional<gid_t> group = {};
   };
 

@@ -7,7 +7,7 @@
 // command for which it forwards, waits on a local datagram socket and names it in the header as the return
 // address. The subsystem answers straight to that address, with any number of interim packets and one last one.
 // The master keeps the address until the subsystem has answered or ended, so that nobody else gets what comes
-// late.
+// late. A process that has got another parent since it read the request has lost its master, and answers nobody.
 //
 // The return address (`kplhdr.retaddr`) is a local-socket address that needs no length beside it:
 //   - `sun_family` is AF_UNIX; any other value means that no answer is wanted;
@@ -156,8 +156,9 @@ KPL_EXPORT struct kplhdr* kplrrqs(char* request_header);
 ///
 /// The socket used is opened with the first packet and closed with the last: between requests the library holds no
 /// descriptor. Packets arrive in order and none is dropped while the requester reads: the call waits while its
-/// queue is full, but 2 seconds in all for one answer; then, or when nobody has the return address (any more), the
-/// requester counts as gone, and this and all later packets of the answer are dropped at no cost.
+/// queue is full, but 2 seconds in all for one answer; then, or when nobody has the return address (any more), or
+/// when the process has got another parent since kplrrqs before the first packet (ECONNREFUSED), the requester
+/// counts as gone, and this and all later packets of the answer are dropped at no cost.
 ///
 /// Returns 0 when the packet was handed over, -1 otherwise, with `errno`: EINVAL for a `reply_len` under 118,
 /// EDESTADDRREQ without return address or for a path, ETIMEDOUT or the socket's error when the requester is gone.
@@ -169,9 +170,8 @@ KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int co
 ///
 /// A query is a run of calls: `*cont` is KPL_CONT_FIRST at its first, and each call fills `reply` (a `statrep` of
 /// at most `*reply_len` bytes, at least 218) with the next records, stores the bytes used in `*reply_len`, and
-/// sets
-/// `*cont` to KPL_CONT_END with the last records, to KPL_CONT_STATUS before. The first call asks and waits for the
-/// whole answer, 5 seconds in all; the others only hand out what came, and free it with the last.
+/// sets `*cont` to KPL_CONT_END with the last records, to KPL_CONT_STATUS before. The first call asks and waits
+/// for the whole answer, 5 seconds in all; the others only hand out what came, and free it with the last.
 ///
 /// On the wire it is a connection to the master's SOCK_SEQPACKET socket and one packet in it: a request with
 /// KPL_ACTION_STATUS, no return address, `parm1` 0, `objname` the subsystem (at most 29 characters) and, as extra
@@ -179,8 +179,7 @@ KPL_EXPORT int kplsrpy(struct kplhdr* header, char* reply, int reply_len, int co
 ///
 /// Returns 0; -1 with `errno` when the master could not be asked (EINVAL for the arguments, ETIMEDOUT, EPERM when
 /// who listens there is neither root nor this process's user, EBADMSG for an answer that makes no sense, or the
-/// socket's error); otherwise the result code of the master's answer. After
-/// a failure the query is over.
+/// socket's error); otherwise the result code of the master's answer. After a failure the query is over.
 KPL_EXPORT int kplstat(char* host, char* subsystem, pid_t pid, short* reply_len, char* reply, int* cont);
 
 #undef KPL_EXPORT

@@ -12,7 +12,8 @@ namespace kpl {
 /// A new local socket of that type, closed on exec; holds nothing, with errno, when there is none to be had.
 platform::Descriptor open_local_socket(int type);
 
-/// The length that the kernel wants for a return address, 0 when it names nobody. See kpl.h for what it may hold.
+/// The length that the kernel wants for an address that travels or is set without one, 0 when it names nobody. See
+/// kpl.h for what a return address may hold.
 socklen_t address_length(const sockaddr_un& address);
 
 /// The address that `text` stands for: a path, or an abstract name with '@' for its NUL. False when it is empty or

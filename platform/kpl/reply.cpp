@@ -3,6 +3,7 @@
 #include <poll.h>
 #include <string.h>
 #include <sys/uio.h>
+#include <unistd.h>
 
 #include <chrono>
 
@@ -19,6 +20,7 @@ constexpr Clock::duration kPatience = std::chrono::seconds(2);
 /// The answer that a thread is giving.
 struct Answer {
   kplhdr header;
+  pid_t parent;  ///< when the request was read
   platform::Descriptor socket;
   Clock::duration patience = kPatience;  ///< what is left of it
   int gone = 0;                          ///< the error that told that the requester is gone; 0 while it is there
@@ -33,14 +35,16 @@ struct Answer {
 thread_local Answer answer;
 
 /// Not to a path: where that leads is up to whoever may write in its folders, and the answer would go there with
-/// this process's rights. Whoever holds an abstract name keeps it for as long as it lives.
+/// this process's rights. Whoever holds an abstract name keeps it for as long as it lives: then anybody may take
+/// it, so what was connected to counts only while the master that held the name is there.
 int connect_to(const sockaddr_un& retaddr) {
   const socklen_t length = kpl::address_length(retaddr);
   if (length == 0 || retaddr.sun_path[0] != '\0') return EDESTADDRREQ;
   answer.socket = kpl::open_local_socket(SOCK_DGRAM);
   if (!answer.socket) return errno;
   const auto* address = reinterpret_cast<const sockaddr*>(&retaddr);
-  return connect(answer.socket.get(), address, length) == 0 ? 0 : errno;
+  if (connect(answer.socket.get(), address, length) != 0) return errno;
+  return getppid() == answer.parent ? 0 : ECONNREFUSED;
 }
 
 /// Waits until the requester has room or the patience is used up; returns an error number.
@@ -72,6 +76,7 @@ int send_packet(kplhdr* header, char* body, size_t body_len) {
 kplhdr* kplrrqs(char* request_header) {
   answer.restart();
   memcpy(&answer.header, request_header, sizeof answer.header);
+  answer.parent = getppid();
   return &answer.header;
 }
 

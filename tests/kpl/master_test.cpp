@@ -9,6 +9,7 @@
 
 #include "control/control.h"
 #include "dae/datagram.h"
+#include "kpl.h"
 #include "kpl/private_master.h"
 #include "support/raw_client.h"
 
@@ -159,10 +160,24 @@ TEST_F(Kplmstr, AHungDaemon_IsKilledAndStartedAgainWhereTheDefinitionAsksForPing
       "restart = true\nping-interval = 0.05\nrestart-delay = 0.01\nstop-time = 0.2\nping-limit = ";
   master.define_probe("hung", "socket", pings + "0.2\n", "silent");
   master.define_probe("well", "socket", pings + "60\n");
-  master.start();
+  master.start({"--log-level", "debug"});
   for (const char* name : {"hung", "well"}) ASSERT_EQ(ctl({"start", name}).status, kOk);
   EXPECT_TRUE(master.wait_for_log("hung", "started as hung\ncancel\nstarted as hung\n"));
   EXPECT_THAT(master.log("master"), HasSubstr("hung: hung (ping: hung has not answered within 0.2 s); SIGTERM"));
+  const std::string answered = "well: ping: not-supported\n";
+  const auto count = [&] {
+    const std::string log = master.log("master");
+    int found = 0;
+    for (std::size_t at = 0; (at = log.find(answered, at)) != std::string::npos; ++at) ++found;
+    return found;
+  };
+  EXPECT_TRUE(wait_until([&] { return count() >= 2; }));
+
+  master.tell_shell("prlimit --pid $master --nofile=3:");  // a master without descriptors cannot ask
+  EXPECT_TRUE(master.wait_for_log("master", "well: ping: no socket for the answer"));
+  master.tell_shell("prlimit --pid $master --nofile=1024:");
+  const auto before = count();
+  EXPECT_TRUE(wait_until([&] { return count() > before; }));
   EXPECT_EQ(status_of("well")["restarts"], 0);
 }
 
@@ -318,6 +333,14 @@ TEST_F(Kplmstr, AMasterThatIsKilled_LeavesWhatTheNextOneNamesAndAStoppedOneLeave
   master.start();
   EXPECT_TRUE(master.wait_for_log("probe", "started as probe\n"));
   const std::string pid = status_of("probe")["pid"].dump();
+  // Writes more than a pipe holds once nobody reads it.
+  const std::string pipe = master.path("pipe");
+  ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+  master.define("talker", "program = \"/bin/sh\"\ntransport = \"signals\"\narguments = [\"-c\", 'read line < " +
+                              pipe + "; for i in $(seq 9999); do echo $i times; done; echo over > " +
+                              master.log_path("talker") + "']\n");
+  master.tell_shell("kill -HUP $master");
+  EXPECT_TRUE(wait_until([&] { return ctl({"start", "talker"}).status == kOk; }));
   if (geteuid() == 0) {  // one that only says so: another user's, which takes no subsystem's place
     master.define_probe("free", "socket");
     master.tell_shell(
@@ -333,9 +356,11 @@ TEST_F(Kplmstr, AMasterThatIsKilled_LeavesWhatTheNextOneNamesAndAStoppedOneLeave
   if (geteuid() == 0) {
     EXPECT_EQ(ctl({"start", "free"}).status, kOk);
   }
+  std::fstream(pipe) << "go\n" << std::flush;
+  EXPECT_TRUE(master.wait_for_log("talker", "over\n"));
   master.tell_shell("kill " + pid);
   EXPECT_TRUE(wait_until([&] { return ctl({"start", "probe"}).status == kOk; }));
-  EXPECT_EQ(ctl({"status"}).err, "");
+  EXPECT_TRUE(wait_until([&] { return ctl({"status"}).err.empty(); }));
   EXPECT_TRUE(master.wait_for_log("probe", "cancel\nstarted as probe\n"));
 
   EXPECT_EQ(master.stop(), 0);
@@ -386,6 +411,16 @@ TEST_F(Kplmstr, ManyConnections_GetTheirOwnAnswersAmongMalformedPacketsAndVanish
     EXPECT_THAT(all, HasSubstr("malformed request: "));
     EXPECT_THAT(all, HasSubstr("from " + std::to_string(i) + "\""));
   }
+
+  const std::string status_path = master.socket_path() + ".status";
+  for (const std::string& removed : {status_path, master.socket_path()}) unlink(removed.c_str());
+  EXPECT_TRUE(wait_until([&] { return ctl({"refresh", "probe"}).status == kOk; }));
+  kplreq question{};
+  question.subreq = {KPL_OBJECT_SUBSYSTEM, KPL_ACTION_STATUS, 0, 0, "probe"};
+  RawConnection asks(status_path);
+  asks.send_bytes(std::string(reinterpret_cast<const char*>(&question.kplhdr), 156) + std::string(4, '\0'));
+  const auto told = asks.next_packet();
+  EXPECT_THAT(std::string(reinterpret_cast<const char*>(told.data()), told.size()), HasSubstr("active"));
 }
 
 TEST_F(Kplmstr, Daemon_ReturnsWhenItServesAndTellsWhyItDoesNot) {

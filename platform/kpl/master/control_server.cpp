@@ -10,12 +10,11 @@ namespace {
 
 using platform::Descriptor;
 
-constexpr int kAcceptsAtOnce = 16;                      // before the connected are served again
-constexpr std::size_t kMaxConnections = 256;            // one more is closed at once
-constexpr std::size_t kKeptForRoot = 16;                // of them: the access group cannot lock root out
-constexpr std::size_t kMaxWaiting = 4 * 1024 * 1024;    // bytes; a requester that does not read is closed
-constexpr int kSendBuffer = 512 * 1024;                 // bytes; the system may give less
-constexpr std::chrono::milliseconds kAcceptPause{100};  // when descriptors have run out
+constexpr int kAcceptsAtOnce = 16;                    // before the connected are served again
+constexpr std::size_t kMaxConnections = 256;          // one more is closed at once
+constexpr std::size_t kKeptForRoot = 16;              // of them: the access group cannot lock root out
+constexpr std::size_t kMaxWaiting = 4 * 1024 * 1024;  // bytes; a requester that does not read is closed
+constexpr int kSendBuffer = 512 * 1024;               // bytes; the system may give less
 
 }  // namespace
 
@@ -27,11 +26,9 @@ ControlServer::ControlServer(const Loop& loop, spdlog::logger& log, const std::s
       handler_(std::move(handler)),
       listener_("kplmstr", path, access.group),
       accept_again_(loop, [this] { acceptable_->arm(); }),
-      look_again_(loop, [this] { look_at_path(); }),
       client_log_(log),
       tell_left_out_(loop, [this] { client_log_.tell_left_out(); }) {
   start_accepting();
-  look_again_.arm(platform::Listener::kLookAgain);
 }
 
 ControlServer::~ControlServer() { client_log_.tell_left_out(); }
@@ -40,14 +37,14 @@ void ControlServer::start_accepting() {
   acceptable_.emplace(loop_, listener_.fd(), EV_READ | EV_PERSIST, [this] { on_acceptable(); });
 }
 
-/// Somebody may have removed or replaced the socket; who is connected does not notice, new requesters would.
-void ControlServer::look_at_path() {
-  look_again_.arm(platform::Listener::kLookAgain);
+bool ControlServer::keep_in_place() {
   const auto leave_old = [this] {
-    on_acceptable();  // those that have found it are still served
+    for (int i = 0; i < SOMAXCONN && accept_one(); ++i) {  // those that have found it are still served
+    }
     acceptable_.reset();
   };
   if (listener_.keep_in_place(log_, leave_old)) start_accepting();
+  return listener_.in_place();
 }
 
 void ControlServer::warn_about(std::optional<std::uint32_t> user, const std::string& line) {
@@ -58,19 +55,23 @@ void ControlServer::warn_about(std::optional<std::uint32_t> user, const std::str
 }
 
 void ControlServer::on_acceptable() {
-  for (int i = 0; i < kAcceptsAtOnce; ++i) {
-    Descriptor socket(accept4(listener_.fd(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
-    if (socket) {
-      add_connection(std::move(socket));
-      continue;
-    }
-    if (errno == ECONNABORTED || errno == EINTR) continue;
-    if (errno == EAGAIN) return;
-    // The connection that could not be accepted stays in the queue and would wake the loop again and again.
-    warn_about({}, std::string("cannot accept more connections for now: ") + strerror(errno));
-    acceptable_->disarm();
-    return accept_again_.arm(kAcceptPause);
+  for (int i = 0; i < kAcceptsAtOnce && accept_one(); ++i) {
   }
+}
+
+bool ControlServer::accept_one() {
+  Descriptor socket(accept4(listener_.fd(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+  if (socket) {
+    add_connection(std::move(socket));
+    return true;
+  }
+  if (errno == ECONNABORTED || errno == EINTR) return true;
+  if (errno == EAGAIN) return false;
+  // The connection that could not be accepted stays in the queue and would wake the loop again and again.
+  warn_about({}, std::string("cannot accept more connections for now: ") + strerror(errno));
+  acceptable_->disarm();
+  accept_again_.arm(platform::Listener::kAcceptPause);
+  return false;
 }
 
 void ControlServer::add_connection(Descriptor socket) {

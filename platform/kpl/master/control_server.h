@@ -29,6 +29,10 @@ class ControlServer {
                 Handler handler);
   ~ControlServer();
 
+  /// Somebody may have removed or replaced the socket; who is connected does not notice, new requesters would.
+  /// True: all is in place, by now.
+  bool keep_in_place();
+
  private:
   using ConnectionId = std::uint64_t;
   struct Connection {
@@ -41,7 +45,8 @@ class ControlServer {
 
   void on_acceptable();
   void start_accepting();
-  void look_at_path();
+  /// False: nothing more is there, or descriptors have run out.
+  bool accept_one();
   /// Into the log, unless there have been too many such lines of late. `user`: whose doing it is, if anybody's.
   void warn_about(std::optional<std::uint32_t> user, const std::string& line);
   void add_connection(platform::Descriptor socket);
@@ -59,7 +64,6 @@ class ControlServer {
   ConnectionId last_connection_ = 0;
   std::optional<Event> acceptable_;
   Event accept_again_;
-  Event look_again_;
   platform::ClientLog client_log_;
   Event tell_left_out_;
 };

@@ -15,6 +15,8 @@ namespace kpl::master {
 
 using Duration = std::chrono::milliseconds;
 
+inline double in_seconds(Duration time) { return static_cast<double>(time.count()) / 1000; }
+
 enum class Transport { kSocket, kQueue, kSignals };
 
 const char* name_of(Transport transport);

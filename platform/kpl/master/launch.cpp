@@ -14,6 +14,7 @@
 #include <set>
 #include <vector>
 
+#include "common/log.h"
 #include "kpl.h"
 #include "master/left_behind.h"
 
@@ -106,11 +107,11 @@ void plan_files(const Definition& definition, Plan& plan) {
   plan.null = Descriptor(open("/dev/null", O_RDWR | O_CLOEXEC));
   if (!plan.null) throw LaunchError(std::string("cannot open /dev/null: ") + strerror(errno));
   if (definition.output.empty()) return;
-  constexpr int kFlags = O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NOFOLLOW;
-  // Not blocking: a pipe that nobody reads would hold up the master.
-  plan.output = Descriptor(open(definition.output.c_str(), kFlags | O_NONBLOCK, 0640));
-  if (!plan.output) throw LaunchError("cannot open " + definition.output + ": " + strerror(errno));
-  fcntl(plan.output.get(), F_SETFL, O_APPEND);
+  try {
+    plan.output = platform::open_log_file(definition.output);
+  } catch (const std::runtime_error& error) {
+    throw LaunchError(std::string("cannot open ") + error.what());
+  }
 }
 
 [[noreturn]] void give_up(int report, Failure::Step step) {
@@ -119,11 +120,13 @@ void plan_files(const Definition& definition, Plan& plan) {
   _exit(kExitNotRun);
 }
 
-/// The handlers of the master's loop would write into what it shares with this process.
-void reset_signals(const sigset_t& mask) {
+/// The handlers of the master's loop would write into what it shares with this process. What is written to a
+/// master that is dead must not kill: see OutputLog.
+void reset_signals(const sigset_t& mask, bool output_to_master) {
   struct sigaction by_default {};
   by_default.sa_handler = SIG_DFL;
   for (int number = 1; number < NSIG; ++number) sigaction(number, &by_default, nullptr);
+  if (output_to_master) signal(SIGPIPE, SIG_IGN);
   sigprocmask(SIG_SETMASK, &mask, nullptr);
 }
 
@@ -135,13 +138,14 @@ void reset_signals(const sigset_t& mask) {
       dup2(output, STDOUT_FILENO) < 0 || dup2(output, STDERR_FILENO) < 0) {
     give_up(report, Failure::kDescriptors);
   }
-  // For what the master itself was given; its own are closed on exec anyway, so a kernel without this is no obstacle.
+  // For what the master itself was given; its own are closed on exec anyway, so a kernel without this is no
+  // obstacle.
   close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);
   if (plan.change_user &&
       (setgroups(plan.groups.size(), plan.groups.data()) != 0 || setgid(plan.gid) != 0 || setuid(plan.uid) != 0)) {
     give_up(report, Failure::kUser);
   }
-  reset_signals(mask);
+  reset_signals(mask, !plan.output);
   execve(plan.argv[0], plan.argv.data(), plan.envp.data());
   give_up(report, Failure::kProgram);
 }

@@ -67,6 +67,7 @@ Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log,
       control_(loop_, *log_, prepared(options.socket_path), access_rule(options),
                [this](const control::Request& request, const Reply& reply) { on_request(request, reply); }),
       status_(loop_, status_socket_, [this](const std::string& name, int pid) { return short_status(name, pid); }),
+      look_again_(loop_, [this] { look_at_sockets(); }),
       children_(loop_, SIGCHLD, EV_SIGNAL | EV_PERSIST, [this] { on_children(); }),
       hangup_(loop_, SIGHUP, EV_SIGNAL | EV_PERSIST, [this] { on_hangup(); }),
       terminated_(loop_, SIGTERM, EV_SIGNAL | EV_PERSIST, [this] { on_terminate(); }),
@@ -74,7 +75,9 @@ Master::Master(const Options& options, std::shared_ptr<spdlog::logger> log,
       alive_(loop_, [this] {
         manager_.alive();
         alive_.arm(*manager_.alive_every());
-      }) {}
+      }) {
+  look_again_.arm(platform::Listener::kLookAgain);
+}
 
 void Master::start() {
   read_definitions();
@@ -99,7 +102,13 @@ void Master::tell_ready() const {
   manager_.ready(std::to_string(subsystems_.size()) + " subsystems defined in " + folder_);
 }
 
+void Master::look_at_sockets() {
+  look_again_.arm(platform::Listener::kLookAgain);
+  if (control_.keep_in_place()) status_.keep_in_place();
+}
+
 void Master::on_hangup() {
+  if (stopping_) return;  // that was told last
   manager_.reloading();
   try {
     if (!log_file_.empty()) platform::log_to_file(log_file_);

@@ -32,6 +32,7 @@ class Master {
   void run() { loop_.run(); }
 
  private:
+  void look_at_sockets();
   void on_hangup();
   void tell_ready() const;
   void read_definitions();
@@ -62,6 +63,7 @@ class Master {
   bool stopping_ = false;
   ControlServer control_;  // first: its lock tells that this is the only master
   StatusServer status_;
+  Event look_again_;
   Event children_;
   Event hangup_;
   Event terminated_;

@@ -32,12 +32,10 @@ OutputLog::OutputLog(const Loop& loop, spdlog::logger& log, std::string name, st
       ended_(std::move(ended)),
       second_over_(loop, [this] { tell_left_out(); }) {
   std::array<int, 2> ends{};
-  if (pipe2(ends.data(), O_CLOEXEC | O_NONBLOCK) != 0) fail();
+  if (pipe2(ends.data(), O_CLOEXEC) != 0) fail();
   own_end_ = Descriptor(ends[0]);
-  const Descriptor writing(ends[1]);
-  const std::string path = "/proc/self/fd/" + std::to_string(ends[1]);
-  subsystem_end_ = Descriptor(open(path.c_str(), O_RDWR | O_CLOEXEC));
-  if (!subsystem_end_) fail();
+  subsystem_end_ = Descriptor(ends[1]);
+  fcntl(own_end_.get(), F_SETFL, O_NONBLOCK);
   readable_.emplace(loop, own_end_.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
 }
 
@@ -50,7 +48,9 @@ OutputLog::~OutputLog() {
 
 void OutputLog::on_readable() {
   read_some();
-  if (over_) ended_();
+  if (!over_) return;
+  const auto ended = ended_;  // it may destroy this object
+  ended();
 }
 
 bool OutputLog::read_some() {

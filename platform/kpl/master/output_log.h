@@ -26,8 +26,8 @@ class OutputLog {
   OutputLog(const OutputLog&) = delete;
   OutputLog& operator=(const OutputLog&) = delete;
 
-  /// What becomes descriptors 1 and 2 of the subsystem. It is open for reading, too, so that a subsystem that
-  /// outlives its master is not killed by what it writes.
+  /// What becomes descriptors 1 and 2 of the subsystem. Once the master is dead, writing there fails (EPIPE) and
+  /// holds up nobody; so that it does not kill either, the subsystem starts with SIGPIPE ignored.
   platform::Descriptor take_subsystem_end() { return std::move(subsystem_end_); }
   bool is_over() const { return over_; }
 

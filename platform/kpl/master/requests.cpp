@@ -1,5 +1,6 @@
 #include "master/requests.h"
 
+#include <spdlog/fmt/fmt.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 
@@ -18,7 +19,9 @@ using platform::Descriptor;
 constexpr std::size_t kMaxWaiting = 100;
 constexpr std::size_t kMaxLate = 64;
 constexpr std::size_t kMaxPacket = sizeof(kplhdr) + 80 * sizeof(statcode);
-constexpr int kPacketsAtOnce = 32;  // before others are served again
+constexpr int kPacketsAtOnce = 32;        // before others are served again
+constexpr Duration kSendAgain{100};       // to a channel that has had no room for a ping
+constexpr Duration kPingOvertime{1'000};  // at most, and no more than the ping's limit
 
 /// A socket with an address that the kernel chooses, for one answer.
 Descriptor open_reply_socket(sockaddr_un* address) {
@@ -89,13 +92,6 @@ End end_in(const std::string& name, const char* packet, std::size_t length) {
   return {Result::kFailed, code, text};
 }
 
-std::string in_seconds(Duration time) {
-  std::string text = std::to_string(static_cast<double>(time.count()) / 1000);
-  text.erase(text.find_last_not_of('0') + 1);
-  if (text.ends_with('.')) text.pop_back();
-  return text + " s";
-}
-
 }  // namespace
 
 struct Requests::Pending {
@@ -105,14 +101,23 @@ struct Requests::Pending {
   Question question;
   Reply reply;
   Event late;
-  std::optional<Duration> once_sent;  // the limit, where it counts from then
+  std::optional<Duration> once_sent;  // a ping's limit, which counts from then
+  bool overtime = false;              // of a ping: its limit is over, and this is the rest that it is given
+  std::string refused;                // a ping's: why the subsystem could not be asked yet
   bool sent = false;
   Descriptor socket;
   std::optional<Event> readable;  // goes before the socket
 };
 
+struct Requests::Late {
+  Descriptor socket;
+  std::optional<Event> readable;  // goes before the socket
+};
+
 Requests::Requests(const Loop& loop, Channel& channel, std::string name, pid_t pid)
-    : loop_(loop), channel_(channel), name_(std::move(name)), pid_(pid) {}
+    : loop_(loop), channel_(channel), name_(std::move(name)), pid_(pid), send_again_(loop, [this] {
+        send_first();
+      }) {}
 
 Requests::~Requests() { end_all(); }
 
@@ -120,26 +125,37 @@ void Requests::ask(const Question& question, Duration limit, Reply reply) {
   if (waiting_.size() >= kMaxWaiting) {
     return reply(End{Result::kNoAnswer, 0, "too many requests wait for " + name_});
   }
-  const auto place = add(question, limit, std::move(reply));
+  const auto place = add(question, std::move(reply), [this, limit](Place late) { finish(late, too_late(limit)); });
   (*place)->late.arm(limit);
   if (waiting_.size() == 1) send_first();
 }
 
 void Requests::ping(Duration limit, std::function<void(const End&)> told) {
+  const auto reply = [told = std::move(told)](const control::Answer& answer) {
+    if (const End* end = std::get_if<End>(&answer)) told(*end);
+  };
   const auto place =
-      add({KPL_ACTION_PING, 0, 0, {}}, limit, [told = std::move(told)](const control::Answer& answer) {
-        if (const End* end = std::get_if<End>(&answer)) told(*end);
-      });
+      add({KPL_ACTION_PING, 0, 0, {}}, reply, [this, limit](Place late) { on_ping_late(late, limit); });
   (*place)->once_sent = limit;
   if (waiting_.size() == 1) send_first();
 }
 
-Requests::Place Requests::add(const Question& question, Duration limit, Reply reply) {
+Requests::Place Requests::add(const Question& question, Reply reply, std::function<void(Place)> on_late) {
   const auto place = waiting_.emplace(waiting_.end());
-  *place = std::make_unique<Pending>(loop_, question, std::move(reply), [this, place, limit] {
-    finish(place, End{Result::kNoAnswer, 0, name_ + " has not answered within " + in_seconds(limit)});
-  });
+  *place = std::make_unique<Pending>(loop_, question, std::move(reply),
+                                     [place, on_late = std::move(on_late)] { on_late(place); });
   return place;
+}
+
+End Requests::too_late(Duration limit) const {
+  return {Result::kNoAnswer, 0, fmt::format("{} has not answered within {} s", name_, in_seconds(limit))};
+}
+
+/// When the host has stood still, the master's timers are over before the subsystem could run at all.
+void Requests::on_ping_late(Place place, Duration limit) {
+  Pending& ping = **place;
+  if (!std::exchange(ping.overtime, true)) return ping.late.arm(std::min(limit, kPingOvertime));
+  finish(place, ping.refused.empty() ? too_late(limit) : End{Result::kNoAnswer, 0, ping.refused});
 }
 
 void Requests::end_all() {
@@ -152,42 +168,59 @@ void Requests::end_all() {
   }
 }
 
-/// Until one is sent: those that cannot be are answered at once.
+/// Until one is sent: those that cannot be are answered at once. But a ping that the subsystem does not take has
+/// its time all the same.
 void Requests::send_first() {
   while (!ended_ && !waiting_.empty() && !waiting_.front()->sent) {
-    const std::string problem = send(*waiting_.front());
-    if (problem.empty()) return;
-    waiting_.front()->sent = false;
-    drop(waiting_.begin(), End{Result::kNoAnswer, 0, problem});
+    Pending& first = *waiting_.front();
+    const End end = send(first);
+    if (end.result == Result::kOk) return;
+    if (!first.once_sent || end.result != Result::kNoAnswer) {
+      drop(waiting_.begin(), end);
+      continue;
+    }
+    if (first.refused.empty()) first.late.arm(*first.once_sent);
+    first.refused = end.text;
+    if (waiting_.size() == 1) return send_again_.arm(kSendAgain);
+    waiting_.splice(waiting_.end(), waiting_, waiting_.begin());  // the others are told now
   }
 }
 
-std::string Requests::send(Pending& first) {
+End Requests::send(Pending& first) {
+  const auto refused = [](const std::string& why) { return End{Result::kNoAnswer, 0, why}; };
+  if (late_.size() >= kMaxLate) {
+    return refused(name_ + " has not answered its last " + std::to_string(kMaxLate) + " requests");
+  }
   kplreq request{};
-  first.socket = open_reply_socket(&request.kplhdr.retaddr);
-  if (!first.socket) return std::string("no socket for the answer: ") + strerror(errno);
+  Descriptor socket = open_reply_socket(&request.kplhdr.retaddr);
+  if (!socket) return {Result::kFailed, 0, std::string("no socket for the answer: ") + strerror(errno)};
   request.kplhdr.dversion = KPL_VERSION;
   request.subreq.object = KPL_OBJECT_SUBSYSTEM;
   request.subreq.action = first.question.action;
   request.subreq.parm1 = first.question.parm1;
   request.subreq.parm2 = first.question.parm2;
   name_.copy(request.subreq.objname, sizeof request.subreq.objname);
-  first.readable.emplace(loop_, first.socket.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
-  first.sent = true;
-  if (first.once_sent) first.late.arm(*first.once_sent);
   switch (channel_.send(request, first.question.data)) {
     case Channel::Sent::kDone:
-      return {};
-    case Channel::Sent::kFull:
-      return name_ + " does not read its requests";
-    case Channel::Sent::kGone:
       break;
+    case Channel::Sent::kFull:
+      return refused(name_ + " does not read its requests");
+    case Channel::Sent::kGone:
+      return refused(name_ + " has closed its request channel");
   }
-  return name_ + " has closed its request channel";
+  first.sent = true;
+  first.refused.clear();
+  first.overtime = false;
+  if (first.once_sent) first.late.arm(*first.once_sent);
+  first.socket = std::move(socket);
+  first.readable.emplace(loop_, first.socket.get(), EV_READ | EV_PERSIST, [this] { on_readable(); });
+  return {};
 }
 
-void Requests::on_readable() {
-  const int fd = waiting_.front()->socket.get();
+/// Until the action, which is given each packet of the subsystem's own, says true. The address is known to all who
+/// look for it; only the subsystem is listened to.
+template <class Action>
+void Requests::read_packets(int fd, Action action) const {
   for (int i = 0; i < kPacketsAtOnce; ++i) {
     char packet[kMaxPacket];
     alignas(cmsghdr) char control[CMSG_SPACE(sizeof(ucred))];
@@ -199,10 +232,32 @@ void Requests::on_readable() {
     message.msg_controllen = sizeof control;
     const ssize_t got = recvmsg(fd, &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
     if (got < 0) return;
-    // The address is known to all who look for it; only the subsystem is listened to.
     if ((message.msg_flags & MSG_TRUNC) != 0 || sender_of(&message) != pid_) continue;
-    if (on_packet(packet, static_cast<std::size_t>(got))) return;
+    if (action(packet, static_cast<std::size_t>(got))) return;
   }
+}
+
+void Requests::on_readable() {
+  read_packets(waiting_.front()->socket.get(),
+               [this](const char* packet, std::size_t length) { return on_packet(packet, length); });
+}
+
+/// It answers in order: what was asked before has been done with. This one too, with its last packet; until then
+/// the subsystem is told that nobody reads.
+void Requests::on_late_answer(std::list<Late>::iterator which) {
+  read_packets(which->socket.get(), [&](const char* packet, std::size_t length) {
+    kplhdr header{};
+    if (length < sizeof header) return false;
+    memcpy(&header, packet, sizeof header);
+    late_.erase(late_.begin(), which);
+    if (header.cont == KPL_CONT_END) {
+      late_.erase(which);
+    } else {
+      which->readable.reset();
+      shutdown(which->socket.get(), SHUT_RD);
+    }
+    return true;
+  });
 }
 
 bool Requests::on_packet(const char* packet, std::size_t length) {
@@ -232,9 +287,10 @@ void Requests::drop(Place which, const End& end) {
   waiting_.erase(which);
   dropped->readable.reset();
   if (dropped->sent && dropped->socket) {
-    shutdown(dropped->socket.get(), SHUT_RD);                  // the subsystem is told at once that nobody reads
-    if (late_.size() == kMaxLate) late_.erase(late_.begin());  // it reads its requests and never answers
-    late_.push_back(std::move(dropped->socket));
+    const auto late = late_.emplace(late_.end());
+    late->socket = std::move(dropped->socket);
+    late->readable.emplace(loop_, late->socket.get(), EV_READ | EV_PERSIST,
+                           [this, late] { on_late_answer(late); });
   }
   dropped->reply(end);
 }

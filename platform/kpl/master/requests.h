@@ -8,7 +8,6 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "control/control.h"
 #include "master/channel.h"
@@ -38,20 +37,27 @@ class Requests {
   /// `limit`: for the last answer, waiting for other requests included.
   void ask(const Question& question, Duration limit, Reply reply);
   /// Asks for nothing, after the requests that wait. Told the End of the answer; Result::kNoAnswer says why the
-  /// subsystem is taken for hung. `limit` counts from when it is sent: a request before it may take its own time.
+  /// subsystem is taken for hung, which it is only when it has had its time. `limit` counts from when the ping is
+  /// sent, or the channel first has no room for it: a request before it may take its own time.
   void ping(Duration limit, std::function<void(const control::End&)> told);
   /// Answers all that wait: the subsystem is gone, and nothing is asked any more.
   void end_all();
 
  private:
   struct Pending;
+  struct Late;
   using Place = std::list<std::unique_ptr<Pending>>::iterator;
 
-  Place add(const Question& question, Duration limit, Reply reply);
+  Place add(const Question& question, Reply reply, std::function<void(Place)> on_late);
+  control::End too_late(Duration limit) const;
+  void on_ping_late(Place place, Duration limit);
   void send_first();
-  /// Empty text: done.
-  std::string send(Pending& first);
+  /// Result::kNoAnswer: the subsystem does not take it, kFailed: the master cannot ask.
+  control::End send(Pending& first);
+  template <class Action>
+  void read_packets(int fd, Action action) const;
   void on_readable();
+  void on_late_answer(std::list<Late>::iterator which);
   /// True when this was the last packet.
   bool on_packet(const char* packet, std::size_t length);
   void finish(Place which, const control::End& end);
@@ -63,7 +69,8 @@ class Requests {
   const pid_t pid_;
   bool ended_ = false;
   std::list<std::unique_ptr<Pending>> waiting_;  // only the first one has been sent
-  std::vector<platform::Descriptor> late_;       // sockets whose answers may still come, but count no more
+  std::list<Late> late_;                         // of requests whose answers may still come, but count no more
+  Event send_again_;
 };
 
 }  // namespace kpl::master

@@ -12,7 +12,6 @@ namespace {
 
 using platform::Descriptor;
 
-constexpr int kAcceptsAtOnce = 16;       // before others are served again
 constexpr std::size_t kMaxSilent = 128;  // one more pushes out the oldest, so that nobody can lock others out
 
 /// A request without its type word, and the process id as extra data.
@@ -44,15 +43,15 @@ std::string end_packet(const kplhdr& header, short code) {
 
 }  // namespace
 
-void StatusConnections::accept_from(int listening) {
-  for (int i = 0; i < kAcceptsAtOnce; ++i) {
+bool StatusConnections::accept_from(int listening, int most) {
+  for (int i = 0; i < most; ++i) {
     Descriptor socket(accept4(listening, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
     if (!socket && (errno == ECONNABORTED || errno == EINTR)) continue;
     if (!socket && (errno == EMFILE || errno == ENFILE) && !silent_.empty()) {
       silent_.erase(silent_.begin());
       continue;
     }
-    if (!socket) return;
+    if (!socket) return errno == EAGAIN;
     if (serve(socket.get())) continue;
     if (silent_.size() == kMaxSilent) silent_.erase(silent_.begin());
     const Id id = ++last_;
@@ -62,6 +61,7 @@ void StatusConnections::accept_from(int listening) {
       if (serve(silent_.at(id).socket.get())) silent_.erase(id);
     });
   }
+  return true;
 }
 
 /// An answer is two packets, for which a new connection has room.

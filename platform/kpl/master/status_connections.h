@@ -22,8 +22,9 @@ class StatusConnections {
 
   StatusConnections(const Loop& loop, Lookup lookup) : loop_(loop), lookup_(std::move(lookup)) {}
 
-  /// Takes those that wait at a listening socket that does not block.
-  void accept_from(int listening);
+  /// Takes those that wait at a listening socket that does not block, `most` of them. False: there are no
+  /// descriptors for them now.
+  bool accept_from(int listening, int most);
 
  private:
   struct Connection {

@@ -11,6 +11,7 @@ namespace kpl::master {
 namespace {
 
 constexpr mode_t kForAll = 0666;
+constexpr int kAcceptsAtOnce = 16;  // before others are served again
 
 }  // namespace
 
@@ -18,9 +19,8 @@ StatusServer::StatusServer(const Loop& loop, const std::string& path, Lookup loo
     : loop_(loop),
       path_(path),
       connections_(loop, std::move(lookup)),
-      look_again_(loop, [this] { look_at_path(); }) {
+      accept_again_(loop, [this] { readable_->arm(); }) {
   listen_at_path();
-  look_again_.arm(platform::Listener::kLookAgain);
 }
 
 void StatusServer::listen_at_path() {
@@ -29,16 +29,21 @@ void StatusServer::listen_at_path() {
   if (listen(bound->fd(), SOMAXCONN) != 0) {
     throw platform::ListenError("cannot listen on " + path_ + ": " + strerror(errno));
   }
-  if (socket_) connections_.accept_from(socket_->fd());  // those that have found the old one are still served
+  if (socket_) connections_.accept_from(socket_->fd(), SOMAXCONN);  // who has found the old one is still served
   readable_.reset();
   socket_ = std::move(bound);
-  readable_.emplace(loop_, socket_->fd(), EV_READ | EV_PERSIST,
-                    [this] { connections_.accept_from(socket_->fd()); });
+  readable_.emplace(loop_, socket_->fd(), EV_READ | EV_PERSIST, [this] { on_readable(); });
+}
+
+/// A connection that could not be accepted stays in the queue and would wake the loop again and again.
+void StatusServer::on_readable() {
+  if (connections_.accept_from(socket_->fd(), kAcceptsAtOnce)) return;
+  readable_->disarm();
+  accept_again_.arm(platform::Listener::kAcceptPause);
 }
 
 /// What stands in the way is the control socket's to tell, which lies beside it.
-void StatusServer::look_at_path() {
-  look_again_.arm(platform::Listener::kLookAgain);
+void StatusServer::keep_in_place() {
   if (socket_->in_place()) return;
   try {
     listen_at_path();

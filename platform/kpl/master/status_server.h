@@ -15,22 +15,26 @@ class StatusServer {
  public:
   using Lookup = StatusConnections::Lookup;
 
-  /// Takes the place of a dead master's socket at `path`, and of what somebody puts there later. The socket goes
-  /// with the object. Throws platform::ListenError.
+  /// Takes the place of a dead master's socket at `path`. The socket goes with the object. Throws
+  /// platform::ListenError.
   StatusServer(const Loop& loop, const std::string& path, Lookup lookup);
   StatusServer(const StatusServer&) = delete;
   StatusServer& operator=(const StatusServer&) = delete;
 
+  /// Binds anew what somebody has removed or replaced. Only while the lock of the control socket is held: another
+  /// master's socket must not be taken.
+  void keep_in_place();
+
  private:
   void listen_at_path();
-  void look_at_path();
+  void on_readable();
 
   const Loop& loop_;
   const std::string path_;
   StatusConnections connections_;
   std::unique_ptr<platform::NamedSocket> socket_;
   std::optional<Event> readable_;
-  Event look_again_;
+  Event accept_again_;
 };
 
 }  // namespace kpl::master

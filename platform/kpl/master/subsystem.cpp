@@ -13,13 +13,13 @@ using control::End;
 using control::Result;
 using control::StopKind;
 
+constexpr std::size_t kMaxOutputs = 8;  // pipes that old runs have left open, and that of the last one
+
 std::string text_of_end(int status) {
   if (WIFEXITED(status)) return "exit status " + std::to_string(WEXITSTATUS(status));
   if (WIFSIGNALED(status)) return std::string("signal ") + strsignal(WTERMSIG(status));
   return "status " + std::to_string(status);
 }
-
-double in_seconds(Duration time) { return static_cast<double>(time.count()) / 1000; }
 
 /// For a time limit to be told to the requester: it counts from here, the packet's way not included.
 control::Wait wait_for(Duration time) { return {in_seconds(time)}; }
@@ -96,6 +96,11 @@ std::string Subsystem::try_launch() try {
 }
 
 platform::Descriptor Subsystem::open_output() {
+  if (outputs_.size() == kMaxOutputs) {
+    around_.log.warn("{}: the output of an old run is still open, with {} later ones: not read any more",
+                     definition_.name, kMaxOutputs - 1);
+    outputs_.pop_front();
+  }
   OutputLog& made = outputs_.emplace_back(around_.loop, around_.log, definition_.name, [this] {
     outputs_.remove_if([](const OutputLog& output) { return output.is_over(); });
   });
@@ -131,7 +136,9 @@ void Subsystem::on_ping_time() {
 
 void Subsystem::on_ping_answer(const End& end) {
   if (!process_) return;  // it has ended meanwhile
-  if (end.result != Result::kNoAnswer) return ping_later();
+  around_.log.debug("{}: ping: {}", definition_.name,
+                    end.result == Result::kFailed ? end.text : name_of(end.result));
+  if (end.result != Result::kNoAnswer || state_ != State::kActive) return ping_later();
   process_->hung = "hung (ping: " + end.text + ")";
   around_.log.error("{}: {}; SIGTERM", definition_.name, process_->hung);
   kill(pid(), SIGTERM);
