@@ -5,29 +5,32 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <csignal>
 #include <ctime>
+#include <exception>
 #include <system_error>
 
 namespace platform {
 namespace {
 
 constexpr std::size_t kMaxWaiting = 1024 * 1024;  // bytes
-constexpr std::size_t kPiece = 64 * 1024;         // bytes written at once
+constexpr std::size_t kPiece = PIPE_BUF;          // bytes written at once: a pipe that takes any takes so many
+constexpr int kLookAgain = 1000;                  // milliseconds, at what standard error is by then
 constexpr long kPatience = 500'000'000;           // nanoseconds, at the end
 constexpr long kSecond = 1'000'000'000;
 
-/// Blocks while standard error takes nothing, also where somebody has made it not block. What was written.
+/// Waits while standard error takes nothing, also where somebody has made it not block, and goes on with another
+/// file when that is put in its place meanwhile. What was written.
 std::size_t write_all(std::string_view text) {
   std::size_t done = 0;
   while (done < text.size()) {
+    pollfd writable{STDERR_FILENO, POLLOUT, 0};
+    if (poll(&writable, 1, kLookAgain) == 0) continue;
     const ssize_t written = ::write(STDERR_FILENO, text.data() + done, std::min(kPiece, text.size() - done));
     if (written >= 0) {
       done += static_cast<std::size_t>(written);
-    } else if (errno == EAGAIN) {
-      pollfd writable{STDERR_FILENO, POLLOUT, 0};
-      poll(&writable, 1, -1);
-    } else if (errno != EINTR) {
+    } else if (errno != EAGAIN && errno != EINTR) {
       break;
     }
   }
@@ -92,8 +95,11 @@ void* LogWriter::run(void* queue) noexcept {
   std::uint64_t missing = 0;
   const auto tell_missing = [&] {
     if (missing == 0) return;
-    const std::string line = q.lost_line(missing);
-    if (write_all(line) == line.size()) missing = 0;
+    try {
+      const std::string line = q.lost_line(missing);
+      if (write_all(line) == line.size()) missing = 0;
+    } catch (const std::exception&) {  // no memory: told with a later line
+    }
   };
   std::string lines;
   for (;;) {

@@ -27,9 +27,9 @@ class ZN_ANNOTATION(capability("mutex")) Mutex {
   /// False: others had it for so long.
   bool lock_within(int seconds) ZN_ANNOTATION(try_acquire_capability(true)) {
     timespec until{};
-    clock_gettime(CLOCK_REALTIME, &until);
+    clock_gettime(CLOCK_MONOTONIC, &until);
     until.tv_sec += seconds;
-    return pthread_mutex_timedlock(&mutex_, &until) == 0;
+    return pthread_mutex_clocklock(&mutex_, CLOCK_MONOTONIC, &until) == 0;
   }
   void unlock() ZN_ANNOTATION(release_capability()) { pthread_mutex_unlock(&mutex_); }
 
