@@ -179,7 +179,9 @@ class Reader {
   // ----------------------------------------------------------------------------------------- notifications
 
   SharedVoteResults votes(const FbVoteResults* results) {
-    if (results == nullptr || results->size() == 0 || !take(results->size() * sizeof(fb::ProviderId))) return {};
+    // The least that one can be: its offset in the vector, its own to its table's layout, the voter.
+    constexpr std::size_t kSmallest = 2 * sizeof(flatbuffers::uoffset_t) + sizeof(fb::ProviderId);
+    if (results == nullptr || results->size() == 0 || !take(results->size() * kSmallest)) return {};
     std::vector<VoteResult> values;
     values.reserve(results->size());
     for (const fb::VoteResult* r : *results) {
