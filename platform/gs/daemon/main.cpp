@@ -21,7 +21,7 @@ namespace {
 constexpr int kExitFailure = 1;
 constexpr int kExitBadOption = 2;
 
-/// Every client needs two descriptors.
+/// Every client needs three descriptors.
 void raise_descriptor_limit() {
   rlimit limit{};
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
