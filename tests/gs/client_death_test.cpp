@@ -156,6 +156,11 @@ TEST_F(ClientOfAFake, SetupThatFails_leavesTheDeadSessionToTellItsClients) {
   EXPECT_EQ(setup().rc, WYX_CONNECT_FAILED);
   closed.get();
   EXPECT_THAT(last_failure(), testing::StartsWith("hello-closed-104-"));
+  for (int i = 0; i < 20; ++i) {  // closed before Hello, or after it
+    auto turned_away = std::async(std::launch::async, [this] { fake.accept().send(wire::Answer{WYX_NO_MEMORY}); });
+    EXPECT_EQ(setup().rc, WYX_NO_MEMORY);
+    turned_away.get();
+  }
   dispatch_next();
   EXPECT_EQ(told(token), "died\n");
 }

@@ -80,14 +80,15 @@ Channel::Got Channel::send_packet(std::span<std::byte> header, std::span<const s
   }
 }
 
-Channel::Got Channel::send(const wire::ClientMessage& message) { return send(message, deadline()); }
-
-Channel::Got Channel::send(const wire::ClientMessage& message, Clock::time_point until) {
+Channel::Got Channel::send(const wire::ClientMessage& message) {
   const wire::Encoded encoded = wire::encode(message);
-  if (!encoded) return Got::kEnd;
-  for (std::size_t index = 0; index < encoded.packets(); ++index) {
+  return encoded ? send(encoded, deadline()) : Got::kEnd;
+}
+
+Channel::Got Channel::send(const wire::Encoded& message, Clock::time_point until) {
+  for (std::size_t index = 0; index < message.packets(); ++index) {
     std::array<std::byte, wire::kHeaderSize> header;
-    const auto slice = encoded.packet_for(index, -1, header);
+    const auto slice = message.packet_for(index, -1, header);
     const Got sent = send_packet(header, slice, until);
     if (sent != Got::kMessage) return sent;
   }
@@ -95,13 +96,17 @@ Channel::Got Channel::send(const wire::ClientMessage& message, Clock::time_point
 }
 
 Channel::Got Channel::ask(const wire::ClientMessage& question, wire::ServerMessage* answer) {
+  const wire::Encoded encoded = wire::encode(question);
+  if (!encoded) return Got::kEnd;
   const auto until = deadline();
-  const Got sent = send(question, until);
-  if (sent != Got::kMessage) return sent;
+  const Got sent = send(encoded, until);
+  if (sent == Got::kTimeout) return sent;
+  const bool ended = sent == Got::kEnd;  // then all that was said is here
   for (;;) {
-    if (!await(POLLIN, until)) return Got::kTimeout;
+    if (!ended && !await(POLLIN, until)) return Got::kTimeout;
     const Got got = receive(answer);
     if (got != Got::kNothing) return got;
+    if (ended) return Got::kEnd;
   }
 }
 

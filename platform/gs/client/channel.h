@@ -44,7 +44,7 @@ class Channel {
 
   /// kMessage: it is sent. Else kTimeout or kEnd.
   Got send(const wire::ClientMessage& message);
-  /// Sends and receives, both within the limit.
+  /// Sends and receives, both within the limit. What the other side said before it closed is an answer too.
   Got ask(const wire::ClientMessage& question, wire::ServerMessage* answer);
   /// What is there, without waiting; kNothing: no whole message.
   Got receive(wire::ServerMessage* message);
@@ -57,7 +57,7 @@ class Channel {
 
   Clock::time_point deadline() const { return Clock::now() + std::chrono::seconds(limit_); }
   bool await(short events, Clock::time_point until) const;
-  Got send(const wire::ClientMessage& message, Clock::time_point until);
+  Got send(const wire::Encoded& message, Clock::time_point until);
   Got send_packet(std::span<std::byte> header, std::span<const std::byte> slice, Clock::time_point until);
 
   Descriptor fd_;
