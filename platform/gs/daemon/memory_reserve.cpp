@@ -1,19 +1,19 @@
 #include "daemon/memory_reserve.h"
 
+#include <atomic>
 #include <cstdlib>
 #include <new>
-#include <utility>
 
 namespace gs::daemon::memory_reserve {
 namespace {
 
 constexpr std::size_t kBytes = 16 * 1024 * 1024;  // far more than any one event needs; never touched
-void* volatile reserve = nullptr;
+std::atomic<void*> reserve = nullptr;             // any thread may run out of memory
 
 void give_way() {
-  if (reserve == nullptr) throw std::bad_alloc();
-  free(reserve);
-  reserve = nullptr;
+  void* const taken = reserve.exchange(nullptr);
+  if (taken == nullptr) throw std::bad_alloc();
+  free(taken);
 }
 
 }  // namespace
@@ -26,8 +26,8 @@ void hold() {
 bool taken() { return reserve == nullptr; }
 
 bool refill() {
-  if (reserve == nullptr) reserve = malloc(kBytes);
-  return reserve != nullptr;
+  if (taken()) free(reserve.exchange(malloc(kBytes)));
+  return !taken();
 }
 
 }  // namespace gs::daemon::memory_reserve

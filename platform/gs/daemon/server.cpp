@@ -21,6 +21,7 @@ constexpr int kSendBuffer = 1024 * 1024;  // bytes; the system may give less
 constexpr timeval kAtOnce = {0, 0};       // after the descriptors that are ready, before the next are looked at
 constexpr timeval kAcceptPause = {0, 100'000};    // when descriptors have run out
 constexpr timeval kFarewellLimit = {0, 500'000};  // for clients to take what waits for them
+constexpr Duration kBetweenTrims{1'000};          // of the heap, while memory is short
 constexpr int kAcceptsAtOnce = 64;                // before the connected are served again
 constexpr int kLastPackets = 64;                  // that a process has left behind
 constexpr std::size_t kOwnDescriptors = 32;       // socket, log, loop and the like
@@ -31,6 +32,10 @@ std::uint64_t random_number() {
   std::uint64_t value = 0;
   if (getrandom(&value, sizeof value, 0) != sizeof value) throw std::system_error(errno, std::generic_category());
   return value;
+}
+
+void add(event* what, const timeval* after = nullptr) {
+  if (event_add(what, after) != 0) throw std::bad_alloc();
 }
 
 /// As much as the system allows: past its limit for everyone where we may, else up to it.
@@ -90,13 +95,19 @@ void Server::call_connection(evutil_socket_t, short, void* connection) {
   self->arm_deadline();
 }
 
-/// While the reserve is taken, each turn of the loop gives some memory back.
+/// While the reserve is taken, some memory is given back every now and then, and each turn of the loop tries to
+/// set the reserve aside again.
 void Server::tend_memory() {
   if (!memory_reserve::taken()) return;
   const bool was_short = std::exchange(short_of_memory_, true);
   if (!was_short) log_->error("out of memory: clients may be closed, and nothing new is taken in");
-  malloc_trim(0);
+  const bool trims = now() >= next_trim_;
+  if (trims) {
+    malloc_trim(0);
+    next_trim_ = now() + kBetweenTrims;
+  }
   short_of_memory_ = !memory_reserve::refill();
+  if (short_of_memory_ && !trims) return;
   try {
     sessions_.set_short_of_memory(short_of_memory_);
   } catch (const std::exception& error) {
@@ -121,20 +132,16 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
                  .drain_time = options.drain_time,
                  .limits = limits_of(options),
                  .engine = options.engine},
-                {*this, ordering_, now, random_number, log_, [this] { event_add(continue_.get(), &kAtOnce); },
+                {*this, ordering_, now, random_number, log_, [this] { add(continue_.get(), &kAtOnce); },
                  [] { malloc_trim(0); }}),
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
   memory_reserve::hold();
   const auto on_stop = [](evutil_socket_t signal, short, void* self) {
-    static_cast<Server*>(self)->stop(strsignal(static_cast<int>(signal)));
+    auto* server = static_cast<Server*>(self);
+    server->guarded(0, [=] { server->stop(strsignal(static_cast<int>(signal))); });
   };
-  accept_again_ = make_event(
-      -1, 0,
-      [](evutil_socket_t, short, void* self) {
-        event_add(static_cast<Server*>(self)->acceptable_.get(), nullptr);
-      },
-      this);
+  accept_again_ = make_event(-1, 0, call<&Server::accept_again>, this);
   deadline_ = make_event(-1, 0, call<&Server::on_deadline>, this);
   continue_ = make_event(-1, 0, call<&Server::on_continue>, this);
   farewell_over_ = make_event(
@@ -143,8 +150,8 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       this);
   terminated_ = make_event(SIGTERM, EV_SIGNAL | EV_PERSIST, on_stop, this);
   interrupted_ = make_event(SIGINT, EV_SIGNAL | EV_PERSIST, on_stop, this);
-  event_add(terminated_.get(), nullptr);
-  event_add(interrupted_.get(), nullptr);
+  add(terminated_.get());
+  add(interrupted_.get());
   start_accepting();
   constexpr timeval kLookAgain = {Listener::kLookAgain.count(), 0};
   look_again_.emplace(
@@ -164,7 +171,7 @@ Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::
     : server_(server),
       action_(std::move(action)),
       event_(server.make_event(fd, static_cast<short>(what | EV_PERSIST), call, this)) {
-  event_add(event_.get(), every);
+  add(event_.get(), every);
 }
 
 void Server::Repeated::call(evutil_socket_t, short, void* self) {
@@ -181,18 +188,25 @@ void Server::repeat(std::chrono::milliseconds every, std::function<void()> actio
 // ---------------------------------------------------------------------------------------------- new connections
 
 void Server::start_accepting() {
-  acceptable_ = make_event(listener_.fd(), EV_READ | EV_PERSIST, call<&Server::on_acceptable>, this);
-  event_add(acceptable_.get(), nullptr);
+  EventPtr acceptable = make_event(listener_.fd(), EV_READ | EV_PERSIST, call<&Server::on_acceptable>, this);
+  add(acceptable.get());
+  acceptable_ = std::move(acceptable);
 }
 
-/// Somebody may have removed or replaced the socket; who is connected does not notice, new clients would.
+void Server::accept_again() {
+  if (acceptable_ && event_add(acceptable_.get(), nullptr) != 0) acceptable_.reset();  // for look_at_path to make
+}
+
+/// Somebody may have removed or replaced the socket; who is connected does not notice, new clients would. Where an
+/// earlier look could not start to accept, this one does.
 void Server::look_at_path() {
+  if (stopping_) return;
   const auto leave_old = [this] {
     for (int i = 0; i < SOMAXCONN && accept_one(); ++i) {  // those that have found it are still served
     }
     acceptable_.reset();
   };
-  if (listener_.keep_in_place(*log_, leave_old)) start_accepting();
+  if (listener_.keep_in_place(*log_, leave_old) || !acceptable_) start_accepting();
 }
 
 void Server::on_acceptable() {
@@ -214,8 +228,9 @@ bool Server::accept_one() {
 void Server::pause_accepting(int error) {
   sessions_.log_about({}, spdlog::level::warn,
                       std::string("cannot accept more connections for now: ") + strerror(error));
+  if (!acceptable_) return;
   event_del(acceptable_.get());
-  event_add(accept_again_.get(), &kAcceptPause);
+  if (event_add(accept_again_.get(), &kAcceptPause) != 0) acceptable_.reset();  // for look_at_path to make
 }
 
 void Server::add_connection(Descriptor socket) {
@@ -236,7 +251,7 @@ void Server::add_connection(Descriptor socket) {
   connection.connected = time_since_boot();
   try {
     connection.readable = make_event(fd, EV_READ | EV_PERSIST, call_connection<&Server::on_readable>, &connection);
-    if (event_add(connection.readable.get(), nullptr) != 0) throw std::bad_alloc();
+    add(connection.readable.get());
     sessions_.opened(id, *peer);
   } catch (const std::exception& error) {
     log_->error("connection (pid {}, uid {}): closed: {}", peer->pid, peer->uid, error.what());
@@ -282,7 +297,7 @@ bool Server::watch_process(ConnectionId id) {
   connection.process = std::move(*process);
   connection.process_ended =
       make_event(connection.process.get(), EV_READ, call_connection<&Server::on_process_ended>, &connection);
-  event_add(connection.process_ended.get(), nullptr);
+  add(connection.process_ended.get());
   return true;
 }
 
@@ -316,7 +331,7 @@ void Server::wait_writable(ConnectionId id) {
     connection.writable =
         make_event(connection.socket.get(), EV_WRITE, call_connection<&Server::on_writable>, &connection);
   }
-  event_add(connection.writable.get(), nullptr);
+  add(connection.writable.get());
 }
 
 void Server::close(ConnectionId id) { connections_.erase(id); }
@@ -340,15 +355,16 @@ void Server::arm_deadline() {
   const auto wait = std::max(*next - now(), Duration::zero());
   const timeval time = {static_cast<time_t>(wait.count() / 1000),
                         static_cast<suseconds_t>(wait.count() % 1000 * 1000)};
-  event_add(deadline_.get(), &time);
+  if (event_add(deadline_.get(), &time) != 0) armed_.reset();  // the next turn tries again
 }
 
 void Server::stop(const std::string& why) {
   if (stopping_) return;
   log_->info("stopping on {} with {} clients", why, sessions_.sessions());
   stopping_ = true;
+  add(farewell_over_.get(), &kFarewellLimit);  // first: whatever fails from here on, it ends
   stopping_action_();
-  event_del(acceptable_.get());
+  if (acceptable_) event_del(acceptable_.get());
   event_del(accept_again_.get());
   event_del(deadline_.get());
   event_del(continue_.get());
@@ -358,7 +374,6 @@ void Server::stop(const std::string& why) {
     if (connection.process_ended) event_del(connection.process_ended.get());
   }
   sessions_.say_farewell();
-  event_add(farewell_over_.get(), &kFarewellLimit);
   finish_when_drained();
 }
 

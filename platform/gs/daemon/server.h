@@ -99,6 +99,7 @@ class Server : private Transport {
 
   void look_at_path();
   void start_accepting();
+  void accept_again();
   bool accept_one();
   void add_connection(Descriptor socket);
   void pause_accepting(int error);
@@ -140,6 +141,7 @@ class Server : private Transport {
   bool stopping_ = false;
   bool told_unwatched_ = false;  // that the process of a peer cannot be watched
   bool short_of_memory_ = false;
+  Time next_trim_{};
   std::vector<std::byte> packet_;  // of whatever connection is being read
 };
 

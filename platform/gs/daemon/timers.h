@@ -35,15 +35,18 @@ class Timers {
     if (actions_.empty()) return std::nullopt;
     return actions_.begin()->first.when;
   }
-  /// Runs what is due at `now`, earliest first, including what these actions arm for no later than `now`.
+  /// Runs what is due at `now`, earliest first, including what these actions arm for no later than `now`; a few at
+  /// a time, so that others are served in between: `next` says whether more is due.
   void run(Time now) {
-    while (!actions_.empty() && actions_.begin()->first.when <= now) {
+    for (int i = 0; i < kAtOnce && !actions_.empty() && actions_.begin()->first.when <= now; ++i) {
       auto due = actions_.extract(actions_.begin());
       due.mapped()();
     }
   }
 
  private:
+  static constexpr int kAtOnce = 16;
+
   std::map<Id, Action> actions_;
   std::uint64_t last_number_ = 0;
 };
