@@ -206,8 +206,11 @@ TEST(DaemonBounds, UserOrAllOverTheirBound_LoseWhoHoldsTheMost_RootAndOtherUsers
   talk_to_itself(other, "other", 48);
   talk_to_itself(modest, "modest", 16);
   ASSERT_EQ(greedy.join(1, 1, "greedy"), WYX_OK);
-  for (int i = 0; i < 100 && !greedy.closed(); ++i) greedy.call(MessageRequest{1, {}, Bytes(60'000, 'm')});
-  EXPECT_TRUE(greedy.closed() && daemon.logged("its user is over user-queue-bound"));
+  for (int i = 0; i < 70; ++i) greedy.call(MessageRequest{1, {}, Bytes(60'000, 'm')});
+  EXPECT_FALSE(greedy.closed()) << "it may be about to read";
+  daemon.pass(1s);
+  greedy.call(MessageRequest{1, {}, "one more"});
+  EXPECT_TRUE(greedy.closed() && daemon.logged("its user is over user-queue-bound and it reads nothing"));
 
   limits.total_queue_bound = 8 << 20;
   MemoryDaemon full({1, 1 << 20}, limits);
@@ -216,6 +219,7 @@ TEST(DaemonBounds, UserOrAllOverTheirBound_LoseWhoHoldsTheMost_RootAndOtherUsers
   talk_to_itself(served, "root", 8);
   talk_to_itself(most, "most", 48);
   talk_to_itself(less, "less", 32);
+  full.pass(1s);
   talk_to_itself(last, "last", 32);
   EXPECT_TRUE(most.closed() && full.logged("all are over total-queue-bound"));
   EXPECT_FALSE(root.closed() || other.closed() || modest.closed());
@@ -243,6 +247,55 @@ TEST(DaemonBounds, BurstForManyReaders_CountsOnceForTheirUser) {
     EXPECT_THAT(reader->events().size(), testing::Ge(32u));
   }
   EXPECT_TRUE(daemon.layer.drained());
+}
+
+// To close one of several who are equally behind frees nothing: the others keep their drain time.
+TEST(DaemonBounds, ReadersOfOneBurstWhoAllStall_LoseOne_AndTheRestAtTwiceTheBoundOnly) {
+  ClientLimits limits;
+  limits.user_queue_bound = 3 << 20;
+  MemoryDaemon daemon({1, 1 << 20}, limits);
+  MemoryClient sender(daemon, 0);
+  ASSERT_EQ(sender.join(1, 1), WYX_OK);
+  std::vector<std::unique_ptr<MemoryClient>> readers;
+  for (std::int16_t i = 2; i < 7; ++i) {
+    readers.push_back(std::make_unique<MemoryClient>(daemon));
+    ASSERT_EQ(readers.back()->join(1, i), WYX_OK);
+    readers.back()->event_wire().full = true;
+  }
+  const auto closed_after = [&](int messages) {
+    for (int i = 0; i < messages; ++i)
+      EXPECT_EQ(sender.call(MessageRequest{1, {}, Bytes(1024 * 64, 'm')}), WYX_OK);
+    return std::ranges::count_if(readers, [](const auto& reader) { return reader->closed(); });
+  };
+  EXPECT_EQ(closed_after(56), 0);
+  daemon.pass(1s);
+  EXPECT_EQ(closed_after(1), 1);
+  daemon.pass(1s);
+  EXPECT_EQ(closed_after(1), 1);
+  EXPECT_EQ(closed_after(40), 5);
+  EXPECT_FALSE(sender.closed());
+}
+
+TEST(DaemonBounds, MessagesThatAreNeverFinished_AreBoundedInTimeAndInBytesOfTheirUser) {
+  ClientLimits limits;
+  limits.user_queue_bound = 1 << 20;
+  MemoryDaemon daemon({1, 1 << 20}, limits);
+  const auto packets =
+      wire::packets_of(wire::ClientMessage(wire::Call{StateChangeRequest{1, {}, Bytes(200'000, 's')}}));
+  MemoryClient slow(daemon, 2), first(daemon, 1), second(daemon, 1);
+  daemon.layer.received(slow.request, packets[0]);
+  daemon.pass(9'999ms);
+  daemon.layer.received(slow.request, packets[1]);
+  EXPECT_FALSE(slow.closed());
+  daemon.pass(1ms);
+  EXPECT_TRUE(slow.closed() && daemon.logged("has not finished its message in time"));
+  for (const ConnectionId id : {first.request, second.request}) {
+    for (std::size_t i = 0; i < 3; ++i) daemon.layer.received(id, packets[i]);
+  }
+  EXPECT_TRUE(second.closed() && daemon.logged("its user has too many messages half sent"));
+  daemon.layer.received(first.request, packets[3]);
+  daemon.pass(3600s);
+  EXPECT_FALSE(first.closed());
 }
 
 TEST(DaemonBounds, SessionsAndSilentConnectionsOverTheirLimit_AreToldSo_RootIsLetIn) {

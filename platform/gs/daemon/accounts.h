@@ -31,7 +31,8 @@ class Account {
   }
 
   std::size_t connections = 0;
-  std::size_t fresh = 0;  // those that belong to no session yet
+  std::size_t fresh = 0;          // those that are no part of a session with both its channels yet
+  std::size_t half_received = 0;  // bytes of messages that are not yet there to their last packet
   std::size_t sessions = 0;
 
  private:
@@ -45,7 +46,7 @@ struct ClientLimits {
   static constexpr std::size_t kNone = std::numeric_limits<std::size_t>::max() / 2;
 
   std::size_t max_sessions = kNone;
-  std::size_t user_sessions = 0;          // of a user but root; 0: half of all
+  std::size_t user_sessions = 0;          // of a user but root; 0: a quarter of all
   std::size_t root_sessions = 0;          // of all, for root alone
   std::size_t descriptors = kNone;        // for connections, and one for each session
   std::size_t user_queue_bound = kNone;   // bytes
@@ -65,22 +66,27 @@ class Accounts {
   const char* problem_with_connection(const Account& account) const;
   /// Why this user can have no further session; null: it can.
   const char* problem_with_session(const Account& account) const;
+  /// Why what is counted already of a message cannot stay; null: it can.
+  const char* problem_with_half_received(const Account& account) const;
 
   /// Bytes that wait for all clients.
   std::size_t waiting() const { return waiting_of_root_ + waiting_of_others_; }
-  /// Whose clients together have more waiting than may: those of one user, of all but root, of root.
+  /// Whose clients together have more waiting than may: those of one user, of all but root, of root. `user`: the
+  /// one, or the one of all but root with the most; null: any.
   struct Overdraft {
     enum class Of { kNobody, kUser, kAllButRoot, kRoot } of = Of::kNobody;
     const Account* user = nullptr;
     bool covers(const Account& account) const {
-      return of == Of::kUser ? &account == user : account.is_root() == (of == Of::kRoot);
+      return user != nullptr ? &account == user : account.is_root() == (of == Of::kRoot);
     }
   };
-  Overdraft overdraft() const;
+  /// Over so many times the bounds.
+  Overdraft overdraft(std::size_t times) const;
 
  private:
   static constexpr std::size_t kMaxFresh = 256;  // of a user
   static constexpr std::size_t kRootPart = 8;    // of what may wait in all, one part is root's
+  static constexpr std::size_t kInputPart = 4;   // of user_queue_bound, for messages half received
   static constexpr std::size_t kPerSession = 3;  // descriptors: two channels and the process
 
   friend class ConnectionShare;
@@ -106,13 +112,15 @@ class ConnectionShare {
   ConnectionShare& operator=(const ConnectionShare&) = delete;
 
   Account& account() const { return account_; }
-  /// The connection belongs to a session now.
+  /// Its session has both channels now.
   void settle();
+  void set_half_received(std::size_t bytes);
 
  private:
   Accounts& accounts_;
   Account& account_;
   bool fresh_ = true;
+  std::size_t half_received_ = 0;
 };
 
 /// A session, counted for its user.

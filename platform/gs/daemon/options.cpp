@@ -110,7 +110,7 @@ constexpr Setting kSettings[] = {
      set_size<&Options::total_queue_bound, kMinQueueBound, kMaxQueueBound>},
     {"max-sessions", "N", true, "Sessions at a time, as far as descriptors allow",
      set_size<&Options::max_sessions, 1, kMaxSessions>},
-    {"user-sessions", "N", true, "Sessions of one user at a time (0: half of all)",
+    {"user-sessions", "N", true, "Sessions of one user at a time (0: a quarter of all)",
      set_size<&Options::user_sessions, 0, kMaxSessions>},
     {"root-sessions", "N", true, "Sessions of all that are kept for root",
      set_size<&Options::root_sessions, 0, kMaxSessions>},

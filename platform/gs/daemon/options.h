@@ -25,7 +25,7 @@ struct Options {
   std::size_t total_queue_bound =
       1024 * 1024 * 1024;  // bytes that may wait for all clients, one eighth for root's
   std::size_t max_sessions = 4096;
-  std::size_t user_sessions = 0;   // of a user but root; 0: half of max_sessions
+  std::size_t user_sessions = 0;   // of a user but root; 0: a quarter of max_sessions
   std::size_t root_sessions = 16;  // of max_sessions, for root alone
   Limits engine;
   spdlog::level::level_enum log_level = spdlog::level::info;

@@ -74,6 +74,8 @@ class OutQueue {
   bool empty() const { return waiting_.empty(); }
   /// Of the messages that are not yet sent to their last packet.
   std::size_t bytes() const { return bytes_; }
+  /// Packets, ever.
+  std::uint64_t sent() const { return sent_; }
 
  private:
   static std::size_t size_of(const Item& item) {
@@ -95,6 +97,7 @@ class OutQueue {
       const auto sent = transport.send_packet(to, header, slice);
       if (sent != Transport::Sent::kDone) return sent == Transport::Sent::kFull ? Sent::kFull : Sent::kGone;
       ++next_packet_;
+      ++sent_;
     }
     next_packet_ = 0;
     return Sent::kAll;
@@ -115,6 +118,7 @@ class OutQueue {
   std::deque<Item> waiting_;
   std::size_t next_packet_ = 0;  // of the first
   std::size_t bytes_ = 0;
+  std::uint64_t sent_ = 0;
 };
 
 }  // namespace gs::daemon

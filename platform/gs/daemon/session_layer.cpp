@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "common/printable.h"
 #include "engine/text.h"
 #include "gscl/GSUtils.h"
 
@@ -68,7 +69,9 @@ void SessionLayer::received(ConnectionId id, std::span<const std::byte> packet) 
   if (connection == nullptr) return;
   std::string error;
   if (!connection->in.add(packet, &error)) return end(id, End::kFault, "malformed: " + error);
-  if (!connection->in.complete()) return;
+  if (!connection->in.complete()) return on_part_of_message(id, *connection);
+  timers_.cancel(connection->message_limit);
+  connection->share.set_half_received(0);
   const auto message = connection->in.take_client_message(&error);
   if (!message) return end(id, End::kFault, "malformed: " + error);
   on_message(id, *connection, *message);
@@ -78,7 +81,9 @@ void SessionLayer::received(ConnectionId id, std::span<const std::byte> packet) 
 void SessionLayer::writable(ConnectionId id) {
   Connection* connection = find(id);
   if (connection == nullptr) return;
+  const std::uint64_t sent = connection->out.sent();
   if (!handle(id, connection->out.flush(env_.transport, id, kFlushShare))) return;
+  if (connection->out.sent() != sent) connection->progressed = env_.now();
   if (!connection->out.empty()) env_.transport.wait_writable(id);
   watch_bound(id, *connection);
   note_freed();
@@ -92,7 +97,7 @@ void SessionLayer::set_short_of_memory(bool is_short) {
   recent_.drop();
   ConnectionId id = 0;
   for (const auto of : {Accounts::Overdraft::Of::kAllButRoot, Accounts::Overdraft::Of::kRoot}) {
-    const Connection* most = most_waiting({of}, &id);
+    const Connection* most = most_waiting({of}, false, &id);
     if (most == nullptr || most->out.bytes() < kWorthClosing) continue;
     return end(id, End::kFault, "out of memory, and it has the most to read");
   }
@@ -118,6 +123,18 @@ bool SessionLayer::drained() const {
 }
 
 // ---------------------------------------------------------------------------------------------------- messages
+
+/// It comes to its end in time, and a user has so much of them and no more.
+void SessionLayer::on_part_of_message(ConnectionId id, Connection& connection) {
+  connection.share.set_half_received(connection.in.held());
+  if (const char* problem = accounts_.problem_with_half_received(connection.share.account())) {
+    return end(id, End::kFault, problem);
+  }
+  if (connection.message_limit.number != 0) return;
+  connection.message_limit = timers_.arm(env_.now() + settings_.handshake_limit, [this, id] {
+    end(id, End::kFault, "has not finished its message in time");
+  });
+}
 
 void SessionLayer::on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message) {
   switch (connection.channel) {
@@ -169,10 +186,10 @@ void SessionLayer::on_hello(ConnectionId id, Connection& connection, const wire:
   Session& session = sessions_.try_emplace(number, number, account, *this).first->second;
   connection.channel = Channel::kRequest;
   connection.session = number;
-  connection.share.settle();
   session.request = id;
   session.cookie = env_.random();
   session.program = printable(hello.program);
+  session.program.resize(platform::utf8_length(std::string_view(session.program).substr(0, kProgramName)));
   session.attach_limit = timers_.arm(env_.now() + settings_.handshake_limit, [this, number] {
     end_session(number, End::kFault, "did not attach its event channel in time");
   });
@@ -190,6 +207,7 @@ void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire
   connection.channel = Channel::kEvent;
   connection.session = attach.session_number;
   connection.share.settle();
+  find(session->request)->share.settle();
   session->event = id;
   log_about(connection.peer.uid, spdlog::level::info, describe(connection) + ": connected");
   answer(id, WYX_OK);
@@ -213,7 +231,12 @@ void SessionLayer::on_query_node(ConnectionId id) {
 
 void SessionLayer::send_ping(std::uint64_t session, std::uint64_t ping) {
   const Session* found = find_session(session);
-  if (found != nullptr && found->event != 0) send(found->event, wire::Ping{ping});
+  if (found == nullptr || found->event == 0) return;
+  try {
+    send(found->event, wire::Ping{ping});
+  } catch (const std::exception& error) {
+    end_session(session, End::kFault, std::string("it could not be sent its ping: ") + error.what());
+  }
 }
 
 void SessionLayer::responding_changed(std::uint64_t session, bool responding) {
@@ -245,6 +268,7 @@ void SessionLayer::ordered(const Event& event) {
     begin_anew(error.what());
   }
   enforce_bounds();
+  note_freed();
 }
 
 // What a request brings its own client is written before the answer, the rest after it: a client that wakes for
@@ -263,8 +287,8 @@ void SessionLayer::deliver(const Event& event, const Outcome& outcome) {
   if (accounts_.waiting() == 0) recent_.drop();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
   if (!engine_->busy() || continue_due_) return;
-  continue_due_ = true;
   env_.continue_soon();
+  continue_due_ = true;
 }
 
 void SessionLayer::continue_work() {
@@ -283,10 +307,7 @@ void SessionLayer::begin_anew(const std::string& why) {
     drop(request);
     if (event != 0) drop(event);
   }
-  for (auto& [group, of_group] : phase_timers_) {
-    timers_.cancel(of_group.timer);
-    timers_.cancel(of_group.warning);
-  }
+  for (auto& [group, of_group] : phase_timers_) timers_.cancel(of_group.timer);
   phase_timers_.clear();
   engine_ = std::make_unique<Engine>(settings_.engine);
   return_memory_soon();
@@ -360,12 +381,9 @@ void SessionLayer::arm(const TimerRequest& timer) {
   if (phase_timers_.size() >= sweep_timers_at_) drop_stale_timers();
   PhaseTimer& of_group = phase_timers_[timer.id.group];
   timers_.cancel(of_group.timer);
-  timers_.cancel(of_group.warning);
-  of_group.phase = timer.id;
+  of_group = {timer.id, {}, env_.now()};
   const std::chrono::seconds limit(timer.seconds);
-  if (limit.count() == 0 || limit > kLongPhase) {
-    of_group.warning = timers_.arm(env_.now() + kLongPhase, [this, id = timer.id] { warn_of_missing_votes(id); });
-  }
+  if (limit.count() == 0 || limit > kLongPhase) look_at_phases_later();
   if (limit.count() == 0) return;
   of_group.timer = timers_.arm(env_.now() + limit, [this, id = timer.id] {
     phase_timers_.erase(id.group);
@@ -373,25 +391,50 @@ void SessionLayer::arm(const TimerRequest& timer) {
   });
 }
 
-void SessionLayer::warn_of_missing_votes(const TimerId& phase) {
-  if (!engine_->awaits(phase)) return;
-  const MissingVotes missing = engine_->missing_votes(phase.group, kNamedVoters);
-  if (missing.count == 0) return;
+void SessionLayer::look_at_phases_later() {
+  if (look_at_phases_.number != 0) return;
+  look_at_phases_ = timers_.arm(env_.now() + kBetweenPhaseLooks, [this] { look_at_phases(); });
+}
+
+/// One timer for all phases: most of them end long before anybody needs to be warned of them.
+void SessionLayer::look_at_phases() {
+  look_at_phases_ = {};
+  drop_stale_timers();
+  if (!phase_timers_.empty()) look_at_phases_later();
+  for (auto& [group, of_group] : phase_timers_) {
+    const Duration waited = env_.now() - of_group.since;
+    if (waited < kLongPhase || std::exchange(of_group.warned_of, true)) continue;
+    warn_of_missing_votes(group, waited);
+  }
+}
+
+void SessionLayer::warn_of_missing_votes(const std::string& group, Duration waited) {
+  const MissingVotes missing = engine_->missing_votes(group, kNamedVoters);
+  if (missing.voters.empty()) return;
   std::string names;
   for (const MissingVoter& voter : missing.voters) names += (names.empty() ? "" : ", ") + describe(voter);
   if (missing.count > missing.voters.size()) {
     names += " and " + std::to_string(missing.count - missing.voters.size()) + " more";
   }
-  env_.log->warn("group \"{}\": phase {} of a {} protocol has waited {} s for the votes of {}",
-                 printable(phase.group), missing.phase, missing.protocol, kLongPhase.count(), names);
+  const Connection* first = connection_of(missing.voters.front());
+  log_about(first == nullptr ? std::nullopt : std::optional(first->peer.uid), spdlog::level::warn,
+            "group \"" + printable(group) + "\": phase " + std::to_string(missing.phase) + " of a " +
+                missing.protocol + " protocol has waited " + std::to_string(waited.count() / 1000) +
+                " s for the votes of " + names);
+}
+
+/// Null: it is no client of this daemon's.
+const SessionLayer::Connection* SessionLayer::connection_of(const MissingVoter& voter) {
+  if (voter.to.session.node != settings_.node_number) return nullptr;
+  const Session* session = find_session(voter.to.session.number);
+  return session == nullptr ? nullptr : find(session->request);
 }
 
 std::string SessionLayer::describe(const MissingVoter& voter) {
   const std::string provider = "\"" + printable(voter.local_name) + "\" (" + std::to_string(voter.id.instance) +
                                "@" + std::to_string(voter.id.node);
-  const Session* session = find_session(voter.to.session.number);
-  if (voter.to.session.node != settings_.node_number || session == nullptr) return provider + ")";
-  return provider + ", " + describe(*find(session->request)) + ")";
+  const Connection* connection = connection_of(voter);
+  return provider + (connection == nullptr ? ")" : ", " + describe(*connection) + ")");
 }
 
 /// A phase may end hours before its limit: without this, groups that come and go would leave their timers behind.
@@ -400,7 +443,6 @@ void SessionLayer::drop_stale_timers() {
     PhaseTimer ended = of_group.second;
     if (engine_->awaits(ended.phase)) return false;
     timers_.cancel(ended.timer);
-    timers_.cancel(ended.warning);
     return true;
   });
   sweep_timers_at_ = std::max(kFewTimers, 2 * phase_timers_.size());
@@ -420,7 +462,10 @@ bool SessionLayer::put(ConnectionId to, OutQueue::Item item, bool at_once) {
   }
   if (connection->out.empty()) return true;
   queued_ = true;
-  if (!waited) env_.transport.wait_writable(to);
+  if (!waited) {
+    connection->progressed = env_.now();
+    env_.transport.wait_writable(to);
+  }
   watch_bound(to, *connection);
   return find(to) != nullptr;
 }
@@ -445,9 +490,18 @@ void SessionLayer::watch_bound(ConnectionId id, Connection& connection) {
   connection.drain_limit = timers_.arm(env_.now() + settings_.drain_time, [this, id] { drain_time_over(id); });
 }
 
+/// Before it is judged: what it has made room for counts. Null: it is closed.
+SessionLayer::Connection* SessionLayer::flushed(ConnectionId id) {
+  try {
+    writable(id);
+  } catch (const std::exception& error) {
+    end(id, End::kFault, std::string("it could not be sent its notifications: ") + error.what());
+  }
+  return find(id);
+}
+
 void SessionLayer::drain_time_over(ConnectionId id) {
-  writable(id);  // what it has made room for counts
-  Connection* connection = find(id);
+  Connection* connection = flushed(id);
   if (connection == nullptr) return;
   connection->drain_limit = {};
   const std::size_t bytes = connection->out.bytes();
@@ -455,27 +509,58 @@ void SessionLayer::drain_time_over(ConnectionId id) {
   end(id, End::kFault, "does not drain its notifications: " + std::to_string(bytes) + " bytes wait");
 }
 
+/// Who goes on reading, or is under the queue bound, loses nothing by what others leave unread, up to twice the
+/// bounds: past them nothing else keeps the memory bounded.
 void SessionLayer::enforce_bounds() {
   if (!std::exchange(queued_, false)) return;
-  most_waited_ = std::max(most_waited_, accounts_.waiting());
-  for (;;) {
-    const auto overdraft = accounts_.overdraft();
-    if (overdraft.of == Accounts::Overdraft::Of::kNobody) return;
-    ConnectionId id = 0;
-    const Connection* worst = most_waiting(overdraft, &id);
-    if (worst == nullptr) return;
-    const bool one_user = overdraft.of == Accounts::Overdraft::Of::kUser;
-    end(id, End::kFault,
-        std::string(one_user ? "its user is over user-queue-bound" : "all are over total-queue-bound") +
-            " and it has the most to read: " + std::to_string(worst->out.bytes()) + " bytes wait");
+  note_freed();
+  while (close_worst(2)) {
+  }
+  if (env_.now() < next_look_) return;
+  while (close_worst(1)) {
   }
 }
 
-/// Among those whom the overdraft is of. Who has less to read than the queue bound comes after all who have more.
-SessionLayer::Connection* SessionLayer::most_waiting(const Accounts::Overdraft& overdraft, ConnectionId* id) {
+/// Of those who are over `times` their bound; once over it, only who is stalled. False: there is nothing more to
+/// close, or of no use: a notification that others wait for too stays, and the drain time decides about them.
+bool SessionLayer::close_worst(std::size_t times) {
+  const auto overdraft = accounts_.overdraft(times);
+  if (overdraft.of == Accounts::Overdraft::Of::kNobody) return false;
+  const bool only_stalled = times == 1;
+  ConnectionId id = 0;
+  const Connection* worst = most_waiting(overdraft, only_stalled, &id);
+  if (worst == nullptr) {
+    next_look_ = env_.now() + kBetweenLooks;
+    return false;
+  }
+  if (only_stalled) {
+    worst = flushed(id);
+    if (worst == nullptr || !stalled(*worst)) return true;
+  }
+  const std::size_t bytes = worst->out.bytes();
+  const std::size_t before = accounts_.waiting();
+  const bool one_user = overdraft.of == Accounts::Overdraft::Of::kUser;
+  end(id, End::kFault,
+      std::string(one_user ? "its user is over " : "all are over ") + (only_stalled ? "" : "twice ") +
+          (one_user ? "user-queue-bound" : "total-queue-bound") +
+          (only_stalled ? " and it reads nothing: " : " and it has the most to read: ") + std::to_string(bytes) +
+          " bytes wait");
+  if (!only_stalled || before >= accounts_.waiting() + bytes / 4) return true;
+  next_look_ = env_.now() + settings_.drain_time;
+  return false;
+}
+
+bool SessionLayer::stalled(const Connection& connection) const {
+  return connection.out.bytes() > settings_.queue_bound && env_.now() - connection.progressed >= kStalled;
+}
+
+/// Among those whom the overdraft is of.
+SessionLayer::Connection* SessionLayer::most_waiting(const Accounts::Overdraft& overdraft, bool only_stalled,
+                                                     ConnectionId* id) {
   Connection* most = nullptr;
   for (auto& [candidate, connection] : connections_) {
     if (connection.out.empty() || !overdraft.covers(connection.share.account())) continue;
+    if (only_stalled && !stalled(connection)) continue;
     if (most != nullptr && connection.out.bytes() <= most->out.bytes()) continue;
     most = &connection;
     *id = candidate;
@@ -484,30 +569,25 @@ SessionLayer::Connection* SessionLayer::most_waiting(const Accounts::Overdraft& 
 }
 
 void SessionLayer::note_freed() {
-  if (most_waited_ >= accounts_.waiting() + kMuchFreed) return_memory_soon();
+  most_held_ = std::max(most_held_, held());
+  if (most_held_ >= held() + kMuchFreed) return_memory_soon();
 }
 
 void SessionLayer::return_memory_soon() {
   if (return_memory_.number != 0) return;
   return_memory_ = timers_.arm(env_.now() + kBetweenReturns, [this] {
     return_memory_ = {};
-    most_waited_ = accounts_.waiting();
+    most_held_ = held();
     env_.return_memory();
   });
 }
 
-/// With an answer, so that the client can say why. A line in the log at most now and then: many may try again and
-/// again.
+/// With an answer, so that the client can say why.
 void SessionLayer::refuse(ConnectionId id, const std::string& why) {
   answer(id, WYX_NO_MEMORY);
   const Connection* connection = find(id);
   if (connection == nullptr) return;
-  ++refused_;
-  if (env_.now() >= next_refusal_line_) {
-    env_.log->warn("{}: refused: {} ({} since the last such line)", describe(*connection), why, refused_);
-    refused_ = 0;
-    next_refusal_line_ = env_.now() + kBetweenRefusalLines;
-  }
+  log_about(connection->peer.uid, spdlog::level::warn, describe(*connection) + ": refused: " + why);
   drop(id);
 }
 
@@ -533,16 +613,19 @@ void SessionLayer::end_session(std::uint64_t number, End how, const std::string&
   sessions_.erase(found);
   drop(request);
   if (event != 0) drop(event);
-  env_.ordering.submit(SessionGoneEvent{id_of(number)});
-  return_memory_soon();
+  try {
+    env_.ordering.submit(SessionGoneEvent{id_of(number)});
+  } catch (const std::exception& error) {
+    begin_anew(error.what());  // else its members would stay for ever
+  }
 }
 
 void SessionLayer::drop(ConnectionId id) {
   const auto found = connections_.find(id);
   timers_.cancel(found->second.handshake);
+  timers_.cancel(found->second.message_limit);
   timers_.cancel(found->second.drain_limit);
   connections_.erase(found);
-  note_freed();
   env_.transport.close(id);
 }
 

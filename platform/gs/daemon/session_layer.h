@@ -17,7 +17,8 @@
 // fail and its subscriptions end.
 //
 // A client that does not read has what waits for it up to the queue bound, and for a while more: one event may
-// bring it any number of notifications at once.
+// bring it any number of notifications at once. Where a user's clients, or all, are over their bound together, who
+// has taken nothing for a second is closed at once; over twice the bound whoever has the most to read is.
 #pragma once
 
 #include <spdlog/logger.h>
@@ -48,7 +49,7 @@ class SessionLayer : private PingSink {
     std::size_t queue_bound = 0;  // bytes that may wait for each of a client's channels
     Duration drain_time{10'000};  // that more may wait for its event channel
     ClientLimits limits{};
-    Duration handshake_limit{10'000};  // to say Hello or Attach, and to attach after Hello
+    Duration handshake_limit{10'000};  // to say Hello or Attach, to attach after Hello, to finish a message
     Limits engine{};
   };
   /// What it is given of the outside world.
@@ -125,7 +126,9 @@ class SessionLayer : private PingSink {
     wire::Assembler in{wire::kMaxClientMessage};
     OutQueue out;
     Timers::Id handshake;
-    Timers::Id drain_limit;  // while more than the queue bound waits
+    Timers::Id message_limit;  // while a message is there in part
+    Timers::Id drain_limit;    // while more than the queue bound waits
+    Time progressed{};         // since when it has been sent nothing, while something waits
   };
   struct Session {
     Session(std::uint64_t number, Account& account, SessionLayer& layer)
@@ -143,15 +146,19 @@ class SessionLayer : private PingSink {
   enum class End { kQuit, kGone, kFault };
   static constexpr std::size_t kFewTimers = 64;
   static constexpr std::chrono::seconds kLongPhase{60};  // after which the log names those who have not voted
+  static constexpr Duration kBetweenPhaseLooks{10'000};
   static constexpr std::size_t kNamedVoters = 8;
+  static constexpr std::size_t kProgramName = 64;              // bytes of it that the log shows
   static constexpr std::size_t kFlushShare = 256 * 1024;       // bytes to one client before others are served
   static constexpr std::size_t kEventShare = 1024 * 1024;      // bytes of one event that are sent at once
   static constexpr std::size_t kWorthClosing = 256 * 1024;     // bytes that wait, when memory is short
   static constexpr std::size_t kMuchFreed = 16 * 1024 * 1024;  // bytes
   static constexpr Duration kBetweenReturns{1'000};            // of memory to the system
-  static constexpr Duration kBetweenRefusalLines{1'000};
+  static constexpr Duration kStalled{1'000};                   // without progress
+  static constexpr Duration kBetweenLooks{100};                // for those who are stalled
 
   // One message of a client; each may close the connection it came on.
+  void on_part_of_message(ConnectionId id, Connection& connection);
   void on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
   void on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
   void on_request_channel(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
@@ -177,8 +184,11 @@ class SessionLayer : private PingSink {
   void begin_anew(const std::string& why);
   void arm(const TimerRequest& timer);
   void drop_stale_timers();
-  void warn_of_missing_votes(const TimerId& phase);
+  void look_at_phases();
+  void look_at_phases_later();
+  void warn_of_missing_votes(const std::string& group, Duration waited);
   std::string describe(const MissingVoter& voter);
+  const Connection* connection_of(const MissingVoter& voter);
   SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
 
   void send(ConnectionId to, const wire::ServerMessage& message) { put(to, {packets_of(message)}, true); }
@@ -189,9 +199,13 @@ class SessionLayer : private PingSink {
   bool put(ConnectionId to, OutQueue::Item item, bool at_once);
   bool handle(ConnectionId id, OutQueue::Sent sent);
   void watch_bound(ConnectionId id, Connection& connection);
+  Connection* flushed(ConnectionId id);
   void drain_time_over(ConnectionId id);
   void enforce_bounds();
-  Connection* most_waiting(const Accounts::Overdraft& overdraft, ConnectionId* id);
+  bool close_worst(std::size_t times);
+  bool stalled(const Connection& connection) const;
+  Connection* most_waiting(const Accounts::Overdraft& overdraft, bool only_stalled, ConnectionId* id);
+  std::size_t held() const { return accounts_.waiting() + engine_->kept_bytes(); }
   void note_freed();
   void return_memory_soon();
   void refuse(ConnectionId id, const std::string& why);
@@ -217,10 +231,12 @@ class SessionLayer : private PingSink {
   struct PhaseTimer {
     TimerId phase;
     Timers::Id timer;
-    Timers::Id warning;
+    Time since{};
+    bool warned_of = false;
   };
   std::unordered_map<std::string, PhaseTimer> phase_timers_;  // by group, which runs one protocol at a time
-  std::size_t sweep_timers_at_ = kFewTimers;                  // phase timers, those of ended phases included
+  Timers::Id look_at_phases_;
+  std::size_t sweep_timers_at_ = kFewTimers;  // phase timers, those of ended phases included
   // Of the outcome being delivered.
   std::unordered_map<const Notification*, std::shared_ptr<Outgoing>> outgoing_;
   std::vector<const Delivery*> run_;  // of one notification
@@ -232,10 +248,9 @@ class SessionLayer : private PingSink {
   std::uint64_t last_forgotten_ = 0;  // sessions up to this one are not the engine's
   bool queued_ = false;               // something, since the bounds were enforced
   bool short_of_memory_ = false;
-  std::size_t most_waited_ = 0;  // bytes, since memory was returned
+  Time next_look_{};           // for those who are stalled
+  std::size_t most_held_ = 0;  // bytes, since memory was returned
   Timers::Id return_memory_;
-  std::size_t refused_ = 0;  // since the last line that says so
-  Time next_refusal_line_{};
   bool said_farewell_ = false;  // nothing is sent after it
   bool continue_due_ = false;   // was asked for
 };

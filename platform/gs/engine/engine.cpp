@@ -357,6 +357,8 @@ bool Engine::awaits(const TimerId& timer) const {
   return group && group->awaits(timer);
 }
 
+std::size_t Engine::kept_bytes() const { return state_->ledger.total(); }
+
 MissingVotes Engine::missing_votes(const std::string& name, std::size_t at_most) const {
   const Group* group = state_->find_group(name);
   if (!group) return {};

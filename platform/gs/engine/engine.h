@@ -41,6 +41,9 @@ class Engine {
   /// Whether this timer's phase still runs. A timer that is not awaited need not be kept.
   bool awaits(const TimerId& timer) const;
 
+  /// Bytes of what is kept for sessions (see ledger.h).
+  std::size_t kept_bytes() const;
+
   /// For people and tools: whom a group's protocol waits for, at most so many by name.
   MissingVotes missing_votes(const std::string& group, std::size_t at_most) const;
 

@@ -77,6 +77,9 @@ class Assembler {
   /// True when a whole message stands; take it before the next add.
   bool complete() const { return expected_ != 0 && buffer_.size() == expected_; }
 
+  /// Bytes of the message that is under way.
+  std::size_t held() const { return buffer_.size(); }
+
   /// The whole message, decoded. Nothing: it is malformed and `error` says how.
   std::optional<ClientMessage> take_client_message(std::string* error);
   std::optional<ServerMessage> take_server_message(std::string* error);
