@@ -120,7 +120,7 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
       [](N& n) { n.proposal.whats_changed |= WYX_MERGE_GROUP_INFO; },
       [](N& n) {
         n.proposal.current_vote_results =
-            samples::list<VoteResult>({{{1, 2}, static_cast<wyx_vote_value_t>(128)}});
+            samples::list<VoteResult>({{{1, 2}, static_cast<wyx_vote_value_t>(128), 0, 0, nullptr, nullptr}});
       }};
   std::vector<Notification> bad = {
       DelayedErrorNotification{WYX_JOIN, static_cast<wyx_rc_t>(38), JoinRequest{}, nullptr},
