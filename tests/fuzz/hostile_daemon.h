@@ -149,7 +149,7 @@ class HostileDaemon {
       case 2:
       case 3: {
         gs::SubscriptionNotification n{in_.word() & 0x28fu, state(), members(), members(), {}, in_.byte()};
-        if ((n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) != 0) n.leave_codes.resize(n.changing_membership->size());
+        if ((n.type & WYX_SUBSCRIPTION_DELTA_LEAVE) != 0) n.leave_codes = codes_for(*n.changing_membership);
         return n;
       }
       case 4:
@@ -157,6 +157,11 @@ class HostileDaemon {
       default:
         return protocol();
     }
+  }
+
+  static gs::SharedLeaveCodes codes_for(const gs::Membership& leaving) {
+    if (leaving.empty()) return nullptr;
+    return std::make_shared<const std::vector<gs::LeaveCode>>(leaving.size());
   }
 
   /// Of one of those that ask.
@@ -181,8 +186,8 @@ class HostileDaemon {
     p.proposed_by = provider();
     p.current_providers = members();
     p.changing_providers = members();
-    p.leave_codes.resize((parts & 1) ? p.changing_providers->size() : 0);
-    if (parts & 2) p.current_vote_results.clear();
+    p.leave_codes = (parts & 1) ? codes_for(*p.changing_providers) : nullptr;
+    if (parts & 2) p.current_vote_results = nullptr;
     if (parts & 4) p.proposed_state = state();
     if (parts & 8) p.phase = 1;
     if (parts & 16) p.current_state = state();
