@@ -129,7 +129,8 @@ std::vector<double> Scene::requests(Done done) {
   const auto deadline = Clock::now() + kLimit;
   char text[] = "unrelated";
   const int64_t start = zn::now_ns();
-  for (int64_t due = start + kEvery; !done(samples.size()) || due < zn::now_ns(); due += kEvery) {
+  for (int64_t due = start + kEvery; samples.empty() || !done(samples.size()) || due < zn::now_ns();
+       due += kEvery) {
     if (Clock::now() > deadline) throw Failure{"waited in vain: the disturbance is over"};
     const timespec when{due / 1'000'000'000, due % 1'000'000'000};
     ::clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &when, nullptr);
