@@ -295,7 +295,9 @@ class Round {
       const int who = pid == std::string::npos ? 0 : std::atoi(line.c_str() + pid + 4);
       some_quit |= why == "quit";
       if (deaf_.contains(who) || why == "quit" || why.rfind("the peer is gone", 0) == 0) continue;
-      if (killed_.contains(who) && why.rfind("attaches", 0) == 0) continue;  // it was dead when that was read
+      // One that attaches was dead when that was read.
+      const bool of_dead = why == "its process has ended" || why.rfind("attaches", 0) == 0;
+      if (killed_.contains(who) && of_dead) continue;
       throw Failure{"the daemon has closed a client that reads: " + line};
     }
     if (!some_quit) throw Failure{"the daemon's log does not say who quits"};
