@@ -15,6 +15,7 @@
 #include "bench/figures.h"
 #include "bench/process_roles.h"
 #include "examples/processes.h"
+#include "gscl/GSUtils.h"
 
 namespace {
 
@@ -24,7 +25,7 @@ using zn::Failure;
 using zn::Process;
 
 constexpr auto kLimit = std::chrono::seconds(300);  // a bound on a hang, not on what is measured
-constexpr int64_t kEvery = 500'000;                 // nanoseconds from one request to the next
+constexpr int64_t kEvery = 2'000'000;               // nanoseconds from one request to the next
 constexpr int kAtOnce = 20;                         // joins or changes before everybody has to catch up
 
 struct Settings {
@@ -32,9 +33,10 @@ struct Settings {
   int readers = 5;
   int crowd = 1000;  // providers of each of two sessions
   int deaf = 100;    // sessions that do not read
-  int quiet = 4000;  // requests with nothing going on
+  int quiet = 1000;  // requests with nothing going on
+  int deaths = 5;    // runs of the first of these
 
-  static Settings quick() { return {20, 2, 10, 3, 100}; }
+  static Settings quick() { return {20, 2, 10, 3, 100, 1}; }
 };
 
 /// A daemon, the processes around it, and a member in a group of its own whose requests are timed.
@@ -135,7 +137,8 @@ std::vector<double> Scene::requests(Done done) {
     const timespec when{due / 1'000'000'000, due % 1'000'000'000};
     ::clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &when, nullptr);
     const wyx_rc_t rc = unrelated_->send_message(wyx_provider_message_t{sizeof text, text}, WYX_1_PHASE, 0);
-    if (rc != WYX_OK) throw Failure{"an unrelated request was refused"};
+    if (rc != WYX_OK)
+      throw Failure{"an unrelated request was refused: " + std::string(zelt_gscl::gscl_rc_name(rc))};
     samples.push_back(static_cast<double>(zn::now_ns() - due) / 1e6);
     controller_->dispatch(WYX_NON_BLOCKING);
   }
@@ -154,8 +157,13 @@ std::string failed(int closed, int readers) {
   return std::to_string(closed) + " of " + std::to_string(readers) + " healthy readers were closed";
 }
 
+struct Disturbed {
+  double p99 = 0, longest = 0, quiet_p99 = 0, lasted_ms = 0;
+  int closed = 0;
+};
+
 // Every reader and the one that dies are members of all groups.
-void death_in_many_groups(const Settings& s, zn::Figures* figures) {
+Disturbed one_death(const Settings& s) {
   Scene scene;
   scene.add("everywhere", s.readers + 1, s.groups);
   std::vector<int> told;
@@ -173,13 +181,28 @@ void death_in_many_groups(const Settings& s, zn::Figures* figures) {
     }
     return true;
   });
-  const int closed = scene.closed(0, s.readers);
+  return {zn::percentile(meanwhile, 0.99), meanwhile.back(), zn::percentile(quiet, 0.99), scene.lasted_ms(),
+          scene.closed(0, s.readers)};
+}
+
+// Of several, the one in the middle: a machine that others share stands still now and then.
+void death_in_many_groups(const Settings& s, zn::Figures* figures) {
+  std::vector<Disturbed> runs;
+  int closed = 0;
+  for (int i = 0; i < s.deaths; i++) {
+    runs.push_back(one_death(s));
+    closed = std::max(closed, runs.back().closed);
+  }
+  std::sort(runs.begin(), runs.end(), [](const Disturbed& a, const Disturbed& b) { return a.p99 < b.p99; });
+  const Disturbed& middle = runs[runs.size() / 2];
   figures->add("one death in " + std::to_string(s.groups) + " groups of 64 KiB, " + std::to_string(s.readers) +
                    " readers: request beside it, p99",
-               zn::percentile(meanwhile, 0.99), "ms", 5, failed(closed, s.readers));
-  figures->add("  longest", *std::max_element(meanwhile.begin(), meanwhile.end()), "ms");
-  figures->add("  with nothing going on, p99", zn::percentile(quiet, 0.99), "ms");
-  figures->add("  time that the disturbance lasted", scene.lasted_ms(), "ms");
+               middle.p99, "ms", 5, failed(closed, s.readers));
+  figures->add("  longest", middle.longest, "ms");
+  figures->add("  p99 of the other runs, least", runs.front().p99, "ms");
+  figures->add("  p99 of the other runs, most", runs.back().p99, "ms");
+  figures->add("  with nothing going on, p99", middle.quiet_p99, "ms");
+  figures->add("  time that the disturbance lasted", middle.lasted_ms, "ms");
 }
 
 void end_of_a_crowd(const Settings& s, zn::Figures* figures) {
@@ -216,7 +239,7 @@ void memory_after_the_deaf(const Settings& s, zn::Figures* figures) {
   for (int i = 0; i < s.deaf; i++) scene.at(i).write_line("on");
   scene.await("all are closed", [&] { return scene.closed(0, s.deaf) == s.deaf; });
   for (int i = 0; i < s.deaf; i++) scene.at(i).wait_end(Clock::now() + kLimit);
-  scene.requests([](size_t count) { return count >= 3000; });  // memory is given back once a second at most
+  scene.requests([](size_t count) { return count >= 300; });  // memory is given back ten times a second
   const double after = resident_mib(scene.daemon());
   figures->add("memory of the daemon after " + std::to_string(s.deaf) + " sessions that did not read 4 MiB",
                after - before, "MiB over before");

@@ -66,9 +66,10 @@ class BenchMember : public zelt_gscl_V1::GSProvider {
 ///   member BOARD SLOT GROUP    a group member; "send N" on its input makes it send N messages
 ///   subscriber BOARD SLOT GROUP
 ///   idle BOARD SLOT            a session and nothing else
-///   everywhere BOARD SLOT N    providers in N groups; "join I", "state I" on its input makes one join, propose 64
-///   KiB crowd BOARD SLOT N         the same with N providers in one group deaf BOARD SLOT            reads
-///   nothing while 4 MiB come for it; on a line of input more, until it is closed
+///   everywhere BOARD SLOT N    providers in N groups; "join I", "state I" on its input makes one join, propose
+///                              64 KiB
+///   crowd BOARD SLOT N         the same with N providers in one group
+///   deaf BOARD SLOT            reads nothing while 4 MiB come for it; on a line of input more, until it is closed
 int run_role(const std::string& role, int argc, char** argv);
 
 /// A pathname socket of the kind that the daemon uses.

@@ -570,16 +570,20 @@ SessionLayer::Connection* SessionLayer::most_waiting(const Accounts::Overdraft& 
 
 void SessionLayer::note_freed() {
   most_held_ = std::max(most_held_, held());
-  if (most_held_ >= held() + kMuchFreed) return_memory_soon();
+  const std::size_t freed = most_held_ - held();
+  if (freed >= kReturnedAtOnce) return return_memory();
+  if (freed >= kMuchFreed) return_memory_soon();
 }
 
 void SessionLayer::return_memory_soon() {
   if (return_memory_.number != 0) return;
-  return_memory_ = timers_.arm(env_.now() + kBetweenReturns, [this] {
-    return_memory_ = {};
-    most_held_ = held();
-    env_.return_memory();
-  });
+  return_memory_ = timers_.arm(env_.now() + kBetweenReturns, [this] { return_memory(); });
+}
+
+void SessionLayer::return_memory() {
+  timers_.cancel(return_memory_);
+  most_held_ = held();
+  env_.return_memory();
 }
 
 /// With an answer, so that the client can say why.

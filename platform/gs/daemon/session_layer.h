@@ -148,14 +148,15 @@ class SessionLayer : private PingSink {
   static constexpr std::chrono::seconds kLongPhase{60};  // after which the log names those who have not voted
   static constexpr Duration kBetweenPhaseLooks{10'000};
   static constexpr std::size_t kNamedVoters = 8;
-  static constexpr std::size_t kProgramName = 64;              // bytes of it that the log shows
-  static constexpr std::size_t kFlushShare = 256 * 1024;       // bytes to one client before others are served
-  static constexpr std::size_t kEventShare = 1024 * 1024;      // bytes of one event that are sent at once
-  static constexpr std::size_t kWorthClosing = 256 * 1024;     // bytes that wait, when memory is short
-  static constexpr std::size_t kMuchFreed = 16 * 1024 * 1024;  // bytes
-  static constexpr Duration kBetweenReturns{1'000};            // of memory to the system
-  static constexpr Duration kStalled{1'000};                   // without progress
-  static constexpr Duration kBetweenLooks{100};                // for those who are stalled
+  static constexpr std::size_t kProgramName = 64;                   // bytes of it that the log shows
+  static constexpr std::size_t kFlushShare = 64 * 1024;             // bytes to one client before others are served
+  static constexpr std::size_t kEventShare = 128 * 1024;            // bytes of one event that are sent at once
+  static constexpr std::size_t kWorthClosing = 256 * 1024;          // bytes that wait, when memory is short
+  static constexpr std::size_t kMuchFreed = 16 * 1024 * 1024;       // bytes
+  static constexpr std::size_t kReturnedAtOnce = 64 * 1024 * 1024;  // bytes; more would keep the loop for long
+  static constexpr Duration kBetweenReturns{100};                   // of memory to the system
+  static constexpr Duration kStalled{1'000};                        // without progress
+  static constexpr Duration kBetweenLooks{100};                     // for those who are stalled
 
   // One message of a client; each may close the connection it came on.
   void on_part_of_message(ConnectionId id, Connection& connection);
@@ -208,6 +209,7 @@ class SessionLayer : private PingSink {
   std::size_t held() const { return accounts_.waiting() + engine_->kept_bytes(); }
   void note_freed();
   void return_memory_soon();
+  void return_memory();
   void refuse(ConnectionId id, const std::string& why);
 
   /// Closes a connection and, where it has one, its session, with a line in the log.

@@ -8,7 +8,7 @@ namespace gs {
 
 struct Limits {
   /// Units of work after which an event leaves the rest to a ContinueEvent (see work.h); at least 1.
-  std::size_t slice = 512;
+  std::size_t slice = 128;
   // Bytes of what is kept for a session, for all sessions of a user, and in all (see ledger.h).
   std::size_t session_bytes = std::size_t{128} << 20;
   std::size_t user_bytes = std::size_t{256} << 20;
