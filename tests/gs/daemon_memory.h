@@ -127,6 +127,11 @@ class MemoryClient {
     return call(r);
   }
   std::vector<wire::ServerMessage> events() { return daemon_.transport.take(event); }
+  /// The event channel takes again what comes, for so many turns of the loop at most.
+  void read_again(int turns = 100) {
+    event_wire().full = false;
+    while (turns-- > 0 && std::exchange(event_wire().wants_writable, false)) daemon_.layer.writable(event);
+  }
   MemoryTransport::Wire& event_wire() { return daemon_.transport.wires.at(event); }
   bool closed() const { return daemon_.closed(request) && daemon_.closed(event); }
 

@@ -156,8 +156,7 @@ TEST_F(DaemonSession, ClientThatStalls_GetsEverythingInOrderOnceItTakesAgain_The
   EXPECT_THAT(told(sender), ElementsAre("farewell"));
   EXPECT_FALSE(daemon_.layer.drained());
   daemon_.layer.lost(sender.request, "gone");
-  slow.event_wire().full = false;
-  for (int turn = 0; turn < 2; ++turn) daemon_.layer.writable(slow.event);
+  slow.read_again();
   EXPECT_TRUE(daemon_.layer.drained());
   std::string order;
   for (const std::string& line : told(slow))
@@ -180,9 +179,8 @@ TEST_F(DaemonSession, ClientOverTheQueueBound_IsClosedOnlyIfItIsStillOverItAfter
   client.event_wire().full = true;
   talk_to_itself(client, "a", 32);
   daemon_.pass(9'999ms);
-  client.event_wire().full = false;
-  for (int turn = 0; turn < 5; ++turn) daemon_.layer.writable(client.event);
-  EXPECT_THAT(client.events().size(), testing::Le(5 * 5u)) << "a turn is bounded";
+  client.read_again(20);
+  EXPECT_THAT(client.events().size(), testing::Le(24u)) << "a turn is bounded";
   client.event_wire().full = true;
   daemon_.pass(3600s);
   EXPECT_FALSE(client.closed()) << "under the bound it may wait for ever";
@@ -226,54 +224,50 @@ TEST(DaemonBounds, UserOrAllOverTheirBound_LoseWhoHoldsTheMost_RootAndOtherUsers
   EXPECT_FALSE(served.closed() || less.closed() || last.closed());
 }
 
-// Five readers of one burst hold it once, not five times.
-TEST(DaemonBounds, BurstForManyReaders_CountsOnceForTheirUser) {
-  ClientLimits limits;
-  limits.user_queue_bound = 3 << 20;
-  MemoryDaemon daemon({1, 1 << 20}, limits);
-  MemoryClient sender(daemon, 0);
-  ASSERT_EQ(sender.join(1, 1), WYX_OK);
-  std::vector<std::unique_ptr<MemoryClient>> readers;
-  for (std::int16_t i = 2; i < 7; ++i) {
-    readers.push_back(std::make_unique<MemoryClient>(daemon));
-    ASSERT_EQ(readers.back()->join(1, i), WYX_OK);
-    readers.back()->event_wire().full = true;
+class DaemonBurst : public testing::Test {
+ protected:
+  static ClientLimits bounds() {
+    ClientLimits limits;
+    limits.user_queue_bound = 3 << 20;
+    return limits;
   }
-  for (int i = 0; i < 32; ++i) ASSERT_EQ(sender.call(MessageRequest{1, {}, Bytes(1024 * 64, 'm')}), WYX_OK);
-  for (const auto& reader : readers) {
-    EXPECT_FALSE(reader->closed());
-    reader->event_wire().full = false;
-    for (int turn = 0; turn < 20; ++turn) daemon.layer.writable(reader->event);
+  void SetUp() override {
+    ASSERT_EQ(sender_.join(1, 1), WYX_OK);
+    for (std::int16_t i = 2; i < 7; ++i) {
+      readers_.push_back(std::make_unique<MemoryClient>(daemon_));
+      ASSERT_EQ(readers_.back()->join(1, i), WYX_OK);
+      readers_.back()->event_wire().full = true;
+    }
+  }
+  long closed_after(int messages) {
+    for (int i = 0; i < messages; ++i)
+      EXPECT_EQ(sender_.call(MessageRequest{1, {}, Bytes(1024 * 64, 'm')}), WYX_OK);
+    return std::ranges::count_if(readers_, [](const auto& reader) { return reader->closed(); });
+  }
+
+  MemoryDaemon daemon_{{1, 1 << 20}, bounds()};
+  MemoryClient sender_{daemon_, 0};
+  std::vector<std::unique_ptr<MemoryClient>> readers_;
+};
+
+TEST_F(DaemonBurst, ForManyReaders_CountsOnceForTheirUser) {
+  EXPECT_EQ(closed_after(32), 0);
+  for (const auto& reader : readers_) {
+    reader->read_again();
     EXPECT_THAT(reader->events().size(), testing::Ge(32u));
   }
-  EXPECT_TRUE(daemon.layer.drained());
+  EXPECT_TRUE(daemon_.layer.drained());
 }
 
 // To close one of several who are equally behind frees nothing: the others keep their drain time.
-TEST(DaemonBounds, ReadersOfOneBurstWhoAllStall_LoseOne_AndTheRestAtTwiceTheBoundOnly) {
-  ClientLimits limits;
-  limits.user_queue_bound = 3 << 20;
-  MemoryDaemon daemon({1, 1 << 20}, limits);
-  MemoryClient sender(daemon, 0);
-  ASSERT_EQ(sender.join(1, 1), WYX_OK);
-  std::vector<std::unique_ptr<MemoryClient>> readers;
-  for (std::int16_t i = 2; i < 7; ++i) {
-    readers.push_back(std::make_unique<MemoryClient>(daemon));
-    ASSERT_EQ(readers.back()->join(1, i), WYX_OK);
-    readers.back()->event_wire().full = true;
-  }
-  const auto closed_after = [&](int messages) {
-    for (int i = 0; i < messages; ++i)
-      EXPECT_EQ(sender.call(MessageRequest{1, {}, Bytes(1024 * 64, 'm')}), WYX_OK);
-    return std::ranges::count_if(readers, [](const auto& reader) { return reader->closed(); });
-  };
+TEST_F(DaemonBurst, WhoseReadersAllStall_LosesOne_AndTheRestAtTwiceTheBoundOnly) {
   EXPECT_EQ(closed_after(56), 0);
-  daemon.pass(1s);
+  daemon_.pass(1s);
   EXPECT_EQ(closed_after(1), 1);
-  daemon.pass(1s);
+  daemon_.pass(1s);
   EXPECT_EQ(closed_after(1), 1);
   EXPECT_EQ(closed_after(40), 5);
-  EXPECT_FALSE(sender.closed());
+  EXPECT_FALSE(sender_.closed());
 }
 
 TEST(DaemonBounds, MessagesThatAreNeverFinished_AreBoundedInTimeAndInBytesOfTheirUser) {
