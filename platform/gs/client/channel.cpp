@@ -39,6 +39,7 @@ std::unique_ptr<Channel> Channel::connect(const std::string& path, wyx_rc_t* rc)
   }
   const timeval limit = {kPatience, 0};
   setsockopt(channel->fd(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof(limit));
+  channel->limit_waits(kPatience);
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
@@ -53,6 +54,12 @@ std::unique_ptr<Channel> Channel::connect(const std::string& path, wyx_rc_t* rc)
 }
 
 Channel::Channel(int fd) : fd_(fd), assembler_(wire::kMaxServerMessage), packet_(wire::kMaxPacket + 1) {}
+
+void Channel::limit_waits(int seconds) {
+  limit_ = seconds;
+  const timeval limit = {seconds, 0};
+  setsockopt(fd(), SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof(limit));
+}
 
 /// False: nothing has happened until then.
 bool Channel::await(short events, Clock::time_point until) const {
@@ -101,19 +108,26 @@ Channel::Got Channel::ask(const wire::ClientMessage& question, wire::ServerMessa
   const auto until = deadline();
   const Got sent = send(encoded, until);
   if (sent == Got::kTimeout) return sent;
-  const bool ended = sent == Got::kEnd;  // then all that was said is here
-  for (;;) {
-    if (!ended && !await(POLLIN, until)) return Got::kTimeout;
+  if (sent == Got::kEnd) {  // then all that was said is here
     const Got got = receive(answer);
-    if (got != Got::kNothing) return got;
-    if (ended) return Got::kEnd;
+    return got == Got::kNothing ? Got::kEnd : got;
   }
+  // Mostly the answer comes as one packet: waiting for it in recv saves a system call.
+  Got got = receive(answer, 0);
+  while (got == Got::kNothing) {
+    if (!await(POLLIN, until)) return Got::kTimeout;
+    got = receive(answer);
+  }
+  return got;
 }
 
-Channel::Got Channel::receive(wire::ServerMessage* message) {
+Channel::Got Channel::receive(wire::ServerMessage* message) { return receive(message, MSG_DONTWAIT); }
+
+/// `flags`: of the first packet; nothing more is waited for.
+Channel::Got Channel::receive(wire::ServerMessage* message, int flags) {
   std::string error;
-  for (;;) {
-    const ssize_t length = recv(fd(), packet_.data(), packet_.size(), MSG_DONTWAIT);
+  for (;; flags = MSG_DONTWAIT) {
+    const ssize_t length = recv(fd(), packet_.data(), packet_.size(), flags);
     // ECONNRESET: the other side has left something unread; what it had said before, and then its end, follow.
     if (length < 0 && (errno == EINTR || errno == ECONNRESET)) continue;
     if (length < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return Got::kNothing;

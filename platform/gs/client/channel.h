@@ -39,12 +39,12 @@ class Channel {
   void silence() { fd_.silence(); }
 
   /// Bounds the waiting of every send, and of every ask, from now on.
-  void limit_waits(int seconds) { limit_ = seconds; }
+  void limit_waits(int seconds);
   int limit() const { return limit_; }
 
   /// kMessage: it is sent. Else kTimeout or kEnd.
   Got send(const wire::ClientMessage& message);
-  /// Sends and receives, both within the limit. What the other side said before it closed is an answer too.
+  /// Sends, then receives, each within the limit. What the other side said before it closed is an answer too.
   Got ask(const wire::ClientMessage& question, wire::ServerMessage* answer);
   /// What is there, without waiting; kNothing: no whole message.
   Got receive(wire::ServerMessage* message);
@@ -56,6 +56,7 @@ class Channel {
   using Clock = std::chrono::steady_clock;
 
   Clock::time_point deadline() const { return Clock::now() + std::chrono::seconds(limit_); }
+  Got receive(wire::ServerMessage* message, int flags);
   bool await(short events, Clock::time_point until) const;
   Got send(const wire::Encoded& message, Clock::time_point until);
   Got send_packet(std::span<std::byte> header, std::span<const std::byte> slice, Clock::time_point until);
