@@ -11,7 +11,6 @@
 namespace platform {
 namespace {
 
-constexpr std::size_t kMaxSize = 32 * 1024;
 constexpr int kMaxBrackets = 500;
 
 std::string place(const toml::source_location& where) {
@@ -37,8 +36,8 @@ std::string content_of(const std::string& path) {
 /// The parser calls itself for each bracket, takes a time that grows with the square of a key's length, and reads
 /// outside its text to tell where it is no UTF-8.
 void check_bounds(const std::string& path, const std::string& content) {
-  if (content.size() > kMaxSize)
-    throw SettingError(path + ": is longer than " + std::to_string(kMaxSize) + " bytes");
+  if (content.size() > kMaxTomlFile)
+    throw SettingError(path + ": is longer than " + std::to_string(kMaxTomlFile) + " bytes");
   const auto brackets = std::count_if(content.begin(), content.end(), [](char c) { return c == '[' || c == '{'; });
   if (brackets > kMaxBrackets)
     throw SettingError(path + ": has more than " + std::to_string(kMaxBrackets) + " brackets");

@@ -8,6 +8,8 @@
 
 namespace platform {
 
+constexpr std::size_t kMaxTomlFile = 32 * 1024;  // bytes
+
 /// Throws SettingError, "FILE:LINE: what", or "FILE: what" when it cannot be read.
 toml::value parse_toml_file(const std::string& path);
 /// The same of a file's content.

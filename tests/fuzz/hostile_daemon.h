@@ -232,6 +232,10 @@ extern "C" __attribute__((visibility("default"))) int connect(int fd, const sock
 }
 
 /// What is not there at once never comes.
+extern "C" __attribute__((visibility("default"))) ssize_t recv(int fd, void* packet, size_t size, int flags) {
+  return recvfrom(fd, packet, size, flags | MSG_DONTWAIT, nullptr, nullptr);
+}
+
 extern "C" __attribute__((visibility("default"))) int poll(pollfd* watched, nfds_t count, int patience) {
   constexpr timespec kAtOnce{};
   const int ready = ppoll(watched, count, &kAtOnce, nullptr);

@@ -48,7 +48,8 @@ EmbeddedTransport::EmbeddedTransport()
       timer_fd_(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK)) {}
 
 bool EmbeddedTransport::ready() const {
-  return watch(epoll_fd_.get(), event_fd_.get()) && watch(epoll_fd_.get(), timer_fd_.get());
+  return epoll_fd_.get() >= 0 && event_fd_.get() >= 0 && timer_fd_.get() >= 0 &&
+         watch(epoll_fd_.get(), event_fd_.get()) && watch(epoll_fd_.get(), timer_fd_.get());
 }
 
 wyx_rc_t EmbeddedTransport::call(Request request) {

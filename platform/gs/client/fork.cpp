@@ -75,14 +75,13 @@ Descriptor::Descriptor(int fd) : fd_(above_standard(fd)) {
   first_descriptor = this;
 }
 
-/// An ancestor's number is left alone: the application may have put something of its own there.
+/// An ancestor's number is left alone: the application may have put something of its own there. Closed under the
+/// lock, or a fork would hand on what no list knows any more.
 Descriptor::~Descriptor() {
-  {
-    MutexLock lock(process_mutex);
-    if (link_ == nullptr) return;
-    *link_ = next_;
-    if (next_ != nullptr) next_->link_ = link_;
-  }
+  MutexLock lock(process_mutex);
+  if (link_ == nullptr) return;
+  *link_ = next_;
+  if (next_ != nullptr) next_->link_ = link_;
   if (fd_ >= 0) close(fd_);
 }
 

@@ -75,13 +75,15 @@ const char* Accounts::problem_with_half_received(const Account& account) const {
 
 Accounts::Overdraft Accounts::overdraft(std::size_t times) const {
   using Of = Overdraft::Of;
+  const std::size_t for_root = limits_.total_queue_bound / kRootPart;
+  const std::size_t for_others = limits_.total_queue_bound - for_root;
+  if (waiting() <= times * std::min(limits_.user_queue_bound, for_others)) return {};
   const Account* most = nullptr;
   for (const auto& [uid, account] : accounts_) {
     if (!account.is_root() && (most == nullptr || account.waiting() > most->waiting())) most = &account;
   }
   if (most != nullptr && most->waiting() > times * limits_.user_queue_bound) return {Of::kUser, most};
-  const std::size_t for_root = limits_.total_queue_bound / kRootPart;
-  if (waiting_of_others_ > times * (limits_.total_queue_bound - for_root)) return {Of::kAllButRoot, most};
+  if (waiting_of_others_ > times * for_others) return {Of::kAllButRoot, most};
   return waiting() > times * limits_.total_queue_bound ? Overdraft{Of::kRoot} : Overdraft{};
 }
 

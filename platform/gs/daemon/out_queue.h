@@ -19,8 +19,7 @@ class OutQueue {
   };
   enum class Sent {
     kAll,
-    kFull,      // the connection takes no more for now
-    kTurnOver,  // it might take more, but has had its share of the daemon's time
+    kFull,      // the connection takes no more, or has had its share
     kGone,      // the peer is gone
     kTooLarge,  // what comes next is over the limit of a message
   };
@@ -65,7 +64,7 @@ class OutQueue {
       if (sent != Sent::kAll) return sent;
       const std::size_t size = waiting_.front().packets->size();
       pop();
-      if (size >= share) return waiting_.empty() ? Sent::kAll : Sent::kTurnOver;
+      if (size >= share) return waiting_.empty() ? Sent::kAll : Sent::kFull;
       share -= size;
     }
     return Sent::kAll;

@@ -19,7 +19,6 @@ namespace {
 
 constexpr int kSendBuffer = 1024 * 1024;  // bytes; the system may give less
 constexpr timeval kAtOnce = {0, 0};       // after the descriptors that are ready, before the next are looked at
-constexpr timeval kAcceptPause = {0, 100'000};    // when descriptors have run out
 constexpr timeval kFarewellLimit = {0, 500'000};  // for clients to take what waits for them
 constexpr Duration kBetweenTrims{1'000};          // of the heap, while memory is short
 constexpr int kAcceptsAtOnce = 64;                // before the connected are served again
@@ -220,8 +219,9 @@ bool Server::accept_one() {
     add_connection(std::move(socket));
     return true;
   }
-  if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) pause_accepting(errno);
-  return errno == ECONNABORTED || errno == EINTR;
+  if (errno == ECONNABORTED || errno == EINTR) return true;
+  if (errno != EAGAIN) pause_accepting(errno);
+  return false;
 }
 
 /// The connection that could not be accepted stays in the queue and would wake the loop again and again.
@@ -230,7 +230,8 @@ void Server::pause_accepting(int error) {
                       std::string("cannot accept more connections for now: ") + strerror(error));
   if (!acceptable_) return;
   event_del(acceptable_.get());
-  if (event_add(accept_again_.get(), &kAcceptPause) != 0) acceptable_.reset();  // for look_at_path to make
+  constexpr timeval kPause = {0, std::chrono::microseconds(Listener::kAcceptPause).count()};
+  if (event_add(accept_again_.get(), &kPause) != 0) acceptable_.reset();  // for look_at_path to make
 }
 
 void Server::add_connection(Descriptor socket) {

@@ -78,11 +78,13 @@ void SessionLayer::received(ConnectionId id, std::span<const std::byte> packet) 
   enforce_bounds();
 }
 
-void SessionLayer::writable(ConnectionId id) {
+void SessionLayer::writable(ConnectionId id) { flush(id, kFlushShare); }
+
+void SessionLayer::flush(ConnectionId id, std::size_t share) {
   Connection* connection = find(id);
   if (connection == nullptr) return;
   const std::uint64_t sent = connection->out.sent();
-  if (!handle(id, connection->out.flush(env_.transport, id, kFlushShare))) return;
+  if (!handle(id, connection->out.flush(env_.transport, id, share))) return;
   if (connection->out.sent() != sent) connection->progressed = env_.now();
   if (!connection->out.empty()) env_.transport.wait_writable(id);
   watch_bound(id, *connection);
@@ -109,13 +111,12 @@ void SessionLayer::lost(ConnectionId id, const std::string& why) {
 
 void SessionLayer::say_farewell() {
   client_log_.tell_left_out();
-  const EncodedPtr farewell = packets_of(wire::Farewell{});
   std::vector<ConnectionId> channels;
   for (const auto& [number, session] : sessions_) {
     if (session.event != 0) channels.push_back(session.event);
   }
-  for (const ConnectionId id : channels) put(id, {farewell}, true);
-  said_farewell_ = true;
+  said_farewell_ = true;  // to those who end meanwhile too nothing else is said
+  for (const ConnectionId id : channels) put(id, {farewell_}, true);
 }
 
 bool SessionLayer::drained() const {
@@ -283,12 +284,20 @@ void SessionLayer::deliver(const Event& event, const Outcome& outcome) {
     if (!request->answered) answer_request(asker, outcome.rc);
   }
   deliver_to(outcome.deliveries, [&](const Delivery& d) { return request == nullptr || d.to.session != asker; });
-  outgoing_.clear();
+  forget_outgoing();
   if (accounts_.waiting() == 0) recent_.drop();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
   if (!engine_->busy() || continue_due_) return;
   env_.continue_soon();
   continue_due_ = true;
+}
+
+/// To clear a table costs what it once held: after a large outcome a new one.
+void SessionLayer::forget_outgoing() {
+  if (outgoing_.bucket_count() > kFewOutgoing)
+    outgoing_ = {};
+  else
+    outgoing_.clear();
 }
 
 void SessionLayer::continue_work() {
@@ -378,14 +387,15 @@ void SessionLayer::deliver_to_session(std::span<const Delivery* const> to, const
 }
 
 void SessionLayer::arm(const TimerRequest& timer) {
-  if (phase_timers_.size() >= sweep_timers_at_) drop_stale_timers();
+  drop_stale_timers();
+  const Time now = env_.now();
   PhaseTimer& of_group = phase_timers_[timer.id.group];
   timers_.cancel(of_group.timer);
-  of_group = {timer.id, {}, env_.now()};
+  of_group = {timer.id, {}, now};
   const std::chrono::seconds limit(timer.seconds);
   if (limit.count() == 0 || limit > kLongPhase) look_at_phases_later();
   if (limit.count() == 0) return;
-  of_group.timer = timers_.arm(env_.now() + limit, [this, id = timer.id] {
+  of_group.timer = timers_.arm(now + limit, [this, id = timer.id] {
     phase_timers_.erase(id.group);
     env_.ordering.submit(TimerExpiredEvent{id});
   });
@@ -396,16 +406,31 @@ void SessionLayer::look_at_phases_later() {
   look_at_phases_ = timers_.arm(env_.now() + kBetweenPhaseLooks, [this] { look_at_phases(); });
 }
 
-/// One timer for all phases: most of them end long before anybody needs to be warned of them.
+/// One timer for all phases: most of them end long before anybody needs to be warned of them. Looks at some, then
+/// others are served before it looks at more.
 void SessionLayer::look_at_phases() {
   look_at_phases_ = {};
-  drop_stale_timers();
-  if (!phase_timers_.empty()) look_at_phases_later();
-  for (auto& [group, of_group] : phase_timers_) {
-    const Duration waited = env_.now() - of_group.since;
-    if (waited < kLongPhase || std::exchange(of_group.warned_of, true)) continue;
-    warn_of_missing_votes(group, waited);
+  const Time now = env_.now();
+  auto at = after(looked_at_);
+  for (int i = 0; i < kPhasesAtOnce && at != phase_timers_.end(); ++i) {
+    looked_at_ = at->first;
+    PhaseTimer& of_group = at->second;
+    if (drop_if_stale(at)) continue;
+    const Duration waited = now - of_group.since;
+    if (waited >= kLongPhase && !std::exchange(of_group.warned_of, true))
+      warn_of_missing_votes(looked_at_, waited);
+    ++at;
   }
+  if (at != phase_timers_.end()) {
+    look_at_phases_ = timers_.arm(now, [this] { look_at_phases(); });
+    return;
+  }
+  looked_at_.clear();
+  if (!phase_timers_.empty()) look_at_phases_later();
+}
+
+SessionLayer::PhaseTimers::iterator SessionLayer::after(const std::string& group) {
+  return group.empty() ? phase_timers_.begin() : phase_timers_.upper_bound(group);
 }
 
 void SessionLayer::warn_of_missing_votes(const std::string& group, Duration waited) {
@@ -438,14 +463,23 @@ std::string SessionLayer::describe(const MissingVoter& voter) {
 }
 
 /// A phase may end hours before its limit: without this, groups that come and go would leave their timers behind.
+/// Two for each new one, so that those of ended phases are never many more than the others.
 void SessionLayer::drop_stale_timers() {
-  std::erase_if(phase_timers_, [this](const auto& of_group) {
-    PhaseTimer ended = of_group.second;
-    if (engine_->awaits(ended.phase)) return false;
-    timers_.cancel(ended.timer);
-    return true;
-  });
-  sweep_timers_at_ = std::max(kFewTimers, 2 * phase_timers_.size());
+  if (phase_timers_.size() < kFewTimers) return;
+  auto at = after(swept_);
+  for (int i = 0; i < 2 && at != phase_timers_.end(); ++i) {
+    swept_ = at->first;
+    if (!drop_if_stale(at)) ++at;
+  }
+  if (at == phase_timers_.end()) swept_.clear();
+}
+
+/// Then `at` is the next one.
+bool SessionLayer::drop_if_stale(PhaseTimers::iterator& at) {
+  if (engine_->awaits(at->second.phase)) return false;
+  timers_.cancel(at->second.timer);
+  at = phase_timers_.erase(at);
+  return true;
 }
 
 // --------------------------------------------------------------------------------------------- sending, ending
@@ -453,7 +487,7 @@ void SessionLayer::drop_stale_timers() {
 /// Sends, `at_once` where nothing waits, or queues. False: the connection is not there, or no longer.
 bool SessionLayer::put(ConnectionId to, OutQueue::Item item, bool at_once) {
   Connection* connection = find(to);
-  if (connection == nullptr || said_farewell_) return false;
+  if (connection == nullptr || (said_farewell_ && item.packets != farewell_)) return false;
   const bool waited = !connection->out.empty();
   if (at_once) {
     if (!handle(to, connection->out.send(std::move(item), env_.transport, to))) return false;
@@ -490,10 +524,10 @@ void SessionLayer::watch_bound(ConnectionId id, Connection& connection) {
   connection.drain_limit = timers_.arm(env_.now() + settings_.drain_time, [this, id] { drain_time_over(id); });
 }
 
-/// Before it is judged: what it has made room for counts. Null: it is closed.
+/// Before it is judged: all that it has made room for counts. Null: it is closed.
 SessionLayer::Connection* SessionLayer::flushed(ConnectionId id) {
   try {
-    writable(id);
+    flush(id, connections_.at(id).out.bytes());
   } catch (const std::exception& error) {
     end(id, End::kFault, std::string("it could not be sent its notifications: ") + error.what());
   }

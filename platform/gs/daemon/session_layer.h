@@ -25,6 +25,7 @@
 
 #include <array>
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <unordered_map>
@@ -143,8 +144,17 @@ class SessionLayer : private PingSink {
     SessionShare share;
     Pinger pinger;
   };
+  struct PhaseTimer {
+    TimerId phase;
+    Timers::Id timer;
+    Time since{};
+    bool warned_of = false;
+  };
+  using PhaseTimers = std::map<std::string, PhaseTimer>;  // by group, which runs one protocol at a time
   enum class End { kQuit, kGone, kFault };
+  static constexpr std::size_t kFewOutgoing = 64;
   static constexpr std::size_t kFewTimers = 64;
+  static constexpr int kPhasesAtOnce = 256;
   static constexpr std::chrono::seconds kLongPhase{60};  // after which the log names those who have not voted
   static constexpr Duration kBetweenPhaseLooks{10'000};
   static constexpr std::size_t kNamedVoters = 8;
@@ -181,10 +191,13 @@ class SessionLayer : private PingSink {
   template <typename Wanted>
   void deliver_to(const std::vector<Delivery>& deliveries, Wanted wanted);
   void deliver_run();
+  void forget_outgoing();
   void deliver_to_session(std::span<const Delivery* const> to, const std::shared_ptr<Outgoing>& what);
   void begin_anew(const std::string& why);
   void arm(const TimerRequest& timer);
   void drop_stale_timers();
+  bool drop_if_stale(PhaseTimers::iterator& at);
+  PhaseTimers::iterator after(const std::string& group);
   void look_at_phases();
   void look_at_phases_later();
   void warn_of_missing_votes(const std::string& group, Duration waited);
@@ -200,6 +213,7 @@ class SessionLayer : private PingSink {
   bool put(ConnectionId to, OutQueue::Item item, bool at_once);
   bool handle(ConnectionId id, OutQueue::Sent sent);
   void watch_bound(ConnectionId id, Connection& connection);
+  void flush(ConnectionId id, std::size_t share);
   Connection* flushed(ConnectionId id);
   void drain_time_over(ConnectionId id);
   void enforce_bounds();
@@ -230,21 +244,17 @@ class SessionLayer : private PingSink {
   RecentPackets recent_;
   std::unordered_map<ConnectionId, Connection> connections_;
   std::unordered_map<std::uint64_t, Session> sessions_;
-  struct PhaseTimer {
-    TimerId phase;
-    Timers::Id timer;
-    Time since{};
-    bool warned_of = false;
-  };
-  std::unordered_map<std::string, PhaseTimer> phase_timers_;  // by group, which runs one protocol at a time
+  PhaseTimers phase_timers_;  // those of ended phases included
   Timers::Id look_at_phases_;
-  std::size_t sweep_timers_at_ = kFewTimers;  // phase timers, those of ended phases included
+  std::string looked_at_;  // the group that was looked at last, empty: all were
+  std::string swept_;      // the same, for its timer to be dropped
   // Of the outcome being delivered.
   std::unordered_map<const Notification*, std::shared_ptr<Outgoing>> outgoing_;
   std::vector<const Delivery*> run_;  // of one notification
   std::size_t sent_at_once_ = 0;      // bytes
 
   std::array<EncodedPtr, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
+  const EncodedPtr farewell_ = packets_of(wire::Farewell{});
   const EncodedPtr fanout_end_ = packets_of(wire::FanoutEnd{});
   std::uint64_t last_session_ = 0;
   std::uint64_t last_forgotten_ = 0;  // sessions up to this one are not the engine's
@@ -253,7 +263,7 @@ class SessionLayer : private PingSink {
   Time next_look_{};           // for those who are stalled
   std::size_t most_held_ = 0;  // bytes, since memory was returned
   Timers::Id return_memory_;
-  bool said_farewell_ = false;  // nothing is sent after it
+  bool said_farewell_ = false;  // nothing else is sent from then on
   bool continue_due_ = false;   // was asked for
 };
 

@@ -28,6 +28,7 @@ class Timers {
   }
   /// Of a timer that has run or was cancelled: does nothing. Leaves `id` naming none.
   void cancel(Id& id) {
+    if (id.number == 0) return;
     actions_.erase(id);
     id = {};
   }

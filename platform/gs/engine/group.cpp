@@ -41,12 +41,13 @@ wyx_rc_t Group::check_proposal(const Member& member) const {
 }
 
 wyx_rc_t Group::check_expel(const Membership& expelled) const {
-  Membership present = *member_ids_;
-  std::sort(present.begin(), present.end());
-  const bool all_present = std::all_of(expelled.begin(), expelled.end(), [&](ProviderId id) {
-    return std::binary_search(present.begin(), present.end(), id);
+  Membership listed = expelled;
+  std::sort(listed.begin(), listed.end());
+  listed.erase(std::unique(listed.begin(), listed.end()), listed.end());
+  const auto present = std::count_if(member_ids_->begin(), member_ids_->end(), [&](ProviderId id) {
+    return std::binary_search(listed.begin(), listed.end(), id);
   });
-  return all_present ? WYX_OK : WYX_UNKNOWN_PROVIDER;
+  return static_cast<std::size_t>(present) == listed.size() ? WYX_OK : WYX_UNKNOWN_PROVIDER;
 }
 
 wyx_rc_t Group::check_new_attributes(const GroupAttributes& attributes) const {
@@ -211,12 +212,14 @@ void Group::start_leave(Surroundings& env) {
 // a delayed error.
 void Group::start_join(Surroundings& env) {
   std::optional<Run> run;
-  for (auto it = queue_.begin(); it != queue_.end();) {
+  std::size_t taken = 0;
+  for (auto it = queue_.begin(); it != queue_.end() && taken < kMaxBatch;) {
     if (!std::holds_alternative<JoinRequest>(it->second.request)) {
       ++it;
       continue;
     }
     const Queued queued = dequeue(it);
+    ++taken;
     const JoinRequest& join = std::get<JoinRequest>(queued.request);
     if (members_.empty() && !run) attributes_ = std::make_shared<const GroupAttributes>(join.attributes);
     if (join.attributes != *attributes_) {
@@ -228,7 +231,7 @@ void Group::start_join(Surroundings& env) {
     if (!run) run = new_run(WYX_JOIN, {attributes_->num_phases, attributes_->time_limit}, queued.who->id);
     queued.who->stage = Member::Stage::kJoining;
     add_changing(*run, queued.who, {});
-    if (!batches(WYX_BATCH_JOINS) || run->changing.size() == kMaxBatch) break;
+    if (!batches(WYX_BATCH_JOINS)) break;
   }
   if (run) start(std::move(*run), env);
 }

@@ -1,5 +1,6 @@
 #include "master/definition.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -10,6 +11,7 @@
 #include <iterator>
 #include <system_error>
 
+#include "common/place.h"
 #include "common/toml_file.h"
 #include "kpl.h"
 
@@ -219,13 +221,32 @@ Definition definition_of(const toml::value& content, const std::string& file) {
 }
 
 /// What others could change would run as root at their word.
-void check_owner(const std::string& path) {
-  struct stat found {};
-  if (stat(path.c_str(), &found) != 0) return;  // told where it is read
+void check_owner(const struct stat& found, const std::string& path) {
   const bool trusted = found.st_uid == 0 || found.st_uid == geteuid();
   if (!trusted) throw SettingError(path + ": belongs to user " + std::to_string(found.st_uid) + ", not to root");
   if ((found.st_mode & (S_IWGRP | S_IWOTH)) == 0) return;
   throw SettingError(path + ": can be written by others than root (chmod go-w)");
+}
+
+/// Of the file whose owner was looked at, and of no other: by then the name may lead elsewhere.
+std::string content_of_roots_own(const std::string& path) {
+  const auto unreadable = [&] { return SettingError(path + ": cannot be read: " + strerror(errno)); };
+  const platform::Descriptor file(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC | O_NOCTTY));
+  if (!file) throw unreadable();
+  const auto found = platform::file_of(file.get());
+  if (!found) throw unreadable();
+  if (!S_ISREG(found->st_mode)) throw SettingError(path + ": is no regular file");
+  check_owner(*found, path);
+  std::string content(platform::kMaxTomlFile + 1, '\0');  // one more, so that a longer one shows
+  std::size_t length = 0;
+  while (length < content.size()) {
+    const ssize_t got = read(file.get(), content.data() + length, content.size() - length);
+    if (got < 0) throw unreadable();
+    if (got == 0) break;
+    length += static_cast<std::size_t>(got);
+  }
+  content.resize(length);
+  return content;
 }
 
 std::vector<std::string> toml_files(const std::string& folder) {
@@ -254,14 +275,7 @@ const char* name_of(Transport transport) {
   return "unknown";
 }
 
-Definition read_definition(const std::string& file) {
-  std::error_code error;
-  const auto type = std::filesystem::status(file, error).type();
-  if (std::filesystem::exists(std::filesystem::file_status(type)) && type != std::filesystem::file_type::regular) {
-    throw SettingError(file + ": is no regular file");  // to read a pipe might never end
-  }
-  return definition_of(platform::parse_toml_file(file), file);
-}
+Definition read_definition(const std::string& file) { return parse_definition(content_of_roots_own(file), file); }
 
 Definition parse_definition(const std::string& content, const std::string& file) {
   return definition_of(platform::parse_toml(content, file), file);
@@ -269,10 +283,10 @@ Definition parse_definition(const std::string& content, const std::string& file)
 
 Folder read_folder(const std::string& folder) {
   Folder result;
-  check_owner(folder);
+  struct stat found {};
+  if (stat(folder.c_str(), &found) == 0) check_owner(found, folder);  // else told where it is read
   for (const std::string& file : toml_files(folder)) {
     try {
-      check_owner(file);
       Definition definition = read_definition(file);
       for (const Definition& other : result.definitions) check_shared(definition, other);
       result.definitions.push_back(std::move(definition));
