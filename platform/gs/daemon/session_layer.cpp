@@ -72,7 +72,7 @@ void SessionLayer::received(ConnectionId id, std::span<const std::byte> packet) 
   if (!connection->in.complete()) return on_part_of_message(id, *connection);
   timers_.cancel(connection->message_limit);
   connection->share.set_half_received(0);
-  const auto message = connection->in.take_client_message(&error);
+  auto message = connection->in.take_client_message(&error);
   if (!message) return end(id, End::kFault, "malformed: " + error);
   on_message(id, *connection, *message);
   enforce_bounds();
@@ -137,7 +137,7 @@ void SessionLayer::on_part_of_message(ConnectionId id, Connection& connection) {
   });
 }
 
-void SessionLayer::on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message) {
+void SessionLayer::on_message(ConnectionId id, Connection& connection, wire::ClientMessage& message) {
   switch (connection.channel) {
     case Channel::kFresh:
       return on_fresh(id, connection, message);
@@ -158,9 +158,8 @@ void SessionLayer::on_fresh(ConnectionId id, Connection& connection, const wire:
   end(id, End::kFault, "out of order: neither Hello nor Attach came first");
 }
 
-void SessionLayer::on_request_channel(ConnectionId id, Connection& connection,
-                                      const wire::ClientMessage& message) {
-  if (const auto* call = std::get_if<wire::Call>(&message)) return on_call(id, connection, *call);
+void SessionLayer::on_request_channel(ConnectionId id, Connection& connection, wire::ClientMessage& message) {
+  if (auto* call = std::get_if<wire::Call>(&message)) return on_call(id, connection, *call);
   if (const auto* wanted = std::get_if<wire::SetResponsiveness>(&message)) {
     return answer(id, find_session(connection.session)->pinger.set(*wanted));
   }
@@ -214,13 +213,14 @@ void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire
   answer(id, WYX_OK);
 }
 
-void SessionLayer::on_call(ConnectionId id, Connection& connection, const wire::Call& call) {
+void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& call) {
   Session* session = find_session(connection.session);
   if (session->event == 0) return end(id, End::kFault, "out of order: a request before its event channel");
   if (session->answer_due) return end(id, End::kFault, "out of order: a request before the answer to the last");
   if (short_of_memory_ && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
   session->answer_due = true;
-  env_.ordering.submit(RequestEvent{id_of(connection.session), call.request, false, connection.peer.uid});
+  env_.ordering.submit(
+      RequestEvent{id_of(connection.session), std::move(call.request), false, connection.peer.uid});
 }
 
 void SessionLayer::on_query_node(ConnectionId id) {

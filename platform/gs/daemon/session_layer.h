@@ -170,12 +170,12 @@ class SessionLayer : private PingSink {
 
   // One message of a client; each may close the connection it came on.
   void on_part_of_message(ConnectionId id, Connection& connection);
-  void on_message(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
+  void on_message(ConnectionId id, Connection& connection, wire::ClientMessage& message);
   void on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
-  void on_request_channel(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
+  void on_request_channel(ConnectionId id, Connection& connection, wire::ClientMessage& message);
   void on_hello(ConnectionId id, Connection& connection, const wire::Hello& hello);
   void on_attach(ConnectionId id, Connection& connection, const wire::Attach& attach);
-  void on_call(ConnectionId id, Connection& connection, const wire::Call& call);
+  void on_call(ConnectionId id, Connection& connection, wire::Call& call);
   void on_query_node(ConnectionId id);
 
   // Of the pingers.

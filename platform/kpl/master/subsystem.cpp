@@ -142,11 +142,13 @@ void Subsystem::on_ping_answer(const End& end) {
   process_->hung = "hung (ping: " + end.text + ")";
   around_.log.error("{}: {}; SIGTERM", definition_.name, process_->hung);
   kill(pid(), SIGTERM);
-  process_->kill_late.emplace(around_.loop, [this] {
-    around_.log.warn("{} has not ended within its stop-time; SIGKILL", definition_.name);
-    kill(pid(), SIGKILL);
-  });
+  process_->kill_late.emplace(around_.loop, [this] { kill_as_late(); });
   process_->kill_late->arm(definition_.stop_time);
+}
+
+void Subsystem::kill_as_late() {
+  around_.log.warn("{}; SIGKILL", late());
+  kill(pid(), SIGKILL);
 }
 
 // --------------------------------------------------------------------------------------------------- its end
@@ -233,10 +235,8 @@ void Subsystem::on_stop_answer(StopId which, const End& end) {
 }
 
 void Subsystem::on_stop_late(StopId which, StopKind kind) {
-  const std::string text = definition_.name + " has not ended within its stop-time";
-  if (kind != StopKind::kCancel) return finish_stop(which, End{Result::kNoAnswer, 0, text});
-  around_.log.warn("{}; SIGKILL", text);
-  kill(pid(), SIGKILL);
+  if (kind == StopKind::kCancel) return kill_as_late();
+  finish_stop(which, End{Result::kNoAnswer, 0, late()});
 }
 
 void Subsystem::finish_stop(StopId which, const End& end) {

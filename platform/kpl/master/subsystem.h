@@ -107,6 +107,8 @@ class Subsystem {
   void on_ping_answer(const control::End& end);
   void on_delay_over();
   void on_stop_late(StopId which, control::StopKind kind);
+  void kill_as_late();
+  std::string late() const { return definition_.name + " has not ended within its stop-time"; }
   void send_stop(control::StopKind kind, StopId which);
   void on_stop_answer(StopId which, const control::End& end);
   /// Nothing when it was answered before.
