@@ -69,7 +69,7 @@ void Server::guarded(ConnectionId id, Action action) {
   try {
     action();
   } catch (const std::exception& error) {
-    log_->error("{}", error.what());
+    log_->error("something could not be done: {}", error.what());
     try {
       sessions_.failed(id, std::string("the daemon could not serve it: ") + error.what());
     } catch (const std::exception& again) {
