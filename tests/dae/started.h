@@ -105,11 +105,13 @@ class Started {
     fields["directory"] = std::filesystem::read_symlink("/proc/" + pid() + "/cwd").string();
     return fields;
   }
-  /// Where the descriptors lead.
+  /// Where the descriptors lead. One that it closes meanwhile is left out.
   std::map<int, std::string> descriptors() const {
     std::map<int, std::string> result;
     for (const auto& entry : std::filesystem::directory_iterator("/proc/" + pid() + "/fd")) {
-      result[std::stoi(entry.path().filename().string())] = std::filesystem::read_symlink(entry.path()).string();
+      std::error_code closed;
+      const auto leads = std::filesystem::read_symlink(entry.path(), closed);
+      if (!closed) result[std::stoi(entry.path().filename().string())] = leads.string();
     }
     return result;
   }
