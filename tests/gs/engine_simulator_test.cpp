@@ -56,9 +56,7 @@ class Episode {
  public:
   /// Every other episode leaves as much work as can be for later events.
   Episode(std::uint64_t seed, Coverage& coverage, bool tell = false)
-      : random_(seed), coverage_(coverage), tell_(tell) {
-    if (seed % 2 == 0) limits_.slice = 1;
-  }
+      : random_(seed), coverage_(coverage), tell_(tell), limits_{.slice = seed % 2 == 0 ? 1u : Limits().slice} {}
 
   /// Empty, or what went wrong.
   std::string run(std::uint64_t steps) {
@@ -239,7 +237,7 @@ class Episode {
   MadeUp<Random> made_up_{random_};
   Coverage& coverage_;
   const bool tell_;
-  Limits limits_;
+  const Limits limits_;
   Engine replicas_[3] = {Engine(limits_), Engine(limits_),
                          Engine(limits_)};  // only the first is asked prechecks and status
   Model model_;

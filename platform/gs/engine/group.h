@@ -89,7 +89,9 @@ class Group {
   void set_in_line(bool is) { in_line_ = is; }
 
   bool born() const { return !members_.empty(); }
-  bool finished() const { return members_.empty() && !run_ && queue_.empty() && announcements_.empty(); }
+  bool finished() const {
+    return members_.empty() && !run_ && queue_.empty() && failures_.empty() && announcements_.empty();
+  }
   const std::string& name() const { return name_; }
   std::shared_ptr<const GroupAttributes> attributes() const { return attributes_; }
   const Membership& member_ids() const { return *member_ids_; }
