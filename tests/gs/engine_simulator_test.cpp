@@ -1,5 +1,6 @@
-// Random groups under random faults: three replicas of the engine are given the same events, the model of what all
-// clients believe is checked after every step, and at the end everything that was promised must come.
+// Random groups under random faults: three replicas of the engine are given the same events, and two of them are
+// now and then replaced by a snapshot of one. The model of what all clients believe is checked after every step,
+// and at the end everything that was promised must come.
 //
 // GS_SIM_SEED=n runs the one episode that a failure names and tells each step, GS_SIM_STEPS=n changes the number
 // of steps in all.
@@ -216,6 +217,16 @@ class Episode {
     error_ += "the votes do not come to an end\n";
   }
 
+  /// One of the others becomes what the first or another one is.
+  void replace_a_replica() {
+    const auto state = replicas_[0].snapshot();
+    Engine& replaced = replicas_[1 + random_.below(2)];
+    std::string why;
+    if (!replaced.restore(replicas_[random_.below(3)].snapshot(), &why)) error_ += why + "\n";
+    for (const Engine& replica : replicas_)
+      if (replica.snapshot() != state) error_ += "replicas have different snapshots\n";
+  }
+
   void apply(const Event& event) {
     outcome_ = replicas_[0].apply(event);
     const std::uint64_t state = replicas_[0].digest();
@@ -223,6 +234,7 @@ class Episode {
       if (!same(replicas_[i].apply(event), outcome_)) error_ += "replicas say different things\n";
       if (replicas_[i].digest() != state) error_ += "replicas are in different states\n";
     }
+    if (random_.chance(3)) replace_a_replica();
     model_.follow(event, outcome_, replicas_[0]);
     error_ += model_.errors();
     timers_.insert(timers_.end(), outcome_.timers.begin(), outcome_.timers.end());

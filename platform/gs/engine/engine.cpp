@@ -1,29 +1,18 @@
 #include "engine/engine.h"
 
 #include <algorithm>
-#include <deque>
 #include <limits>
-#include <map>
-#include <set>
 
 #include "engine/checks.h"
 #include "engine/digest.h"
-#include "engine/group.h"
-#include "engine/subscribers.h"
+#include "engine/snapshot.h"
+#include "engine/state.h"
 
 namespace gs {
 
-struct Engine::State {
-  explicit State(const Limits& wanted) : limits(wanted) {}
+struct Engine::State : EngineState {
+  using EngineState::EngineState;
 
-  const Limits limits;
-  Ledger ledger{limits};  // before all that is charged
-  std::map<std::string, Group> groups;
-  std::deque<std::string> line;  // the unfinished groups, in the order in which they are gone on with
-  SubscriberTable subscribers;
-  ClientTable clients;
-  std::set<std::uint32_t> gone_hosts;
-  std::uint64_t last_protocol = 0;
   std::size_t work_left = 0;  // of the event that is being applied
 
   Surroundings surroundings(Outcome& out) {
@@ -380,6 +369,15 @@ std::vector<Engine::GroupStatus> Engine::status() const {
     all.push_back(std::move(status));
   }
   return all;
+}
+
+std::vector<std::byte> Engine::snapshot() const { return write_snapshot(*state_); }
+
+bool Engine::restore(const std::vector<std::byte>& snapshot, std::string* error) {
+  auto restored = std::make_unique<State>(state_->limits);
+  if (!read_snapshot(snapshot, *restored, error)) return false;
+  state_ = std::move(restored);
+  return true;
 }
 
 std::uint64_t Engine::digest() const {

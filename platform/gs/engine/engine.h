@@ -12,6 +12,7 @@
 // protocols stand in protocols.h, what a subscriber hears in subscribers.h, the limits in types.h and limits.h.
 #pragma once
 
+#include <cstddef>
 #include <memory>
 #include <string>
 #include <vector>
@@ -58,6 +59,15 @@ class Engine {
     bool unfinished = false;  // a ContinueEvent goes on with it
   };
   std::vector<GroupStatus> status() const;
+
+  /// The whole state, equal for engines that have been given the same events. Nothing: it is more than a snapshot
+  /// can hold, 1.5 GiB of values.
+  std::vector<std::byte> snapshot() const;
+
+  /// Becomes what the engine was that the snapshot is of, and from the next event on says what that one says; who
+  /// restores arms the timers of the phases that run. False: the snapshot is damaged, of another version or made
+  /// under other limits, as `error` says, and nothing has changed.
+  bool restore(const std::vector<std::byte>& snapshot, std::string* error);
 
   /// A digest of the whole state; equal for engines that have been given the same events.
   std::uint64_t digest() const;

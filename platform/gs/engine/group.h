@@ -106,6 +106,10 @@ class Group {
   void add_to(Digest& digest) const;
 
  private:
+  // The two sides of a snapshot (snapshot.h).
+  friend class GroupWriter;
+  friend class GroupReader;
+
   struct Queued {
     MemberPtr who;
     std::variant<JoinRequest, LeaveRequest> request;

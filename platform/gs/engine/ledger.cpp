@@ -1,5 +1,6 @@
 #include "engine/ledger.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace gs {
@@ -52,6 +53,18 @@ bool Ledger::has_room(const Payer& payer, std::size_t bytes) const {
   const std::size_t total = root ? limits_.total_bytes : limits_.total_bytes - limits_.total_bytes / 8;
   return fits(bytes_of(sessions_, payer.session), bytes, limits_.session_bytes) &&
          (root || fits(bytes_of(users_, payer.user), bytes, limits_.user_bytes)) && fits(total_, bytes, total);
+}
+
+bool Ledger::within_limits() const {
+  const auto over = [](std::size_t limit) {
+    return [limit](const auto& account) { return account.second > limit; };
+  };
+  const auto over_for_user = [&](const auto& account) {
+    return account.first != 0 && account.second > limits_.user_bytes;
+  };
+  return total_ <= limits_.total_bytes &&
+         std::none_of(sessions_.begin(), sessions_.end(), over(limits_.session_bytes)) &&
+         std::none_of(users_.begin(), users_.end(), over_for_user);
 }
 
 void Ledger::take_back(const Payer& payer, std::size_t bytes) {

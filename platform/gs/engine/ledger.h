@@ -30,6 +30,7 @@ class Ledger {
     Charge(Charge&& other) noexcept;
     Charge& operator=(Charge&& other) noexcept;
     ~Charge();
+    const Payer& payer() const { return payer_; }
 
    private:
     Ledger* ledger_ = nullptr;
@@ -44,6 +45,8 @@ class Ledger {
   /// Whether `bytes` more are within all limits.
   bool has_room(const Payer& payer, std::size_t bytes) const;
   std::size_t total() const { return total_; }
+  /// Whether what is charged could have come about under the limits.
+  bool within_limits() const;
 
  private:
   void take_back(const Payer& payer, std::size_t bytes);

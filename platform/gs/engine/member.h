@@ -17,6 +17,11 @@ struct Ballot {
   std::uint32_t summary = 0;                      // flags of wyx_summary_code_t, of the vote
   Value proposed_state;                           // kept only where vote results are collected
   Value message;
+  /// As it is while its member has had no part in the protocol.
+  bool unused() const {
+    return !open && vote == WYX_NULL_VOTE && default_vote == WYX_NULL_VOTE && summary == 0 && !proposed_state &&
+           !message;
+  }
 };
 
 struct Member {

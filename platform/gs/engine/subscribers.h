@@ -42,11 +42,21 @@ struct GroupView {
 /// end its subscription in the client. It gets a first notification again when the group is born again.
 class SubscriberTable {
  public:
+  using OfGroup = std::map<std::uint64_t, Subscriber>;  // by number
+  using Groups = std::map<std::string, OfGroup>;        // those with subscribers
+
+  SubscriberTable() = default;
+  /// As another one was; no number is greater than `last_subscription`.
+  SubscriberTable(Groups groups, std::uint64_t last_subscription)
+      : groups_(std::move(groups)), last_subscription_(last_subscription) {}
+
   /// Returns the subscription's number, greater than those before it.
   std::uint64_t add(const std::string& group, Subscriber subscriber);
   /// It must be one of the group's.
   void remove(const std::string& group, std::uint64_t subscription);
   std::size_t count(const std::string& group) const;
+  const Groups& groups() const { return groups_; }
+  std::uint64_t last_subscription() const { return last_subscription_; }
 
   /// The first notification of a group that is there already.
   static void greet(const Endpoint& to, std::uint32_t control, const GroupView& view, std::vector<Delivery>& out);
@@ -59,7 +69,7 @@ class SubscriberTable {
   void add_to(Digest& digest) const;
 
  private:
-  std::map<std::string, std::map<std::uint64_t, Subscriber>> groups_;  // by number
+  Groups groups_;
   std::uint64_t last_subscription_ = 0;
 };
 

@@ -4,7 +4,7 @@
 #include <bit>
 #include <cstring>
 
-#include "wire/enumerations.h"
+#include "engine/enumerations.h"
 #include "wire/fb_codec.h"
 
 namespace gs::wire {
@@ -82,7 +82,7 @@ bool known_value(const E& value) {
   static_assert(sizeof(E) == sizeof(int));
   int number = 0;
   std::memcpy(&number, &value, sizeof number);
-  return detail::known(static_cast<E*>(nullptr), number);
+  return known(static_cast<E*>(nullptr), number);
 }
 
 bool fits(const std::string& name) { return name.size() <= kMaxWireName && name.find('\0') == std::string::npos; }

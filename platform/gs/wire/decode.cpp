@@ -1,9 +1,9 @@
 #include <algorithm>
 
+#include "engine/enumerations.h"
 #include "gs_generated.h"
 #include "wire/codec.h"
 #include "wire/coherence.h"
-#include "wire/enumerations.h"
 #include "wire/fb_codec.h"
 
 namespace gs::wire::detail {

@@ -5,7 +5,7 @@
 
 #include "gscl/wyx_api.h"
 
-namespace gs::wire::detail {
+namespace gs {
 
 /// For wyx_num_phases_t 0, "not set", passes as well: what it means is the engine's to say.
 constexpr bool known(wyx_num_phases_t*, int value) { return value >= 0 && value <= WYX_N_PHASE; }
@@ -44,4 +44,4 @@ inline constexpr std::uint32_t kSubscriptionTypeBits = WYX_SUBSCRIPTION_STATE | 
                                                        WYX_SUBSCRIPTION_DELTA_LEAVE | WYX_SUBSCRIPTION_MEMBERSHIP |
                                                        WYX_SUBSCRIPTION_DISSOLVED | WYX_SUBSCRIPTION_PERSISTENT;
 
-}  // namespace gs::wire::detail
+}  // namespace gs

@@ -1,0 +1,29 @@
+// All that an engine knows.
+#pragma once
+
+#include <deque>
+#include <map>
+#include <set>
+#include <string>
+
+#include "engine/clients.h"
+#include "engine/group.h"
+#include "engine/ledger.h"
+#include "engine/subscribers.h"
+
+namespace gs {
+
+struct EngineState {
+  explicit EngineState(const Limits& wanted) : limits(wanted) {}
+
+  const Limits limits;
+  Ledger ledger{limits};  // before all that is charged
+  std::map<std::string, Group> groups;
+  std::deque<std::string> line;  // the unfinished groups, in the order in which they are gone on with
+  SubscriberTable subscribers;
+  ClientTable clients;
+  std::set<std::uint32_t> gone_hosts;
+  std::uint64_t last_protocol = 0;
+};
+
+}  // namespace gs
