@@ -180,7 +180,7 @@ class GroupWriter {
 
 std::vector<std::byte> write_snapshot(const EngineState& state) {
   if (state.ledger.total() > kMostKept) return {};
-  Builder b;
+  Builder b(state.ledger.total() + 4096);  // rather than grow, and copy what it has, again and again
   Offsets<fb::Group> groups;
   std::map<std::string_view, std::uint32_t> indices;
   for (const auto& [name, group] : state.groups) {
