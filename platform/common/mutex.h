@@ -6,6 +6,8 @@
 
 #include <ctime>
 
+#include "common/sanitizers.h"
+
 #if defined(__clang__)
 #define ZN_ANNOTATION(x) __attribute__((x))
 #else
@@ -27,7 +29,7 @@ class ZN_ANNOTATION(capability("mutex")) Mutex {
   /// False: others had it for so long.
   bool lock_within(int seconds) ZN_ANNOTATION(try_acquire_capability(true)) {
     timespec until{};
-#if defined(__SANITIZE_THREAD__)  // which follows no other timed lock
+#if ZN_THREAD_SANITIZER  // which follows no other timed lock
     clock_gettime(CLOCK_REALTIME, &until);
     until.tv_sec += seconds;
     return pthread_mutex_timedlock(&mutex_, &until) == 0;

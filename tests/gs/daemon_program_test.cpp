@@ -9,6 +9,7 @@
 #include <fstream>
 #include <iterator>
 
+#include "common/sanitizers.h"
 #include "daemon/options.h"
 #include "support/gsd_process.h"
 #include "support/raw_client.h"
@@ -114,13 +115,7 @@ TEST(DaemonProgram, ProcessThatEndsWhileItsChildHoldsTheSockets_IsLostOnceItsLas
 }
 
 TEST(DaemonProgram, IdleClients_CostAtMost64KiBEach) {
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-  GTEST_SKIP() << "sanitizers have memory of their own";
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-  GTEST_SKIP() << "sanitizers have memory of their own";
-#endif
-#endif
+  if (ZN_ADDRESS_SANITIZER || ZN_THREAD_SANITIZER) GTEST_SKIP() << "sanitizers have memory of their own";
   GsdProcess gsd;
   const auto resident = [&gsd] {
     std::ifstream statm("/proc/" + std::to_string(gsd.pid()) + "/statm");

@@ -10,22 +10,14 @@
 #include <deque>
 #include <iostream>
 
+#include "common/sanitizers.h"
 #include "gs/engine_model.h"
 #include "gs/made_up_request.h"
 
 namespace gs::test {
 namespace {
 
-#if defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-#define GS_SIM_SLOW 1
-#endif
-#endif
-#if defined(GS_SIM_SLOW) || defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr std::uint64_t kSteps = 60'000;
-#else
-constexpr std::uint64_t kSteps = 1'000'000;
-#endif
+constexpr std::uint64_t kSteps = ZN_ADDRESS_SANITIZER || ZN_THREAD_SANITIZER ? 60'000 : 1'000'000;
 constexpr std::uint64_t kEpisode = 2'000;  // steps
 
 /// The same numbers on every platform.

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "peek.h"
+#include "platform/common/sanitizers.h"
 
 namespace {
 
@@ -36,10 +37,7 @@ std::atomic<bool> noise{false};
 
 }  // namespace
 
-#if !defined(__has_feature)
-#define __has_feature(x) 0
-#endif
-#if !__has_feature(thread_sanitizer) && !__has_feature(address_sanitizer)
+#if !ZN_THREAD_SANITIZER && !ZN_ADDRESS_SANITIZER
 extern "C" __attribute__((visibility("default"))) int pthread_mutex_lock(pthread_mutex_t* mutex) noexcept {
   using Lock = int (*)(pthread_mutex_t*);
   static std::atomic<Lock> real{nullptr};

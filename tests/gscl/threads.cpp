@@ -12,6 +12,7 @@
 
 #include "gscl/GSDebug.h"
 #include "peek.h"
+#include "platform/common/sanitizers.h"
 #include "zn_cu.h"
 
 namespace {
@@ -314,10 +315,7 @@ TEST(Thread, lines_ofStartStopFailureAndDestruction) {
 }
 
 // The sanitizer does not know that a cancelled join has not joined.
-#if !defined(__has_feature)
-#define __has_feature(x) 0
-#endif
-#if !__has_feature(thread_sanitizer)
+#if !ZN_THREAD_SANITIZER
 TEST(Thread, cancelledJoin_leavesTheThreadToBeJoined) {
   Waiter thread;
   thread.start(nullptr);

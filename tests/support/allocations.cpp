@@ -20,7 +20,7 @@ Refuse::~Refuse() { left = -1; }
 
 }  // namespace allocations
 
-#ifndef ALLOCATIONS_ARE_THE_SANITIZERS
+#if !ZN_THREAD_SANITIZER
 
 namespace {
 

@@ -1,22 +1,12 @@
 // Counts and refuses allocations of the calling thread, by replacing operator new of the test program.
 #pragma once
 
-#if defined(__SANITIZE_THREAD__)
-#define ALLOCATIONS_ARE_THE_SANITIZERS
-#elif defined(__has_feature)
-#if __has_feature(thread_sanitizer)
-#define ALLOCATIONS_ARE_THE_SANITIZERS
-#endif
-#endif
+#include "platform/common/sanitizers.h"
 
 namespace allocations {
 
 /// False under ThreadSanitizer, which insists on its own operator new: nothing is counted or refused then.
-#ifdef ALLOCATIONS_ARE_THE_SANITIZERS
-constexpr bool kControlled = false;
-#else
-constexpr bool kControlled = true;
-#endif
+constexpr bool kControlled = !ZN_THREAD_SANITIZER;
 
 /// Allocations of this thread so far.
 long count();
