@@ -181,6 +181,7 @@ class Model {
     }
   }
   void before(const ContinueEvent&, const Outcome&) {}
+  void before(const NumbersEvent&, const Outcome&) {}
   void before(const TimerExpiredEvent& event, const Outcome& outcome) {
     const std::string& name = event.timer.group;
     const bool awaited = groups_.contains(name) && groups_[name].timer == event.timer;

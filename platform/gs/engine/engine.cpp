@@ -16,7 +16,8 @@ struct Engine::State : EngineState {
   std::size_t work_left = 0;  // of the event that is being applied
 
   Surroundings surroundings(Outcome& out) {
-    return {out.deliveries, out.timers, subscribers, clients, last_protocol, ledger, limits, work_left};
+    return {out.deliveries, out.timers, subscribers, clients,  last_protocol,
+            numbers_above,  ledger,     limits,      work_left};
   }
 
   const Group* find_group(const std::string& name) const {
@@ -60,6 +61,7 @@ struct Engine::State : EngineState {
   void apply(const TimerExpiredEvent& event, Outcome& out);
   void apply(const ResponsivenessEvent& event, Outcome& out);
   void apply(const ContinueEvent& event, Outcome& out);
+  void apply(const NumbersEvent& event, Outcome& out);
 
   void lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out);
   void settle(const std::string& group, Outcome& out);
@@ -281,6 +283,11 @@ void Engine::State::apply(const ResponsivenessEvent& event, Outcome& out) {
 
 void Engine::State::apply(const ContinueEvent&, Outcome& out) { go_on(out); }
 
+void Engine::State::apply(const NumbersEvent& event, Outcome&) {
+  numbers_above = std::max(numbers_above, event.above);
+  last_protocol = std::max(last_protocol, event.above);
+}
+
 /// All are taken out before any group is told, so that nobody who is lost in this event is sent anything.
 void Engine::State::lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out) {
   while (const auto session = clients.take_session(first, last)) {
@@ -383,6 +390,7 @@ bool Engine::restore(const std::vector<std::byte>& snapshot, std::string* error)
 std::uint64_t Engine::digest() const {
   Digest digest;
   digest.add(state_->last_protocol);
+  digest.add(state_->numbers_above);
   for (std::uint32_t node : state_->gone_hosts) digest.add(node);
   digest.add(state_->ledger.total());
   for (const std::string& name : state_->line) digest.add(name);

@@ -261,6 +261,11 @@ GroupView Group::view() const {
   return view;
 }
 
+std::uint64_t Group::next_number(const Surroundings& env) {
+  seqnum_ = std::max(seqnum_, env.numbers_above) + 1;
+  return seqnum_;
+}
+
 void Group::forget_values() {
   attributes_ = nullptr;
   state_value_ = {std::make_shared<const Bytes>(), nullptr};

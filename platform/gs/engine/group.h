@@ -22,6 +22,7 @@ struct Surroundings {
   SubscriberTable& subscribers;
   ClientTable& clients;
   std::uint64_t& last_protocol;  // numbers are never used twice, so a timer of a dead group's protocol finds none
+  const std::uint64_t& numbers_above;
   Ledger& ledger;
   const Limits& limits;
   std::size_t& work_left;  // units, of this event
@@ -166,6 +167,7 @@ class Group {
   void change_membership(const Run& run);
   void dismiss(const Run& run, Surroundings& env);
   void tell_subscribers(const Run& run, bool was_born, Surroundings& env);
+  std::uint64_t next_number(const Surroundings& env);
   void forget_values();
 
   // What a protocol says (group_protocol.cpp).

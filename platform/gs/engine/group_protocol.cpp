@@ -74,7 +74,7 @@ void Group::open_phase(Surroundings& env) {
   }
   if (run.voted_message && run.traits->message_is_proposal) run.message = run.voted_message;
   run.voted_message = {};
-  note.seqnum = ++seqnum_;
+  note.seqnum = next_number(env);
   send(run, std::move(note), run.voters, env);
   env.timers.push_back({{name_, run.number, run.phase}, run.terms.time_limit});
 }
@@ -170,7 +170,7 @@ void Group::approve(std::uint32_t summary, Surroundings& env) {
   if (run.proposed_state) state_value_ = run.proposed_state;
   if (run.new_attributes) attributes_ = run.new_attributes;
   ProtocolNotification note = compose(run, WYX_APPROVED_NOTIFICATION, summary);
-  note.seqnum = ++seqnum_;
+  note.seqnum = next_number(env);
   send(run, std::move(note), audience, env);
 
   end(run, audience);
@@ -185,7 +185,7 @@ void Group::reject(std::uint32_t summary, Surroundings& env) {
   const bool joins = run.traits->changing_role == ChangingRole::kVote;
   const std::vector<MemberPtr> audience = joins ? joined(members_, run.changing) : members_;
   ProtocolNotification note = compose(run, WYX_REJECTED_NOTIFICATION, summary);
-  note.seqnum = ++seqnum_;
+  note.seqnum = next_number(env);
   send(run, std::move(note), audience, env);
 
   end(run, audience);

@@ -155,6 +155,7 @@ bool read_snapshot(const std::vector<std::byte>& snapshot, EngineState& into, st
   if (!same_limits(*from->limits(), into.limits))
     return in.fail("made under other limits: set the same on all hosts");
   into.last_protocol = from->last_protocol();
+  into.numbers_above = from->numbers_above();
   return read_gone_hosts(in, *from, into) && read_groups(in, *from, into) && read_line(in, *from, into) &&
          read_subscriptions(in, *from, into) &&
          in.require(into.ledger.within_limits(), "more than its limits allow to be kept");

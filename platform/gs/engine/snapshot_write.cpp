@@ -200,7 +200,8 @@ std::vector<std::byte> write_snapshot(const EngineState& state) {
   const auto gone_hosts =
       b.CreateVector(std::vector<std::uint32_t>(state.gone_hosts.begin(), state.gone_hosts.end()));
   b.Finish(fb::CreateSnapshot(b, limits, group_offsets, line_offset, subscription_offsets,
-                              state.subscribers.last_subscription(), gone_hosts, state.last_protocol),
+                              state.subscribers.last_subscription(), gone_hosts, state.last_protocol,
+                              state.numbers_above),
            kSnapshotId);
   const auto* bytes = reinterpret_cast<const std::byte*>(b.GetBufferPointer());
   return {bytes, bytes + b.GetSize()};

@@ -24,6 +24,7 @@ struct EngineState {
   ClientTable clients;
   std::set<std::uint32_t> gone_hosts;
   std::uint64_t last_protocol = 0;
+  std::uint64_t numbers_above = 0;  // every event of a group is numbered above it
 };
 
 }  // namespace gs

@@ -191,6 +191,7 @@ std::string body(const ResponsivenessEvent& e) {
   return name_of(e.session) + (e.responding ? ": responds" : ": does not respond");
 }
 std::string body(const ContinueEvent&) { return "unfinished work goes on"; }
+std::string body(const NumbersEvent& e) { return "numbers go on above " + std::to_string(e.above); }
 
 }  // namespace
 

@@ -190,8 +190,13 @@ struct ResponsivenessEvent {
 /// Goes on with what earlier events have left to do. To be ordered while Engine::busy.
 struct ContinueEvent {};
 
+/// What is numbered from now on has numbers above this one: those below may have named what is not known any more.
+struct NumbersEvent {
+  std::uint64_t above = 0;
+};
+
 using Event = std::variant<RequestEvent, SessionGoneEvent, HostGoneEvent, HostCameEvent, TimerExpiredEvent,
-                           ResponsivenessEvent, ContinueEvent>;
+                           ResponsivenessEvent, ContinueEvent, NumbersEvent>;
 
 // --------------------------------------------------------------------------------------------- notifications
 
