@@ -1,0 +1,108 @@
+// What the daemons of several hosts say to one another, as values.
+//
+// All but Confirmed travels in the one order that every member of a view sees; Confirmed travels beside it, and in
+// it only where the way beside it is shut.
+#pragma once
+
+#include <compare>
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "engine/types.h"
+
+namespace gs::cluster {
+
+/// Raised when daemons of two versions would not understand one another.
+inline constexpr std::uint16_t kProtocolVersion = 1;
+
+using Node = std::uint32_t;  // 1 to 32767
+using Life = std::uint64_t;  // of a daemon, from one reset to the next; random
+
+/// A daemon in the process group.
+struct Process {
+  Node node = 0;
+  std::uint32_t pid = 0;
+  auto operator<=>(const Process&) const = default;
+};
+
+/// A membership of hosts. Of two rings that one host was in, the later has the greater sequence.
+struct RingId {
+  std::uint64_t sequence = 0;
+  Node node = 0;
+  auto operator<=>(const RingId&) const = default;
+};
+
+/// Names an exchange.
+struct BeginId {
+  Life life = 0;             // of who ordered it
+  std::uint64_t number = 0;  // in that life
+  auto operator<=>(const BeginId&) const = default;
+};
+
+/// How much a daemon's state has seen; the greater one is ahead.
+struct History {
+  std::uint64_t ring = 0;       // sequence of the ring in which it last won an exchange
+  std::uint64_t exchanges = 0;  // won in that ring
+  std::uint64_t messages = 0;   // ordered since the last of them
+  std::uint64_t digest = 0;     // of those, and of the exchange
+  auto operator<=>(const History&) const = default;
+};
+
+/// Opens an exchange among those who are in `ring`.
+struct Begin {
+  BeginId id;
+  RingId ring;
+  std::vector<Process> asked;
+  std::map<Node, std::uint32_t> votes;  // in the quorum
+  std::uint32_t needed = 0;             // votes of those who have the state; 0: somebody is enough
+  std::map<Node, std::uint32_t> left;   // leave codes of hosts that went, as far as they are known
+  std::uint64_t clock = 0;              // milliseconds since 1970
+};
+
+/// Answers a begin.
+struct Word {
+  BeginId begin;
+  std::uint16_t version = kProtocolVersion;
+  Life life = 0;
+  std::optional<History> history;  // none: there is no state
+  std::string address;             // for datagrams
+  std::string key;                 // that the sender's datagrams are authenticated with
+};
+
+/// An event of the engine.
+struct Ordered {
+  Life life = 0;
+  std::uint64_t number = 0;  // in that life
+  std::shared_ptr<const Event> event;
+};
+
+/// Part of the state as it was when the decision of an exchange was applied.
+struct Piece {
+  BeginId begin;
+  std::uint32_t index = 0;
+  std::uint32_t count = 0;
+  std::vector<std::byte> bytes;
+};
+
+/// All up to `position` has been received: 1 is the decision of the exchange, each event after it counts one more.
+struct Confirmed {
+  BeginId begin;
+  std::uint64_t position = 0;
+  std::vector<Node> ask;  // who is to repeat its own
+};
+
+/// These hold up the others: the next exchange does not ask them.
+struct Evict {
+  RingId ring;
+  std::vector<Process> who;
+};
+
+using Message = std::variant<Begin, Word, Ordered, Piece, Confirmed, Evict>;
+
+}  // namespace gs::cluster

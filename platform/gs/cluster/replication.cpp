@@ -1,0 +1,484 @@
+#include "cluster/replication.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace gs::cluster {
+namespace {
+
+std::string name_of(const Process& process) {
+  return "node " + std::to_string(process.node) + " (pid " + std::to_string(process.pid) + ")";
+}
+
+bool same(const Lives& lives, Node node, Life life) {
+  const auto found = lives.find(node);
+  return found != lives.end() && found->second == life;
+}
+
+}  // namespace
+
+Replication::Replication(const Settings& settings, Order& order, Replica& replica,
+                         std::function<std::uint64_t()> random, std::function<std::uint64_t()> clock)
+    : settings_(settings),
+      order_(order),
+      replica_(replica),
+      random_(std::move(random)),
+      clock_(std::move(clock)),
+      life_(random_()) {}
+
+const char* Replication::state() const {
+  switch (state_) {
+    case State::kOut:
+      return verdict_ && !verdict_->quorate ? "out: no quorum" : "out";
+    case State::kWaiting:
+      return "waiting for quorum or for others";
+    case State::kExchange:
+      return "exchanging histories";
+    case State::kRunning:
+      return catching_up_ ? "catching up" : serves_ ? "serving" : "waiting for confirmations";
+  }
+  return "";
+}
+
+// ------------------------------------------------------------------------------------- views, rings and verdicts
+
+void Replication::view_changed(const View& view) {
+  if (state_ == State::kOut) {
+    if (!joining_ || std::ranges::find(view.joined, settings_.self) == view.joined.end()) return;
+    joining_ = false;
+  } else if (std::ranges::find(view.members, settings_.self) == view.members.end()) {
+    return lose("it is out of the process group");
+  }
+  view_ = view.members;
+  std::ranges::sort(view_);
+  std::erase_if(evicted_, [this](const Process& p) { return !std::ranges::binary_search(view_, p); });
+  for (const auto& [process, code] : view.left) left_[process.node] = code;
+  stop();
+}
+
+void Replication::ring_changed(const RingId& ring) {
+  if (ring == ring_) return;
+  ring_ = ring;
+  if (state_ == State::kOut || !keeps(Rule::kEveryRing)) return;
+  stop();
+}
+
+void Replication::verdict(const Verdict& verdict) {
+  if (verdict_ && verdict.ring.sequence < verdict_->ring.sequence) return;
+  verdict_ = verdict;
+  if (!verdict.quorate && joining_) {
+    order_.leave();
+    joining_ = false;
+  }
+  if (state_ == State::kOut) return join_if_quorate();
+  if (!verdict.quorate && verdict.ring.sequence >= ring_.sequence) return lose("this host has no quorum");
+  begin_if_lowest();
+  answer_begin();
+  apply_confirmed();
+}
+
+/// The ring that this daemon is in has quorum, and no later one is known of.
+bool Replication::goes_on() const {
+  if (!keeps(Rule::kVerdictFirst)) return true;
+  if (!verdict_ || !verdict_->quorate) return false;
+  return verdict_->ring == ring_ || (!keeps(Rule::kPassOver) && verdict_->ring.sequence > ring_.sequence);
+}
+
+void Replication::stop() {
+  state_ = State::kWaiting;
+  exchange_.reset();
+  catching_up_.reset();
+  donation_.reset();
+  begun_ = false;
+  progress();
+  if (verdict_ && !verdict_->quorate && verdict_->ring.sequence >= ring_.sequence)
+    return lose("this host has no quorum");
+  begin_if_lowest();
+}
+
+void Replication::join_if_quorate() {
+  if (state_ != State::kOut || joining_ || !verdict_ || !verdict_->quorate || now_ < join_from_) return;
+  joining_ = true;
+  order_.join();
+}
+
+void Replication::gone(const std::string& why) {
+  verdict_.reset();
+  joining_ = false;
+  if (state_ != State::kOut) lose(why);
+}
+
+void Replication::lose(const std::string& why) {
+  if (state_ == State::kOut) return;
+  state_ = State::kOut;
+  serves_ = aside_ = begun_ = answered_ = false;
+  life_ = random_();
+  begins_ = sent_ = told_ = 0;
+  view_.clear();
+  evicted_.clear();
+  left_.clear();
+  exchange_.reset();
+  catching_up_.reset();
+  donation_.reset();
+  decision_.reset();
+  confirmations_.clear();
+  own_ = {};
+  order_.leave();
+  join_from_ = now_ + pause_;
+  pause_ = std::min(2 * pause_, kLongestPause);
+  replica_.reset(why);
+}
+
+// ----------------------------------------------------------------------------------------------------- exchanges
+
+std::vector<Process> Replication::not_evicted() const {
+  std::vector<Process> rest;
+  std::ranges::copy_if(view_, std::back_inserter(rest),
+                       [this](const Process& p) { return !evicted_.contains(p); });
+  return rest;
+}
+
+void Replication::begin_if_lowest() {
+  if (state_ != State::kWaiting || begun_ || !goes_on()) return;
+  const auto rest = not_evicted();
+  if (!rest.empty() && rest.front() == settings_.self) order_begin(rest);
+}
+
+void Replication::order_begin(std::vector<Process> asked) {
+  begun_ = true;
+  Begin begin;
+  begin.id = {life_, ++begins_};
+  begin.ring = ring_;
+  begin.votes = verdict_->votes;
+  const bool all = asked.size() == view_.size();
+  begin.needed = all || !keeps(Rule::kVotesOfHolders) ? 0 : verdict_->needed;
+  begin.asked = std::move(asked);
+  begin.left = left_;
+  begin.clock = clock_();
+  order_.send(begin);
+}
+
+void Replication::received(const Process& from, const Message& message) {
+  if (state_ == State::kOut) return;
+  std::visit([&](const auto& m) { on(from, m); }, message);
+}
+
+void Replication::on(const Process&, const Begin& begin) {
+  if (begin.ring != ring_) return;
+  state_ = State::kExchange;
+  exchange_.emplace(begin);
+  catching_up_.reset();
+  donation_.reset();
+  confirmations_.clear();
+  answered_ = false;
+  progress();
+  for (const Process& asked : begin.asked) evicted_.erase(asked);
+  if (exchange_->asks(settings_.self)) {
+    history_at_begin_ = own_.history;
+    answer_begin();
+  } else if (keeps(Rule::kEvictedBeginsAgain) && goes_on()) {
+    order_begin(view_);
+  }
+}
+
+void Replication::answer_begin() {
+  if (state_ != State::kExchange || answered_ || !exchange_->asks(settings_.self) || !goes_on()) return;
+  answered_ = true;
+  Word word;
+  word.begin = exchange_->begin().id;
+  word.life = life_;
+  word.history = history_at_begin_;
+  if (word.history && !keeps(Rule::kHistoryOfRing)) word.history->ring = 0;
+  if (word.history && !keeps(Rule::kHistoryOfExchanges)) word.history->exchanges = 0;
+  if (word.history && !keeps(Rule::kHistoryOfMessages)) word.history->messages = 0;
+  word.address = order_.address();
+  word.key = order_.key();
+  order_.send(word);
+}
+
+void Replication::on(const Process& from, const Word& word) {
+  if (state_ != State::kExchange) return;
+  Word taken = word;
+  if (!keeps(Rule::kWordNamesBegin)) taken.begin = exchange_->begin().id;
+  exchange_->add(from.node, taken);
+  progress();
+  conclude();
+}
+
+void Replication::conclude() {
+  const auto decision = exchange_->decision();
+  if (!decision) return;
+  if (!exchange_->asks(settings_.self)) {
+    if (keeps(Rule::kEvictedIsToldToLose)) lose("the others went on without it: it did not answer in time");
+    return;
+  }
+  if (!fits(*decision)) return;
+  state_ = State::kRunning;
+  decision_ = decision;
+  order_.set_peers(exchange_->words());
+  if (same(decision->holders, settings_.self.node, life_))
+    become_holder(decision);
+  else
+    catch_up(decision);
+  confirmations_[settings_.self.node] = 1;
+  told_ = 0;
+  left_.clear();
+  apply_confirmed();
+}
+
+/// A daemon that speaks another version than those who have the state cannot be among them.
+bool Replication::fits(const Decision& decision) const {
+  const auto& words = exchange_->words();
+  const std::uint16_t version = words.at(decision.holders.begin()->first).version;
+  if (version == kProtocolVersion) return true;
+  replica_.give_up("the daemons of this cluster speak protocol version " + std::to_string(version) + ", not " +
+                   std::to_string(kProtocolVersion));
+  return false;
+}
+
+void Replication::become_holder(const std::shared_ptr<const Decision>& decision) {
+  aside_ = false;
+  own_.append(decision);
+}
+
+/// Its own state is kept until it has the others': they may be gone before.
+void Replication::catch_up(const std::shared_ptr<const Decision>& decision) {
+  aside_ = true;
+  if (!keeps(Rule::kAside)) own_ = {};
+  catching_up_.emplace();
+  catching_up_->track.append(decision);
+  if (!std::exchange(serves_, false)) return;
+  life_ = random_();
+  begins_ = sent_ = 0;
+  replica_.drop_clients("other hosts have gone on without this one");
+}
+
+// --------------------------------------------------------------------------------------- receiving and applying
+
+void Replication::submit(const Event& event) {
+  if (serves_) order_.send(Ordered{life_, ++sent_, std::make_shared<const Event>(event)});
+}
+
+void Replication::on(const Process& from, const Ordered& ordered) {
+  Track& track = current();
+  if (!catching_up_ && aside_) return;
+  if (!track.history || (keeps(Rule::kLives) && !track.counts(from.node, ordered.life))) return;
+  if (track.waiting.empty()) progress();
+  track.append(ordered);
+  if (state_ != State::kRunning) return;
+  confirmations_[settings_.self.node] = track.received;
+  if (!settings_.safe) apply_confirmed();
+}
+
+void Replication::settle() {
+  if (state_ != State::kRunning) return;
+  apply_confirmed();
+  if (state_ != State::kRunning || told_ == current().received) return;
+  told_ = current().received;
+  order_.confirm({exchange_->begin().id, told_, {}});
+}
+
+void Replication::confirmed(Node from, const Confirmed& confirmed) {
+  if (!exchange_) return;
+  if (keeps(Rule::kConfirmNamesExchange) && confirmed.begin != exchange_->begin().id) return;
+  std::uint64_t& known = confirmations_[from];
+  known = std::max(known, confirmed.position);
+  apply_confirmed();
+}
+
+std::uint64_t Replication::confirmed_by_all() const {
+  std::uint64_t position = current().received;
+  for (const auto& [node, life] : decision_->asked) {
+    const auto found = confirmations_.find(node);
+    position = std::min(position, found == confirmations_.end() ? 0 : found->second);
+  }
+  if (!keeps(Rule::kConfirmAll)) return current().received;
+  if (!keeps(Rule::kConfirmDecision)) return std::max<std::uint64_t>(position, 1);
+  return settings_.safe || position == 0 ? position : current().received;
+}
+
+void Replication::apply_confirmed() {
+  if (state_ != State::kRunning || catching_up_ || !goes_on()) return;
+  const std::uint64_t position = confirmed_by_all();
+  while (state_ == State::kRunning && !own_.waiting.empty() && own_.waiting.front().position <= position) {
+    const Entry entry = std::move(own_.waiting.front());
+    own_.waiting.pop_front();
+    progress();
+    if (const auto* event = std::get_if<std::shared_ptr<const Event>>(&entry.what))
+      replica_.apply(**event);
+    else
+      apply(*std::get<std::shared_ptr<const Decision>>(entry.what));
+  }
+}
+
+/// Who is there is what the engine knows: whose life does not go on has failed, whatever came before.
+void Replication::apply(const Decision& decision) {
+  bool somebody_gone = own_.hosts.empty();
+  for (const auto& [node, life] : own_.hosts) {
+    if (same(decision.holders, node, life)) continue;
+    if (!keeps(Rule::kHostsAreState) && !decision.left.contains(node)) continue;
+    const auto code = decision.left.find(node);
+    replica_.apply(
+        HostGoneEvent{node, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
+    somebody_gone = true;
+  }
+  if (somebody_gone && keeps(Rule::kNumbersGoOn)) replica_.apply(NumbersEvent{decision.numbers});
+  for (const auto& [node, life] : decision.holders) {
+    if (!same(own_.hosts, node, life)) replica_.apply(HostCameEvent{node});
+  }
+  own_.hosts = decision.holders;
+  if (state_ != State::kRunning || decision.begin != decision_->begin) return;
+  serve(decision);
+  donate(decision);
+}
+
+void Replication::serve(const Decision& decision) {
+  Domain domain;
+  for (const auto& [node, life] : decision.holders) {
+    if (node < settings_.self.node) ++domain.rank;
+    domain.nodes.push_back(node);
+  }
+  serves_ = true;
+  pause_ = kFirstPause;
+  replica_.serve(domain);
+}
+
+// ------------------------------------------------------------------------------------------ state for newcomers
+
+void Replication::donate(const Decision& decision) {
+  const bool lowest = decision.holders.begin()->first == settings_.self.node;
+  if (!lowest || decision.holders.size() == decision.asked.size()) return;
+  donation_ = Donation{decision.begin, replica_.snapshot()};
+  if (donation_->bytes.empty()) {
+    replica_.log("the state is too large to be sent: no other host can come");
+    return donation_.reset();
+  }
+  donation_->count = static_cast<std::uint32_t>((donation_->bytes.size() + settings_.piece - 1) / settings_.piece);
+  for (std::size_t i = 0; i < kPiecesUnderWay; ++i) send_piece();
+}
+
+void Replication::send_piece() {
+  if (donation_->sent == donation_->count) return;
+  const std::size_t from = donation_->sent * settings_.piece;
+  const std::size_t length = std::min(settings_.piece, donation_->bytes.size() - from);
+  const auto first = donation_->bytes.begin() + static_cast<std::ptrdiff_t>(from);
+  order_.send(Piece{donation_->begin,
+                    donation_->sent++,
+                    donation_->count,
+                    {first, first + static_cast<std::ptrdiff_t>(length)}});
+}
+
+void Replication::on(const Process& from, const Piece& piece) {
+  if (donation_ && from == settings_.self && piece.begin == donation_->begin) return send_piece();
+  if (!catching_up_ || (keeps(Rule::kPieceNamesBegin) && piece.begin != exchange_->begin().id)) return;
+  if (piece.index != catching_up_->next) return;
+  ++catching_up_->next;
+  catching_up_->bytes.insert(catching_up_->bytes.end(), piece.bytes.begin(), piece.bytes.end());
+  progress();
+  if (catching_up_->next == piece.count) take_state(from);
+}
+
+void Replication::take_state(const Process& from) {
+  std::string error;
+  if (!replica_.restore(catching_up_->bytes, &error))
+    return lose("the state that " + name_of(from) + " sent does not fit: " + error);
+  own_ = std::move(catching_up_->track);
+  own_.hosts = decision_->holders;
+  own_.waiting.pop_front();  // the decision: the state is what it led to
+  catching_up_.reset();
+  aside_ = false;
+  apply_confirmed();
+  if (state_ != State::kRunning) return;
+  if (keeps(Rule::kBeginWhenCaughtUp)) return order_begin(not_evicted());
+  serve(*decision_);
+}
+
+// ------------------------------------------------------------------------------------------------ time and limits
+
+void Replication::on(const Process& from, const Confirmed& confirmed) {
+  this->confirmed(from.node, confirmed);
+  if (state_ == State::kRunning && std::ranges::find(confirmed.ask, settings_.self.node) != confirmed.ask.end())
+    confirm_in_order({});
+}
+
+void Replication::confirm_in_order(std::vector<Node> ask) {
+  told_ = current().received;
+  order_.send(Confirmed{exchange_->begin().id, told_, std::move(ask)});
+}
+
+/// The way beside the order may be shut.
+void Replication::ask_again() {
+  repeated_ = now_;
+  auto ask = unconfirmed();
+  if (!ask.empty()) confirm_in_order(std::move(ask));
+}
+
+std::vector<Node> Replication::unconfirmed() const {
+  std::vector<Node> nodes;
+  const std::uint64_t wanted = current().waiting.empty() ? 0 : current().waiting.front().position;
+  for (const auto& [node, life] : decision_->asked) {
+    const auto found = confirmations_.find(node);
+    if ((found == confirmations_.end() ? 0 : found->second) < wanted) nodes.push_back(node);
+  }
+  return nodes;
+}
+
+std::vector<Process> Replication::who_holds_up() const {
+  if (!goes_on()) return {};
+  const auto rest = not_evicted();
+  if (state_ == State::kWaiting) return rest.empty() ? rest : std::vector{rest.front()};
+  if (state_ == State::kExchange) return exchange_->missing();
+  if (state_ != State::kRunning) return {};
+  auto nodes = unconfirmed();
+  if (nodes.empty() && catching_up_) nodes.push_back(decision_->holders.begin()->first);
+  std::vector<Process> holders_up;
+  std::ranges::copy_if(rest, std::back_inserter(holders_up), [&](const Process& process) {
+    return std::ranges::find(nodes, process.node) != nodes.end();
+  });
+  return holders_up;
+}
+
+/// The lowest of the others does, and each next one a while later: it may be gone.
+void Replication::evict_who_holds_up() {
+  const auto who = who_holds_up();
+  if (who.empty() || std::ranges::find(who, settings_.self) != who.end()) return;
+  Duration rank{0};
+  for (const Process& process : not_evicted()) {
+    if (process == settings_.self) break;
+    if (std::ranges::find(who, process) == who.end()) rank += kBetweenRanks;
+  }
+  if (now_ < progressed_ + settings_.member_timeout + rank) return;
+  progress();
+  for (const Process& process : who) replica_.log(name_of(process) + " does not answer and is left out");
+  order_.send(Evict{ring_, who});
+}
+
+void Replication::on(const Process&, const Evict& evict) {
+  if (evict.ring != ring_) return;
+  evicted_.insert(evict.who.begin(), evict.who.end());
+  stop();
+}
+
+bool Replication::waits_for_others() const {
+  return state_ == State::kRunning ? catching_up_ || !own_.waiting.empty() : state_ != State::kOut;
+}
+
+std::optional<Time> Replication::next_deadline() const {
+  if (state_ == State::kOut) {
+    const bool wants_in = verdict_ && verdict_->quorate && !joining_;
+    return wants_in ? std::optional(join_from_) : std::nullopt;
+  }
+  if (!waits_for_others()) return std::nullopt;
+  const Time evict = std::max(progressed_ + settings_.member_timeout, now_ + kBetweenRanks);
+  return state_ == State::kRunning ? std::min(evict, std::max(progressed_, repeated_) + kRepeat) : evict;
+}
+
+void Replication::advance(Time now) {
+  now_ = now;
+  if (state_ == State::kOut) return join_if_quorate();
+  if (!waits_for_others()) return;
+  if (state_ == State::kRunning && now >= std::max(progressed_, repeated_) + kRepeat) ask_again();
+  evict_who_holds_up();
+}
+
+}  // namespace gs::cluster

@@ -1,0 +1,59 @@
+// A state of the engine as the order sees it: how far it is ahead, and what it has received and not applied.
+#pragma once
+
+#include <deque>
+#include <optional>
+
+#include "cluster/messages.h"
+
+namespace gs::cluster {
+
+using Lives = std::map<Node, Life>;
+
+/// How an exchange ended. An event itself: it is confirmed and applied in its place in the order.
+struct Decision {
+  BeginId begin;
+  Lives holders;  // whose state goes on
+  Lives asked;    // whose messages count from now on, and whose confirmations are waited for
+  History history;
+  std::map<Node, std::uint32_t> left;
+  std::uint64_t numbers = 0;  // above which the engine's go on where somebody is gone
+};
+
+struct Entry {
+  std::uint64_t position = 0;  // that everybody has to confirm
+  std::variant<std::shared_ptr<const Event>, std::shared_ptr<const Decision>> what;
+};
+
+struct Track {
+  std::optional<History> history;  // with what was received; none: there is no state
+  Lives lives;                     // of the last exchange
+  Lives hosts;                     // that the engine knows
+  std::deque<Entry> waiting;       // received and not applied
+  std::uint64_t received = 0;      // position of the last
+
+  bool counts(Node from, Life life) const {
+    const auto found = lives.find(from);
+    return found != lives.end() && found->second == life;
+  }
+  void append(const Ordered& message) {
+    ++history->messages;
+    history->digest = mix(mix(history->digest, message.life), message.number);
+    waiting.push_back({++received, message.event});
+  }
+  /// What an older view may have confirmed counts no more: it has to be confirmed with the decision.
+  void append(const std::shared_ptr<const Decision>& decision) {
+    for (Entry& entry : waiting) entry.position = 1;
+    history = decision->history;
+    lives = decision->asked;
+    received = 1;
+    waiting.push_back({received, decision});
+  }
+
+  static std::uint64_t mix(std::uint64_t digest, std::uint64_t word) {
+    digest = (digest ^ word) * 0x9E3779B97F4A7C15u;
+    return digest ^ (digest >> 29);
+  }
+};
+
+}  // namespace gs::cluster
