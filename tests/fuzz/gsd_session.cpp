@@ -116,7 +116,7 @@ class Run {
     return limits;
   }
 
-  MemoryDaemon daemon_{{1, kQueueBound}, limits()};
+  MemoryDaemon daemon_{{kQueueBound}, limits()};
   MemoryClient good_{daemon_};
   std::vector<ConnectionId> open_;
   wire::Welcome last_welcome_;

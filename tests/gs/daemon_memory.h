@@ -55,7 +55,7 @@ class MemoryTransport : public Transport {
 };
 
 struct MemoryDaemon {
-  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20) : MemoryDaemon({1, queue_bound}, {}) {}
+  explicit MemoryDaemon(std::size_t queue_bound = 1 << 20) : MemoryDaemon({queue_bound}, {}) {}
   explicit MemoryDaemon(SessionLayer::Settings settings, const ClientLimits& limits)
       : layer((settings.limits = limits, settings),
               {transport, ordering, [this] { return time; }, [this] { return ++last_random; }, logger,
@@ -90,7 +90,7 @@ struct MemoryDaemon {
   bool logged(const std::string& text) const { return log.str().find(text) != std::string::npos; }
 
   MemoryTransport transport;
-  LocalOrdering ordering;
+  LocalOrdering ordering{1};
   std::ostringstream log;
   const std::shared_ptr<spdlog::logger> logger =
       std::make_shared<spdlog::logger>("test", std::make_shared<spdlog::sinks::ostream_sink_st>(log));

@@ -197,7 +197,7 @@ TEST_F(DaemonSession, ClientOverTheQueueBound_IsClosedOnlyIfItIsStillOverItAfter
 TEST(DaemonBounds, UserOrAllOverTheirBound_LoseWhoHoldsTheMost_RootAndOtherUsersLoseNobody) {
   ClientLimits limits;
   limits.user_queue_bound = 4 << 20;
-  MemoryDaemon daemon({1, 1 << 20}, limits);
+  MemoryDaemon daemon({1 << 20}, limits);
   MemoryClient root(daemon, 0), other(daemon, 1), modest(daemon, 2), greedy(daemon, 2);
   for (MemoryClient* client : {&root, &other, &modest, &greedy}) client->event_wire().full = true;
   talk_to_itself(root, "root", 80);
@@ -211,7 +211,7 @@ TEST(DaemonBounds, UserOrAllOverTheirBound_LoseWhoHoldsTheMost_RootAndOtherUsers
   EXPECT_TRUE(greedy.closed() && daemon.logged("its user is over user-queue-bound and it reads nothing"));
 
   limits.total_queue_bound = 8 << 20;
-  MemoryDaemon full({1, 1 << 20}, limits);
+  MemoryDaemon full({1 << 20}, limits);
   MemoryClient served(full, 0), most(full, 3), less(full, 4), last(full, 5);
   for (MemoryClient* client : {&served, &most, &less, &last}) client->event_wire().full = true;
   talk_to_itself(served, "root", 8);
@@ -245,7 +245,7 @@ class DaemonBurst : public testing::Test {
     return std::ranges::count_if(readers_, [](const auto& reader) { return reader->closed(); });
   }
 
-  MemoryDaemon daemon_{{1, 1 << 20}, bounds()};
+  MemoryDaemon daemon_{{1 << 20}, bounds()};
   MemoryClient sender_{daemon_, 0};
   std::vector<std::unique_ptr<MemoryClient>> readers_;
 };
@@ -273,7 +273,7 @@ TEST_F(DaemonBurst, WhoseReadersAllStall_LosesOne_AndTheRestAtTwiceTheBoundOnly)
 TEST(DaemonBounds, MessagesThatAreNeverFinished_AreBoundedInTimeAndInBytesOfTheirUser) {
   ClientLimits limits;
   limits.user_queue_bound = 1 << 20;
-  MemoryDaemon daemon({1, 1 << 20}, limits);
+  MemoryDaemon daemon({1 << 20}, limits);
   const auto packets =
       wire::packets_of(wire::ClientMessage(wire::Call{StateChangeRequest{1, {}, Bytes(200'000, 's')}}));
   MemoryClient slow(daemon, 2), first(daemon, 1), second(daemon, 1);
@@ -297,7 +297,7 @@ TEST(DaemonBounds, SessionsAndSilentConnectionsOverTheirLimit_AreToldSo_RootIsLe
   limits.max_sessions = 6;
   limits.user_sessions = 2;
   limits.root_sessions = 1;
-  MemoryDaemon daemon({1, 1 << 20}, limits);
+  MemoryDaemon daemon({1 << 20}, limits);
   const auto hello = [&](std::uint32_t uid) {
     const ConnectionId id = daemon.open(uid);
     daemon.say(id, wire::Hello{});

@@ -14,14 +14,13 @@
 #include <variant>
 #include <vector>
 
-#include "engine/types.h"
+#include "cluster/replica.h"
 
 namespace gs::cluster {
 
 /// Raised when daemons of two versions would not understand one another.
 inline constexpr std::uint16_t kProtocolVersion = 1;
 
-using Node = std::uint32_t;  // 1 to 32767
 using Life = std::uint64_t;  // of a daemon, from one reset to the next; random
 
 /// A daemon in the process group.

@@ -17,11 +17,12 @@ bool same(const Lives& lives, Node node, Life life) {
 
 }  // namespace
 
-Replication::Replication(const Settings& settings, Order& order, Replica& replica,
+Replication::Replication(const Settings& settings, Order& order, Replica& replica, Host& host,
                          std::function<std::uint64_t()> random, std::function<std::uint64_t()> clock)
     : settings_(settings),
       order_(order),
       replica_(replica),
+      host_(host),
       random_(std::move(random)),
       clock_(std::move(clock)),
       life_(random_()) {}
@@ -231,8 +232,8 @@ bool Replication::fits(const Decision& decision) const {
   const auto& words = exchange_->words();
   const std::uint16_t version = words.at(decision.holders.begin()->first).version;
   if (version == kProtocolVersion) return true;
-  replica_.give_up("the daemons of this cluster speak protocol version " + std::to_string(version) + ", not " +
-                   std::to_string(kProtocolVersion));
+  host_.give_up("the daemons of this cluster speak protocol version " + std::to_string(version) + ", not " +
+                std::to_string(kProtocolVersion));
   return false;
 }
 
@@ -255,8 +256,8 @@ void Replication::catch_up(const std::shared_ptr<const Decision>& decision) {
 
 // --------------------------------------------------------------------------------------- receiving and applying
 
-void Replication::submit(const Event& event) {
-  if (serves_) order_.send(Ordered{life_, ++sent_, std::make_shared<const Event>(event)});
+void Replication::submit(Event event) {
+  if (serves_) order_.send(Ordered{life_, ++sent_, std::make_shared<const Event>(std::move(event))});
 }
 
 void Replication::on(const Process& from, const Ordered& ordered) {
@@ -334,6 +335,8 @@ void Replication::apply(const Decision& decision) {
 
 void Replication::serve(const Decision& decision) {
   Domain domain;
+  domain.self = settings_.self.node;
+  domain.sessions_above = 1000 * clock_();  // fewer begin in a life than it has microseconds
   for (const auto& [node, life] : decision.holders) {
     if (node < settings_.self.node) ++domain.rank;
     domain.nodes.push_back(node);
@@ -350,7 +353,7 @@ void Replication::donate(const Decision& decision) {
   if (!lowest || decision.holders.size() == decision.asked.size()) return;
   donation_ = Donation{decision.begin, replica_.snapshot()};
   if (donation_->bytes.empty()) {
-    replica_.log("the state is too large to be sent: no other host can come");
+    host_.log("the state is too large to be sent: no other host can come");
     return donation_.reset();
   }
   donation_->count = static_cast<std::uint32_t>((donation_->bytes.size() + settings_.piece - 1) / settings_.piece);
@@ -449,7 +452,7 @@ void Replication::evict_who_holds_up() {
   }
   if (now_ < progressed_ + settings_.member_timeout + rank) return;
   progress();
-  for (const Process& process : who) replica_.log(name_of(process) + " does not answer and is left out");
+  for (const Process& process : who) host_.log(name_of(process) + " does not answer and is left out");
   order_.send(Evict{ring_, who});
 }
 

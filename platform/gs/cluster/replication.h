@@ -30,6 +30,7 @@
 #include <set>
 
 #include "cluster/exchange.h"
+#include "cluster/replica.h"
 
 namespace gs::cluster {
 
@@ -53,30 +54,13 @@ class Order {
   virtual std::string key() const = 0;
 };
 
-/// The serving hosts as a client may know them.
-struct Domain {
-  std::vector<Node> nodes;  // ascending
-  std::size_t rank = 0;     // of this one: who is to order an expiry first
-};
-
-/// The engine and its clients.
-class Replica {
+/// The daemon around it.
+class Host {
  public:
-  virtual ~Replica() = default;
-  virtual void apply(const Event& event) = 0;
-  /// Empty: it is too much.
-  virtual std::vector<std::byte> snapshot() = 0;
-  /// False: `error` says why it does not fit, and nothing has changed.
-  virtual bool restore(const std::vector<std::byte>& snapshot, std::string* error) = 0;
-  /// Again with each decision that changes the domain.
-  virtual void serve(const Domain& domain) = 0;
-  /// All clients end; the state stays.
-  virtual void drop_clients(const std::string& why) = 0;
-  /// All clients end, and the state is empty again.
-  virtual void reset(const std::string& why) = 0;
+  virtual ~Host() = default;
+  virtual void log(const std::string& line) = 0;
   /// It cannot be one of these daemons.
   virtual void give_up(const std::string& why) = 0;
-  virtual void log(const std::string& line) = 0;
 };
 
 struct Verdict {
@@ -128,8 +112,8 @@ class Replication {
     Rule without = Rule::kNone;
   };
   /// `random`: 64 bits that nobody has had before. `clock`: milliseconds since 1970.
-  Replication(const Settings& settings, Order& order, Replica& replica, std::function<std::uint64_t()> random,
-              std::function<std::uint64_t()> clock);
+  Replication(const Settings& settings, Order& order, Replica& replica, Host& host,
+              std::function<std::uint64_t()> random, std::function<std::uint64_t()> clock);
   Replication(const Replication&) = delete;
   Replication& operator=(const Replication&) = delete;
 
@@ -148,12 +132,14 @@ class Replication {
   std::optional<Time> next_deadline() const;
   void advance(Time now);
 
-  /// Has a client's event ordered; while nobody is served, drops it.
-  void submit(const Event& event);
+  /// Has an event ordered; while no client is served, drops it.
+  void submit(Event event);
   /// The state cannot be relied on.
   void fail(const std::string& why) { lose(why); }
 
   bool serves() const { return serves_; }
+  /// Or will as soon as others have answered, as far as this host can know.
+  bool will_serve() const { return verdict_ && verdict_->quorate; }
   /// For people.
   const char* state() const;
 
@@ -217,6 +203,7 @@ class Replication {
   const Settings settings_;
   Order& order_;
   Replica& replica_;
+  Host& host_;
   const std::function<std::uint64_t()> random_;
   const std::function<std::uint64_t()> clock_;
 

@@ -9,10 +9,20 @@ namespace gs::daemon {
 
 class LocalOrdering : public Ordering {
  public:
-  void start(Sink sink) override { sink_ = std::move(sink); }
+  explicit LocalOrdering(Node node) : domain_{node, {node}} {}
 
-  /// The sink has had the event when this returns, unless it is called from inside the sink: then the event
-  /// follows as soon as the sink is done.
+  void start(Replica& replica) override {
+    replica_ = &replica;
+    replica_->serve(domain_);
+  }
+  void fail(const std::string& why) override {
+    replica_->reset(why);
+    replica_->serve(domain_);
+  }
+  bool will_serve() const override { return true; }
+
+  /// The replica has had the event when this returns, unless it is called from inside it: then the event follows
+  /// as soon as it is done.
   void submit(Event event) override {
     waiting_.push_back(std::move(event));
     if (delivering_) return;
@@ -20,18 +30,19 @@ class LocalOrdering : public Ordering {
     while (!waiting_.empty()) {
       const Event next = std::move(waiting_.front());
       waiting_.pop_front();
-      sink_(next);
+      replica_->apply(next);
     }
   }
 
  private:
-  /// Also over when the sink throws.
+  /// Also over when the replica throws.
   struct Turn {
     bool& delivering;
     ~Turn() { delivering = false; }
   };
 
-  Sink sink_;
+  const Domain domain_;
+  Replica* replica_ = nullptr;
   std::deque<Event> waiting_;
   bool delivering_ = false;
 };

@@ -15,11 +15,11 @@ bool needs_memory(const Request& request) {
          !std::holds_alternative<VoteRequest>(request) && !std::holds_alternative<UnsubscribeRequest>(request);
 }
 
-/// The session that an event comes from; 0: none.
-std::uint64_t origin(const Event& event) {
-  if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session.number;
-  if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session.number;
-  return 0;
+/// The session that an event comes from; number 0: none.
+SessionId origin(const Event& event) {
+  if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session;
+  if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session;
+  return {};
 }
 
 }  // namespace
@@ -33,7 +33,7 @@ SessionLayer::SessionLayer(const Settings& settings, Environment environment)
   for (std::size_t rc = 0; rc < answers_.size(); ++rc) {
     answers_[rc] = packets_of(wire::Answer{static_cast<wyx_rc_t>(rc)});
   }
-  env_.ordering.start([this](const Event& event) { ordered(event); });
+  env_.ordering.start(*this);
 }
 
 SessionLayer::Connection* SessionLayer::find(ConnectionId id) {
@@ -177,6 +177,25 @@ void SessionLayer::on_hello(ConnectionId id, Connection& connection, const wire:
     answer(id, WYX_NOT_SUPPORTED);
     return end(id, End::kFault, "speaks protocol version " + std::to_string(hello.protocol_version));
   }
+  if (serving_) return begin_session(id, connection, hello);
+  if (env_.ordering.will_serve()) return void(connection.hello = hello);
+  answer(id, WYX_CONNECT_FAILED);
+  end(id, End::kGone, "this host has no quorum");
+}
+
+/// Of those who wait for it: clients are served now, or there is no hope of it.
+void SessionLayer::answer_hellos() {
+  std::vector<ConnectionId> waiting;
+  for (const auto& [id, connection] : connections_)
+    if (connection.hello) waiting.push_back(id);
+  std::ranges::sort(waiting);
+  for (const ConnectionId id : waiting) {
+    Connection& connection = connections_.at(id);
+    on_hello(id, connection, *std::exchange(connection.hello, std::nullopt));
+  }
+}
+
+void SessionLayer::begin_session(ConnectionId id, Connection& connection, const wire::Hello& hello) {
   Account& account = connection.share.account();
   const char* problem = short_of_memory_ ? "out of memory" : accounts_.problem_with_session(account);
   if (problem != nullptr) return refuse(id, problem);
@@ -193,7 +212,7 @@ void SessionLayer::on_hello(ConnectionId id, Connection& connection, const wire:
   session.attach_limit = timers_.arm(env_.now() + settings_.handshake_limit, [this, number] {
     end_session(number, End::kFault, "did not attach its event channel in time");
   });
-  send(id, wire::Welcome{settings_.node_number, number, session.cookie});
+  send(id, wire::Welcome{domain_.self, number, session.cookie});
 }
 
 void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire::Attach& attach) {
@@ -224,8 +243,8 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& 
 }
 
 void SessionLayer::on_query_node(ConnectionId id) {
-  // With one host, that host is the domain's master.
-  send(id, wire::NodeInfo{settings_.node_number, settings_.node_number});
+  if (!serving_) return answer(id, WYX_CONNECT_FAILED);
+  send(id, wire::NodeInfo{domain_.self, domain_.nodes.front()});
 }
 
 // ----------------------------------------------------------------------------------------------------- pingers
@@ -254,19 +273,19 @@ void SessionLayer::too_slow(std::uint64_t session) {
 
 // ------------------------------------------------------------------------------------------------ ordered side
 
-void SessionLayer::ordered(const Event& event) {
-  const std::uint64_t from = origin(event);
-  if (from != 0 && from <= last_forgotten_) return;
+void SessionLayer::apply(const Event& event) {
+  const SessionId from = origin(event);
+  if (from.node == domain_.self && from.number != 0 && from.number <= last_forgotten_) return;
   Outcome outcome;
   try {
     outcome = engine_->apply(event);
   } catch (const std::exception& error) {
-    return begin_anew(error.what());
+    return env_.ordering.fail(std::string("an event could not be finished: ") + error.what());
   }
   try {
     deliver(event, outcome);
   } catch (const std::exception& error) {
-    begin_anew(error.what());
+    return env_.ordering.fail(std::string("an event could not be told: ") + error.what());
   }
   enforce_bounds();
   note_freed();
@@ -287,9 +306,14 @@ void SessionLayer::deliver(const Event& event, const Outcome& outcome) {
   forget_outgoing();
   if (accounts_.waiting() == 0) recent_.drop();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
-  if (!engine_->busy() || continue_due_) return;
-  env_.continue_soon();
-  continue_due_ = true;
+  continue_later();
+}
+
+/// The first of the hosts does, and each next one a while later: it may be gone.
+void SessionLayer::continue_later() {
+  if (!engine_->busy() || std::exchange(continue_due_, true)) return;
+  if (domain_.rank == 0) return env_.continue_soon();
+  timers_.arm(env_.now() + turn(), [this] { continue_work(); });
 }
 
 /// To clear a table costs what it once held: after a large outcome a new one.
@@ -302,12 +326,36 @@ void SessionLayer::forget_outgoing() {
 
 void SessionLayer::continue_work() {
   continue_due_ = false;
-  env_.ordering.submit(ContinueEvent{});
+  if (engine_->busy()) env_.ordering.submit(ContinueEvent{});
 }
 
-/// Of an event that the engine could not finish nobody knows what it has changed: no client is served from that.
-void SessionLayer::begin_anew(const std::string& why) {
-  env_.log->critical("an event could not be finished: {}; all sessions are closed and all groups end", why);
+void SessionLayer::serve(const Domain& domain) {
+  domain_ = domain;
+  if (std::exchange(serving_, true)) return;
+  last_session_ = std::max(last_session_, domain.sessions_above);
+  for (const TimerRequest& timer : engine_->running_phases()) arm(timer);
+  continue_later();
+  answer_hellos();
+}
+
+bool SessionLayer::restore(const std::vector<std::byte>& snapshot, std::string* error) {
+  return engine_->restore(snapshot, error);
+}
+
+void SessionLayer::drop_clients(const std::string& why) {
+  env_.log->error("{}; all sessions are closed", why);
+  forget_sessions();
+}
+
+void SessionLayer::reset(const std::string& why) {
+  env_.log->critical("{}; all sessions are closed and all groups end", why);
+  forget_sessions();
+  engine_ = std::make_unique<Engine>(settings_.engine);
+  return_memory_soon();
+}
+
+void SessionLayer::forget_sessions() {
+  serving_ = false;
   last_forgotten_ = last_session_;
   while (!sessions_.empty()) {
     const ConnectionId request = sessions_.begin()->second.request, event = sessions_.begin()->second.event;
@@ -318,8 +366,7 @@ void SessionLayer::begin_anew(const std::string& why) {
   }
   for (auto& [group, of_group] : phase_timers_) timers_.cancel(of_group.timer);
   phase_timers_.clear();
-  engine_ = std::make_unique<Engine>(settings_.engine);
-  return_memory_soon();
+  answer_hellos();
 }
 
 void SessionLayer::trace(const Event& event, const Outcome& outcome) {
@@ -332,7 +379,7 @@ void SessionLayer::trace(const Event& event, const Outcome& outcome) {
 }
 
 void SessionLayer::answer_request(SessionId asker, wyx_rc_t rc) {
-  if (asker.node != settings_.node_number) return;
+  if (asker.node != domain_.self) return;
   Session* session = find_session(asker.number);
   if (session == nullptr || !session->answer_due) return;
   session->answer_due = false;
@@ -343,7 +390,7 @@ template <typename Wanted>
 void SessionLayer::deliver_to(const std::vector<Delivery>& deliveries, Wanted wanted) {
   run_.clear();
   for (const Delivery& delivery : deliveries) {
-    if (delivery.to.session.node != settings_.node_number || !wanted(delivery)) continue;
+    if (delivery.to.session.node != domain_.self || !wanted(delivery)) continue;
     if (!run_.empty() && run_.back()->what != delivery.what) deliver_run();
     run_.push_back(&delivery);
   }
@@ -395,9 +442,9 @@ void SessionLayer::arm(const TimerRequest& timer) {
   const std::chrono::seconds limit(timer.seconds);
   if (limit.count() == 0 || limit > kLongPhase) look_at_phases_later();
   if (limit.count() == 0) return;
-  of_group.timer = timers_.arm(now + limit, [this, id = timer.id] {
+  of_group.timer = timers_.arm(now + limit + turn(), [this, id = timer.id] {
     phase_timers_.erase(id.group);
-    env_.ordering.submit(TimerExpiredEvent{id});
+    if (engine_->awaits(id)) env_.ordering.submit(TimerExpiredEvent{id});
   });
 }
 
@@ -450,7 +497,7 @@ void SessionLayer::warn_of_missing_votes(const std::string& group, Duration wait
 
 /// Null: it is no client of this daemon's.
 const SessionLayer::Connection* SessionLayer::connection_of(const MissingVoter& voter) {
-  if (voter.to.session.node != settings_.node_number) return nullptr;
+  if (voter.to.session.node != domain_.self) return nullptr;
   const Session* session = find_session(voter.to.session.number);
   return session == nullptr ? nullptr : find(session->request);
 }
@@ -653,8 +700,8 @@ void SessionLayer::end_session(std::uint64_t number, End how, const std::string&
   if (event != 0) drop(event);
   try {
     env_.ordering.submit(SessionGoneEvent{id_of(number)});
-  } catch (const std::exception& error) {
-    begin_anew(error.what());  // else its members would stay for ever
+  } catch (const std::exception& error) {  // else its members would stay for ever
+    env_.ordering.fail(std::string("the end of a session could not be told: ") + error.what());
   }
 }
 

@@ -13,6 +13,8 @@
 //
 //   (1) once the session's event channel is attached; before that: close.
 //
+// A Hello waits while the ordering does not serve but will; where there is no hope of that it is refused.
+//
 // A session lives while both its connections and the process that opened it do. However it ends, its providers
 // fail and its subscriptions end.
 //
@@ -27,6 +29,7 @@
 #include <functional>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <unordered_map>
 
@@ -43,10 +46,9 @@
 namespace gs::daemon {
 
 /// Not safe for concurrent use; one thread drives it. No member may be called from inside the transport.
-class SessionLayer : private PingSink {
+class SessionLayer : private PingSink, private Replica {
  public:
   struct Settings {
-    std::uint32_t node_number = 0;
     std::size_t queue_bound = 0;  // bytes that may wait for each of a client's channels
     Duration drain_time{10'000};  // that more may wait for its event channel
     ClientLimits limits{};
@@ -126,6 +128,7 @@ class SessionLayer : private PingSink {
     ConnectionShare share;
     wire::Assembler in{wire::kMaxClientMessage};
     OutQueue out;
+    std::optional<wire::Hello> hello;  // that waits until clients are served
     Timers::Id handshake;
     Timers::Id message_limit;  // while a message is there in part
     Timers::Id drain_limit;    // while more than the queue bound waits
@@ -158,6 +161,7 @@ class SessionLayer : private PingSink {
   static constexpr std::chrono::seconds kLongPhase{60};  // after which the log names those who have not voted
   static constexpr Duration kBetweenPhaseLooks{10'000};
   static constexpr std::size_t kNamedVoters = 8;
+  static constexpr Duration kBetweenRanks{50};
   static constexpr std::size_t kProgramName = 64;                   // bytes of it that the log shows
   static constexpr std::size_t kFlushShare = 64 * 1024;             // bytes to one client before others are served
   static constexpr std::size_t kEventShare = 128 * 1024;            // bytes of one event that are sent at once
@@ -174,6 +178,8 @@ class SessionLayer : private PingSink {
   void on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
   void on_request_channel(ConnectionId id, Connection& connection, wire::ClientMessage& message);
   void on_hello(ConnectionId id, Connection& connection, const wire::Hello& hello);
+  void begin_session(ConnectionId id, Connection& connection, const wire::Hello& hello);
+  void answer_hellos();
   void on_attach(ConnectionId id, Connection& connection, const wire::Attach& attach);
   void on_call(ConnectionId id, Connection& connection, wire::Call& call);
   void on_query_node(ConnectionId id);
@@ -184,7 +190,13 @@ class SessionLayer : private PingSink {
   void too_slow(std::uint64_t session) override;
 
   // The ordered side.
-  void ordered(const Event& event);
+  void apply(const Event& event) override;
+  std::vector<std::byte> snapshot() override { return engine_->snapshot(); }
+  bool restore(const std::vector<std::byte>& snapshot, std::string* error) override;
+  void serve(const Domain& domain) override;
+  void drop_clients(const std::string& why) override;
+  void reset(const std::string& why) override;
+  void forget_sessions();
   void trace(const Event& event, const Outcome& outcome);
   void answer_request(SessionId asker, wyx_rc_t rc);
   void deliver(const Event& event, const Outcome& outcome);
@@ -193,7 +205,8 @@ class SessionLayer : private PingSink {
   void deliver_run();
   void forget_outgoing();
   void deliver_to_session(std::span<const Delivery* const> to, const std::shared_ptr<Outgoing>& what);
-  void begin_anew(const std::string& why);
+  void continue_later();
+  Duration turn() const { return kBetweenRanks * domain_.rank; }
   void arm(const TimerRequest& timer);
   void drop_stale_timers();
   bool drop_if_stale(PhaseTimers::iterator& at);
@@ -203,7 +216,7 @@ class SessionLayer : private PingSink {
   void warn_of_missing_votes(const std::string& group, Duration waited);
   std::string describe(const MissingVoter& voter);
   const Connection* connection_of(const MissingVoter& voter);
-  SessionId id_of(std::uint64_t number) const { return {settings_.node_number, number}; }
+  SessionId id_of(std::uint64_t number) const { return {domain_.self, number}; }
 
   void send(ConnectionId to, const wire::ServerMessage& message) { put(to, {packets_of(message)}, true); }
   void answer(ConnectionId to, wyx_rc_t rc) { put(to, {answers_.at(rc)}, true); }
@@ -265,6 +278,8 @@ class SessionLayer : private PingSink {
   Timers::Id return_memory_;
   bool said_farewell_ = false;  // nothing else is sent from then on
   bool continue_due_ = false;   // was asked for
+  bool serving_ = false;
+  Domain domain_;
 };
 
 }  // namespace gs::daemon

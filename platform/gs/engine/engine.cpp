@@ -353,6 +353,14 @@ bool Engine::awaits(const TimerId& timer) const {
   return group && group->awaits(timer);
 }
 
+std::vector<TimerRequest> Engine::running_phases() const {
+  std::vector<TimerRequest> timers;
+  for (const auto& [name, group] : state_->groups) {
+    if (const auto timer = group.running_timer()) timers.push_back(*timer);
+  }
+  return timers;
+}
+
 std::size_t Engine::kept_bytes() const { return state_->ledger.total(); }
 
 MissingVotes Engine::missing_votes(const std::string& name, std::size_t at_most) const {

@@ -42,6 +42,9 @@ class Engine {
   /// Whether this timer's phase still runs. A timer that is not awaited need not be kept.
   bool awaits(const TimerId& timer) const;
 
+  /// A timer for each phase that runs, as an engine that has been restored is asked to arm.
+  std::vector<TimerRequest> running_phases() const;
+
   /// Bytes of what is kept for sessions (see ledger.h).
   std::size_t kept_bytes() const;
 
@@ -65,7 +68,7 @@ class Engine {
   std::vector<std::byte> snapshot() const;
 
   /// Becomes what the engine was that the snapshot is of, and from the next event on says what that one says; who
-  /// restores arms the timers of the phases that run. False: the snapshot is damaged, of another version or made
+  /// restores arms the timers of running_phases. False: the snapshot is damaged, of another version or made
   /// under other limits, as `error` says, and nothing has changed.
   bool restore(const std::vector<std::byte>& snapshot, std::string* error);
 

@@ -74,6 +74,8 @@ class Group {
   void lose(const MemberPtr& member, std::uint32_t leave_code);
   /// Whether this is the phase that runs.
   bool awaits(const TimerId& timer) const;
+  /// Nothing: no phase runs.
+  std::optional<TimerRequest> running_timer() const;
   /// Ignored unless that phase runs and has a time limit.
   void expire(const TimerId& timer);
   /// Comes before whatever else the group has left to do, so while those it is about are still members.

@@ -76,7 +76,7 @@ void Group::open_phase(Surroundings& env) {
   run.voted_message = {};
   note.seqnum = next_number(env);
   send(run, std::move(note), run.voters, env);
-  env.timers.push_back({{name_, run.number, run.phase}, run.terms.time_limit});
+  env.timers.push_back(*running_timer());
 }
 
 void Group::vote(Member& voter, const VoteRequest& request, Surroundings& env) {
@@ -117,6 +117,11 @@ void Group::cast_default(Member& voter, std::uint32_t cause) {
 
 bool Group::awaits(const TimerId& timer) const {
   return run_ && run_->number == timer.protocol && run_->phase == timer.phase;
+}
+
+std::optional<TimerRequest> Group::running_timer() const {
+  if (!run_) return std::nullopt;
+  return TimerRequest{{name_, run_->number, run_->phase}, run_->terms.time_limit};
 }
 
 void Group::expire(const TimerId& timer) {
