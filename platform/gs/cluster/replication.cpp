@@ -60,6 +60,7 @@ void Replication::view_changed(const View& view) {
 void Replication::ring_changed(const RingId& ring) {
   if (ring == ring_) return;
   ring_ = ring;
+  evicted_.clear();
   if (state_ == State::kOut || !keeps(Rule::kEveryRing)) return;
   stop();
 }
@@ -132,17 +133,18 @@ void Replication::lose(const std::string& why) {
 
 // ----------------------------------------------------------------------------------------------------- exchanges
 
+/// Two who hold each other up may have had all evicted: then nobody is.
 std::vector<Process> Replication::not_evicted() const {
   std::vector<Process> rest;
   std::ranges::copy_if(view_, std::back_inserter(rest),
                        [this](const Process& p) { return !evicted_.contains(p); });
-  return rest;
+  return rest.empty() ? view_ : rest;
 }
 
 void Replication::begin_if_lowest() {
   if (state_ != State::kWaiting || begun_ || !goes_on()) return;
   const auto rest = not_evicted();
-  if (!rest.empty() && rest.front() == settings_.self) order_begin(rest);
+  if (rest.front() == settings_.self) order_begin(rest);
 }
 
 void Replication::order_begin(std::vector<Process> asked) {
@@ -429,7 +431,7 @@ std::vector<Node> Replication::unconfirmed() const {
 std::vector<Process> Replication::who_holds_up() const {
   if (!goes_on()) return {};
   const auto rest = not_evicted();
-  if (state_ == State::kWaiting) return rest.empty() ? rest : std::vector{rest.front()};
+  if (state_ == State::kWaiting) return {rest.front()};
   if (state_ == State::kExchange) return exchange_->missing();
   if (state_ != State::kRunning) return {};
   auto nodes = unconfirmed();

@@ -137,6 +137,7 @@ class Replication {
   /// The state cannot be relied on.
   void fail(const std::string& why) { lose(why); }
 
+  bool is_member() const { return state_ != State::kOut; }
   bool serves() const { return serves_; }
   /// Or will as soon as others have answered, as far as this host can know.
   bool will_serve() const { return verdict_ && verdict_->quorate; }
