@@ -336,16 +336,12 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
   return {};
 }
 
-constexpr flatbuffers::uoffset_t kMaxDepth = 16;  // of tables in tables; the schema needs six
-
-/// The root table of `payload` once it is verified; null: it is not one.
-template <typename Table>
-const Table* verified_root(std::span<const std::byte> payload, const char* id, std::string* error) {
-  const auto* data = reinterpret_cast<const std::uint8_t*>(payload.data());
-  flatbuffers::Verifier verifier(data, payload.size(), kMaxDepth);
-  if (verifier.VerifyBuffer<Table>(id)) return flatbuffers::GetRoot<Table>(data);
-  *error = "not a well-formed message";
-  return nullptr;
+/// `value` as it was read; nothing where something in it was wrong.
+template <typename T>
+std::optional<T> unless_wrong(const Reader& reader, T value, std::string* error) {
+  if (reader.problem() == nullptr) return value;
+  *error = reader.problem();
+  return std::nullopt;
 }
 
 }  // namespace
@@ -355,9 +351,7 @@ std::optional<ClientMessage> parse_client_message(std::span<const std::byte> pay
   if (root == nullptr) return std::nullopt;
   Reader reader(payload.size());
   ClientMessage message = reader.client_message(*root);
-  if (reader.problem() == nullptr) return message;
-  *error = reader.problem();
-  return std::nullopt;
+  return unless_wrong(reader, std::move(message), error);
 }
 
 std::optional<ServerMessage> parse_server_message(std::span<const std::byte> payload, Token token,
@@ -366,9 +360,14 @@ std::optional<ServerMessage> parse_server_message(std::span<const std::byte> pay
   if (root == nullptr) return std::nullopt;
   Reader reader(payload.size());
   ServerMessage message = reader.server_message(*root, token);
-  if (reader.problem() == nullptr) return message;
-  *error = reader.problem();
-  return std::nullopt;
+  return unless_wrong(reader, std::move(message), error);
+}
+
+std::optional<Request> read_request(fb::Request kind, const void* table, std::size_t message_size,
+                                    std::string* error) {
+  Reader reader(message_size);
+  Request request = reader.request(kind, table);
+  return unless_wrong(reader, std::move(request), error);
 }
 
 }  // namespace gs::wire::detail

@@ -12,13 +12,6 @@ using Offset = flatbuffers::Offset<T>;
 using BytesOffset = Offset<flatbuffers::Vector<std::uint8_t>>;
 using ProvidersOffset = Offset<flatbuffers::Vector<const fb::ProviderId*>>;
 
-/// A union's two fields: which member, and where it is.
-template <typename Kind>
-struct Body {
-  Kind kind;
-  Offset<void> value;
-};
-
 fb::ProviderId pack(const ProviderId& id) { return {id.instance, id.node}; }
 fb::LeaveCode pack(const LeaveCode& code) { return {code.voluntary_or_failure, code.voluntary_code}; }
 fb::Terms pack(const ProtocolTerms& terms) { return {terms.num_phases, terms.time_limit}; }
@@ -239,6 +232,10 @@ void build(flatbuffers::FlatBufferBuilder& builder, const ClientMessage& message
 void build(flatbuffers::FlatBufferBuilder& builder, const ServerMessage& message) {
   const auto whole = std::visit([&builder](const auto& m) { return body(builder, m); }, message);
   builder.Finish(fb::CreateServerMessage(builder, whole.kind, whole.value), kServerMessageId);
+}
+
+Body<fb::Request> put_request(flatbuffers::FlatBufferBuilder& builder, const Request& request) {
+  return body(builder, request);
 }
 
 }  // namespace gs::wire::detail
