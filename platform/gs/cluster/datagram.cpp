@@ -1,0 +1,106 @@
+#include "cluster/datagram.h"
+
+#include <sodium.h>
+
+#include <array>
+#include <bit>
+#include <cstring>
+#include <stdexcept>
+
+#include "cluster/codec.h"
+#include "engine/enumerations.h"
+
+namespace gs::cluster {
+namespace {
+
+static_assert(std::endian::native == std::endian::little, "datagrams are written as they lie in memory");
+
+struct Head {
+  std::uint32_t magic = 0x43445347;  // "GSDC"
+  std::uint16_t version = kProtocolVersion;
+  std::uint16_t from = 0;
+  std::uint64_t begin_life = 0;
+  std::uint64_t begin_number = 0;
+  std::uint64_t position = 0;
+};
+static_assert(sizeof(Head) == 32);
+
+using AskedNode = std::uint16_t;
+using Tag = std::array<unsigned char, 2 * crypto_shorthash_BYTES>;
+static_assert(kKeySize == 2 * crypto_shorthash_KEYBYTES);
+constexpr std::size_t kSmallest = sizeof(Head) + sizeof(Tag);
+constexpr std::size_t kLargest = kSmallest + kMaxNodes * sizeof(AskedNode);
+
+void require_sodium() {
+  static const bool works = sodium_init() >= 0;
+  if (!works) throw std::runtime_error("libsodium cannot be used");
+}
+
+Tag tag_of(std::span<const std::byte> bytes, const std::string& key) {
+  require_sodium();
+  const auto* data = reinterpret_cast<const unsigned char*>(bytes.data());
+  const auto* halves = reinterpret_cast<const unsigned char*>(key.data());
+  Tag tag;
+  crypto_shorthash(tag.data(), data, bytes.size(), halves);
+  crypto_shorthash(tag.data() + crypto_shorthash_BYTES, data, bytes.size(), halves + crypto_shorthash_KEYBYTES);
+  return tag;
+}
+
+/// False: not what its sender sealed.
+bool is_genuine(std::span<const std::byte> content, std::span<const std::byte> tag, const std::string* key) {
+  if (key == nullptr || key->size() != kKeySize) return false;
+  const Tag right = tag_of(content, *key);
+  return sodium_memcmp(right.data(), tag.data(), right.size()) == 0;
+}
+
+}  // namespace
+
+std::string new_key() {
+  require_sodium();
+  std::string key(kKeySize, '\0');
+  randombytes_buf(key.data(), key.size());
+  return key;
+}
+
+std::vector<std::byte> seal(const Confirmed& confirmed, Node from, const std::string& key) {
+  if (from < 1 || from > kMaxNodeNumber || key.size() != kKeySize || !problem_with(confirmed).empty()) return {};
+  Head head;
+  head.from = static_cast<std::uint16_t>(from);
+  head.begin_life = confirmed.begin.life;
+  head.begin_number = confirmed.begin.number;
+  head.position = confirmed.position;
+  std::vector<std::byte> bytes(kSmallest + confirmed.ask.size() * sizeof(AskedNode));
+  std::memcpy(bytes.data(), &head, sizeof head);
+  std::byte* end = bytes.data() + sizeof head;
+  for (const Node node : confirmed.ask) {
+    const auto asked = static_cast<AskedNode>(node);
+    std::memcpy(end, &asked, sizeof asked);
+    end += sizeof asked;
+  }
+  const Tag tag = tag_of({bytes.data(), end}, key);
+  std::memcpy(end, tag.data(), tag.size());
+  return bytes;
+}
+
+std::optional<std::pair<Node, Confirmed>> open(std::span<const std::byte> bytes, const KeyOfNode& key_of_node) {
+  if (bytes.size() < kSmallest || bytes.size() > kLargest) return std::nullopt;
+  const auto content = bytes.first(bytes.size() - sizeof(Tag));
+  const auto asked = content.subspan(sizeof(Head));
+  Head head;
+  std::memcpy(&head, content.data(), sizeof head);
+  if (head.magic != Head().magic || head.version != kProtocolVersion || asked.size() % sizeof(AskedNode) != 0) {
+    return std::nullopt;
+  }
+  if (!is_genuine(content, bytes.last(sizeof(Tag)), key_of_node(head.from))) return std::nullopt;
+
+  Confirmed confirmed{{head.begin_life, head.begin_number}, head.position, {}};
+  for (std::size_t at = 0; at < asked.size(); at += sizeof(AskedNode)) {
+    AskedNode node = 0;
+    std::memcpy(&node, asked.data() + at, sizeof node);
+    confirmed.ask.push_back(node);
+  }
+  if (!problem_with(confirmed).empty()) return std::nullopt;
+  return std::pair(Node{head.from}, std::move(confirmed));
+}
+
+}  // namespace gs::cluster
