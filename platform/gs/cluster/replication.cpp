@@ -176,17 +176,18 @@ void Replication::on(const Process&, const Begin& begin) {
   answered_ = false;
   progress();
   for (const Process& asked : begin.asked) evicted_.erase(asked);
-  if (exchange_->asks(settings_.self)) {
-    history_at_begin_ = own_.history;
-    answer_begin();
-  } else if (keeps(Rule::kEvictedBeginsAgain) && goes_on()) {
-    order_begin(view_);
-  }
+  history_at_begin_ = own_.history;
+  answer_begin();
 }
 
+/// Who is not asked asks everybody: an exchange that ends before goes on without it.
 void Replication::answer_begin() {
-  if (state_ != State::kExchange || answered_ || !exchange_->asks(settings_.self) || !goes_on()) return;
+  if (state_ != State::kExchange || answered_ || !goes_on()) return;
   answered_ = true;
+  if (!exchange_->asks(settings_.self)) {
+    if (keeps(Rule::kEvictedBeginsAgain)) order_begin(view_);
+    return;
+  }
   Word word;
   word.begin = exchange_->begin().id;
   word.life = life_;
@@ -204,6 +205,7 @@ void Replication::on(const Process& from, const Word& word) {
   Word taken = word;
   if (!keeps(Rule::kWordNamesBegin)) taken.begin = exchange_->begin().id;
   exchange_->add(from.node, taken);
+  order_.set_peers(exchange_->words());
   progress();
   conclude();
 }
@@ -218,7 +220,6 @@ void Replication::conclude() {
   if (!fits(*decision)) return;
   state_ = State::kRunning;
   decision_ = decision;
-  order_.set_peers(exchange_->words());
   if (same(decision->holders, settings_.self.node, life_))
     become_holder(decision);
   else
@@ -316,16 +317,15 @@ void Replication::apply_confirmed() {
 
 /// Who is there is what the engine knows: whose life does not go on has failed, whatever came before.
 void Replication::apply(const Decision& decision) {
-  bool somebody_gone = own_.hosts.empty();
-  for (const auto& [node, life] : own_.hosts) {
-    if (same(decision.holders, node, life)) continue;
-    if (!keeps(Rule::kHostsAreState) && !decision.left.contains(node)) continue;
-    const auto code = decision.left.find(node);
-    replica_.apply(
-        HostGoneEvent{node, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
-    somebody_gone = true;
-  }
+  const auto goes_on = [&](const auto& host) { return same(decision.holders, host.first, host.second); };
+  const bool somebody_gone = own_.hosts.empty() || !std::ranges::all_of(own_.hosts, goes_on);
   if (somebody_gone && keeps(Rule::kNumbersGoOn)) replica_.apply(NumbersEvent{decision.numbers});
+  for (const auto& host : own_.hosts) {
+    if (goes_on(host) || (!keeps(Rule::kHostsAreState) && !decision.left.contains(host.first))) continue;
+    const auto code = decision.left.find(host.first);
+    replica_.apply(
+        HostGoneEvent{host.first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
+  }
   for (const auto& [node, life] : decision.holders) {
     if (!same(own_.hosts, node, life)) replica_.apply(HostCameEvent{node});
   }

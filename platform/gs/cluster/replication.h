@@ -47,7 +47,8 @@ class Order {
   virtual void send(const Message& message) = 0;
   /// Beside the order: may be lost, doubled, late.
   virtual void confirm(const Confirmed& confirmed) = 0;
-  /// Whose confirmations are waited for from now on, with their addresses and keys.
+  /// Who may confirm from now on, as far as they are known, with their addresses and keys: others may have read the
+  /// last word before.
   virtual void set_peers(const std::map<Node, Word>& peers) = 0;
   /// Of this daemon, for its words.
   virtual std::string address() const = 0;
