@@ -3,10 +3,11 @@
 . "$(dirname "$0")/common.sh"
 
 wanted=(g++ cmake ninja-build pkg-config libevent-dev libflatbuffers-dev flatbuffers-compiler libcli11-dev
-        libtoml11-dev nlohmann-json3-dev libspdlog-dev libsodium-dev libgtest-dev libgmock-dev libbenchmark-dev)
+        libtoml11-dev nlohmann-json3-dev libspdlog-dev libsodium-dev libcpg-dev libquorum-dev libvotequorum-dev
+        libcfg-dev libcorosync-common-dev libgtest-dev libgmock-dev libbenchmark-dev)
 # The sanitizer builds use clang. Where its runtimes are a package of their own they are wanted too, elsewhere
 # (Ubuntu 22.04) they come with the compiler. The symbolizer of llvm makes the sanitizers' reports readable.
-if [ "${1:-build}" = test ]; then wanted+=(clang llvm libclang-rt-dev); fi
+if [ "${1:-build}" = test ]; then wanted+=(clang llvm libclang-rt-dev corosync iproute2); fi
 
 if [ "${1:-build}" = package ]; then wanted+=(dpkg-dev); fi
 

@@ -226,10 +226,10 @@ class DaemonConfig : public testing::Test {
     return path_;
   }
   static auto values(const Options& o) {
-    return std::tuple(o.socket_path, o.access_group, o.node_number, o.queue_bound, o.drain_time,
-                      o.user_queue_bound, o.total_queue_bound, o.max_sessions, o.user_sessions, o.root_sessions,
-                      o.log_level, o.log_file, o.engine.session_bytes, o.engine.user_bytes, o.engine.total_bytes,
-                      o.engine.max_phase_time);
+    return std::tuple(o.socket_path, o.access_group, o.node_number, o.corosync, o.safe, o.member_timeout,
+                      o.require_quorum, o.queue_bound, o.drain_time, o.user_queue_bound, o.total_queue_bound,
+                      o.max_sessions, o.user_sessions, o.root_sessions, o.log_level, o.log_file,
+                      o.engine.session_bytes, o.engine.user_bytes, o.engine.total_bytes, o.engine.max_phase_time);
   }
 
   TempDir dir_;
@@ -244,6 +244,7 @@ TEST_F(DaemonConfig, WrongOptionOrFile_IsOneLineAndStatusTwo) {
       {{"--node-number", "32768"}, "--" + range + "'32768'"},
       {{"--queue-bound", "1k"}, "--queue-bound: must be"},
       {{"--daemon", "--ready-fd", "1"}, "--daemon excludes --ready-fd"},
+      {{"--ordering", "zookeeper"}, "--ordering: must be local or corosync, not 'zookeeper'"},
       {{"--log-level", "loud"}, "--log-level: must be error, warning, info or debug"},
       {{"--access-group", "no such group"}, "--access-group: there is no group 'no such group'"},
       {{"--socket-path", std::string(108, 's')}, "--socket-path: must be a path of 1 to 107 characters"},
@@ -269,6 +270,7 @@ TEST_F(DaemonConfig, WrongOptionOrFile_IsOneLineAndStatusTwo) {
 TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const std::string path = write(
       "socket-path = \"/tmp/x\"\naccess-group = \"0\"\nnode-number = 12\nqueue-bound = 100_000\n"
+      "ordering = \"corosync\"\ndelivery = \"agreed\"\nmember-timeout = 7\nrequire-quorum = \"no\"\n"
       "drain-time = 3\nuser-queue-bound = 200_000\ntotal-queue-bound = 300_000\n"
       "max-sessions = 4\nuser-sessions = 5\nroot-sessions = 6\n"
       "log-level = \"debug\"\nlog-file = \"/tmp/log\"\nsession-state-bound = 2_000_000\n"
@@ -277,14 +279,18 @@ TEST_F(DaemonConfig, EverySetting_IsReadAndTheCommandLineOverridesIt) {
   const auto options = parse_options(5, argv);
   ASSERT_TRUE(options);
   EXPECT_EQ(values(*options),
-            std::tuple("/tmp/x", "0", 13u, 100'000u, std::chrono::seconds(3), 200'000u, 300'000u, 4u, 5u, 6u,
-                       spdlog::level::debug, "/tmp/log", 2'000'000u, 3'000'000u, 4'000'000u, 300));
+            std::tuple("/tmp/x", "0", 13u, true, false, std::chrono::seconds(7), false, 100'000u,
+                       std::chrono::seconds(3), 200'000u, 300'000u, 4u, 5u, 6u, spdlog::level::debug, "/tmp/log",
+                       2'000'000u, 3'000'000u, 4'000'000u, 300));
 }
 
 TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
   Options changed;
   changed.socket_path = changed.access_group = changed.log_file = "changed";
   changed.node_number = 99;
+  changed.corosync = true;
+  changed.safe = changed.require_quorum = false;
+  changed.member_timeout = {};
   changed.engine = {1, 1, 1, 1, 1};
   changed.queue_bound = changed.user_queue_bound = changed.total_queue_bound = 0;
   changed.drain_time = {};
@@ -302,6 +308,10 @@ TEST_F(DaemonConfig, SampleAndManPage_SayTheDefaults) {
       {"socket\\-path", "Default:\n.IR " + defaults.socket_path + " "},
       {"access\\-group", "Default: none"},
       {"node\\-number", "Default: " + std::to_string(defaults.node_number) + "."},
+      {"ordering", std::string("Default:\n.BR ") + (defaults.corosync ? "corosync" : "local") + " ."},
+      {"delivery", std::string("Default:\n.BR ") + (defaults.safe ? "safe" : "agreed") + " ."},
+      {"member\\-timeout", "Default: " + std::to_string(defaults.member_timeout.count()) + "."},
+      {"require\\-quorum", std::string("Default:\n.BR ") + (defaults.require_quorum ? "yes" : "no") + " ."},
       {"queue\\-bound", "Default: " + std::to_string(defaults.queue_bound) + "."},
       {"session\\-state\\-bound", "Default: " + std::to_string(defaults.engine.session_bytes) + "."},
       {"user\\-state\\-bound", "Default: " + std::to_string(defaults.engine.user_bytes) + "."},

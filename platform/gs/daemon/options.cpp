@@ -23,7 +23,7 @@ constexpr std::uint64_t kMinQueueBound = 64 * 1024;
 constexpr std::uint64_t kMaxQueueBound = std::uint64_t{1} << 40;
 constexpr std::uint64_t kMinStateBound = 1024 * 1024;
 constexpr std::uint64_t kMaxStateBound = std::uint64_t{1} << 40;
-constexpr std::uint64_t kMaxDrainTime = 3600;
+constexpr std::uint64_t kLongestTime = 3600;  // seconds
 constexpr std::uint64_t kMaxSessions = 1'000'000;
 
 Problem set_socket_path(Options& options, const std::string& text) {
@@ -57,10 +57,27 @@ Problem set_size(Options& options, const std::string& text) {
   if (problem.empty()) options.*Member = value;
   return problem;
 }
-Problem set_drain_time(Options& options, const std::string& text) {
+/// One of two words.
+template <bool Options::*Member>
+Problem set_choice(Options& options, const std::string& text, const char* no, const char* yes) {
+  if (text != no && text != yes) return "must be " + std::string(no) + " or " + yes + ", not '" + text + "'";
+  options.*Member = text == yes;
+  return {};
+}
+Problem set_ordering(Options& options, const std::string& text) {
+  return set_choice<&Options::corosync>(options, text, "local", "corosync");
+}
+Problem set_delivery(Options& options, const std::string& text) {
+  return set_choice<&Options::safe>(options, text, "agreed", "safe");
+}
+Problem set_require_quorum(Options& options, const std::string& text) {
+  return set_choice<&Options::require_quorum>(options, text, "no", "yes");
+}
+template <std::chrono::seconds Options::*Member>
+Problem set_time(Options& options, const std::string& text) {
   std::uint64_t value = 0;
-  Problem problem = set_number(text, 1, kMaxDrainTime, &value);
-  if (problem.empty()) options.drain_time = std::chrono::seconds(value);
+  Problem problem = set_number(text, 1, kLongestTime, &value);
+  if (problem.empty()) options.*Member = std::chrono::seconds(value);
   return problem;
 }
 template <std::size_t Limits::*Bound>
@@ -101,9 +118,15 @@ constexpr Setting kSettings[] = {
     {"access-group", "GROUP", false, "Unix group whose members may be clients (none: the owner alone)",
      set_access_group},
     {"node-number", "N", true, "Number of this node, 0 to 32767", set_node_number},
+    {"ordering", "WHO", false, "Who orders events: local (one host) or corosync (several)", set_ordering},
+    {"delivery", "HOW", false, "With corosync: safe, or agreed (faster, may be lost with its host)", set_delivery},
+    {"member-timeout", "SECONDS", true, "How long the others wait for a host that hangs",
+     set_time<&Options::member_timeout>},
+    {"require-quorum", "yes|no", false, "Serve only where most hosts are together", set_require_quorum},
     {"queue-bound", "BYTES", true, "Bytes that may wait for a client for any time",
      set_size<&Options::queue_bound, kMinQueueBound, kMaxQueueBound>},
-    {"drain-time", "SECONDS", true, "How long more may wait before the client is closed", set_drain_time},
+    {"drain-time", "SECONDS", true, "How long more may wait before the client is closed",
+     set_time<&Options::drain_time>},
     {"user-queue-bound", "BYTES", true, "Bytes that may wait for all clients of a user",
      set_size<&Options::user_queue_bound, kMinQueueBound, kMaxQueueBound>},
     {"total-queue-bound", "BYTES", true, "Bytes that may wait for all clients",

@@ -17,8 +17,12 @@ namespace gs::daemon {
 
 struct Options {
   std::string socket_path = wire::kDefaultSocketPath;
-  std::string access_group;                          // name or number of a unix group; empty: the owner alone
-  std::uint32_t node_number = 1;                     // 0 to 32767
+  std::string access_group;                // name or number of a unix group; empty: the owner alone
+  std::uint32_t node_number = 1;           // 0 to 32767, of a host alone
+  bool corosync = false;                   // orders events, for several hosts
+  bool safe = true;                        // what is told has been received by all hosts
+  std::chrono::seconds member_timeout{5};  // before the others go on without a host that hangs
+  bool require_quorum = true;
   std::size_t queue_bound = 16 * 1024 * 1024;        // bytes that may wait for each channel of a client
   std::chrono::seconds drain_time{10};               // that more may wait for it
   std::size_t user_queue_bound = 256 * 1024 * 1024;  // bytes that may wait for all clients of a user but root

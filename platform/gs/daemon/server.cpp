@@ -8,8 +8,11 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <stdexcept>
 #include <system_error>
 
+#include "daemon/corosync_ordering.h"
+#include "daemon/local_ordering.h"
 #include "daemon/memory_reserve.h"
 #include "daemon/peer_process.h"
 #include "wire/endpoint.h"
@@ -126,12 +129,12 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       access_{geteuid(), platform::group_id(options.access_group)},
       base_(event_base_new()),
       listener_("gsd", prepared(options.socket_path), access_.group),
-      ordering_(options.node_number),
+      ordering_(make_ordering(options)),
       sessions_({.queue_bound = options.queue_bound,
                  .drain_time = options.drain_time,
                  .limits = limits_of(options),
                  .engine = options.engine},
-                {*this, ordering_, now, random_number, log_, [this] { add(continue_.get(), &kAtOnce); },
+                {*this, *ordering_, now, random_number, log_, [this] { add(continue_.get(), &kAtOnce); },
                  [] { malloc_trim(0); }}),
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
@@ -163,7 +166,27 @@ void Server::set_bounds(const Options& options) {
   sessions_.set_bounds(options.queue_bound, options.drain_time, limits_of(options));
 }
 
-void Server::run() { event_base_dispatch(base_.get()); }
+void Server::run() {
+  event_base_dispatch(base_.get());
+  if (!gave_up_.empty()) throw std::runtime_error(gave_up_);
+}
+
+std::unique_ptr<Ordering> Server::make_ordering(const Options& options) {
+  if (!options.corosync) return std::make_unique<LocalOrdering>(options.node_number);
+  if (!options.require_quorum)
+    log_->warn("require-quorum is no: hosts that lose sight of one another each go on, and differ from then on");
+  CorosyncOrdering::Settings settings;
+  settings.link.require_quorum = options.require_quorum;
+  settings.safe = options.safe;
+  settings.member_timeout = options.member_timeout;
+  return std::make_unique<CorosyncOrdering>(settings, base_.get(), log_,
+                                            [this](const std::string& why) { give_up(why); });
+}
+
+void Server::give_up(const std::string& why) {
+  gave_up_ = why;
+  stop(why);
+}
 
 Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action,
                            const timeval* every)

@@ -14,8 +14,8 @@
 #include "common/access.h"
 #include "common/descriptor.h"
 #include "common/listener.h"
-#include "daemon/local_ordering.h"
 #include "daemon/options.h"
+#include "daemon/ordering.h"
 #include "daemon/session_layer.h"
 
 namespace gs::daemon {
@@ -30,6 +30,7 @@ class Server : private Transport {
   ~Server();
 
   /// Serves until SIGTERM, SIGINT or `stop`, then tells the clients and gives them a bounded time to be told.
+  /// Throws std::runtime_error where it has ended because it cannot serve.
   void run();
   /// `why` is for the log. Again: does nothing.
   void stop(const std::string& why);
@@ -97,6 +98,8 @@ class Server : private Transport {
   void on_deadline();
   void on_continue() { sessions_.continue_work(); }
 
+  std::unique_ptr<Ordering> make_ordering(const Options& options);
+  void give_up(const std::string& why);
   void look_at_path();
   void start_accepting();
   void accept_again();
@@ -121,7 +124,7 @@ class Server : private Transport {
   const AccessRule access_;
   std::unique_ptr<event_base, FreeBase> base_;
   Listener listener_;
-  LocalOrdering ordering_;
+  std::unique_ptr<Ordering> ordering_;
   SessionLayer sessions_;
   EventPtr acceptable_;
   EventPtr accept_again_;
@@ -139,6 +142,7 @@ class Server : private Transport {
   std::unordered_map<ConnectionId, Connection> connections_;
   ConnectionId last_connection_ = 0;
   bool stopping_ = false;
+  std::string gave_up_;          // why
   bool told_unwatched_ = false;  // that the process of a peer cannot be watched
   bool short_of_memory_ = false;
   Time next_trim_{};

@@ -106,6 +106,10 @@ std::vector<std::string> Service::read_again() {
   if (now.socket_path != options_->socket_path) later("socket-path");
   if (now.access_group != options_->access_group) later("access-group");
   if (now.node_number != options_->node_number) later("node-number");
+  if (now.corosync != options_->corosync) later("ordering");
+  if (now.safe != options_->safe) later("delivery");
+  if (now.member_timeout != options_->member_timeout) later("member-timeout");
+  if (now.require_quorum != options_->require_quorum) later("require-quorum");
   if (now.engine.session_bytes != options_->engine.session_bytes) later("session-state-bound");
   if (now.engine.user_bytes != options_->engine.user_bytes) later("user-state-bound");
   if (now.engine.total_bytes != options_->engine.total_bytes) later("state-bound");
