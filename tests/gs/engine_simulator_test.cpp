@@ -6,41 +6,19 @@
 // of steps in all.
 #include <gtest/gtest.h>
 
-#include <cstdlib>
 #include <deque>
 #include <iostream>
 
 #include "common/sanitizers.h"
 #include "gs/engine_model.h"
 #include "gs/made_up_request.h"
+#include "gs/random.h"
 
 namespace gs::test {
 namespace {
 
 constexpr std::uint64_t kSteps = ZN_ADDRESS_SANITIZER || ZN_THREAD_SANITIZER ? 60'000 : 1'000'000;
 constexpr std::uint64_t kEpisode = 2'000;  // steps
-
-/// The same numbers on every platform.
-class Random {
- public:
-  explicit Random(std::uint64_t seed) : state_(seed) {}
-  std::uint64_t next() {  // splitmix64
-    std::uint64_t z = state_ += 0x9E3779B97F4A7C15u;
-    z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9u;
-    z = (z ^ (z >> 27)) * 0x94D049BB133111EBu;
-    return z ^ (z >> 31);
-  }
-  std::uint8_t byte() { return static_cast<std::uint8_t>(next()); }
-  int below(int bound) { return static_cast<int>(next() % static_cast<std::uint64_t>(bound)); }
-  bool chance(int percent) { return below(100) < percent; }
-  template <typename List>
-  auto& one_of(List& list) {
-    return *std::next(list.begin(), below(static_cast<int>(list.size())));
-  }
-
- private:
-  std::uint64_t state_;
-};
 
 /// What has been told to anybody: type and protocol of a protocol notification.
 using Coverage = std::set<std::pair<wyx_notification_type_t, wyx_request_t>>;
@@ -253,11 +231,6 @@ class Episode {
   std::deque<TimerRequest> timers_;
   std::string error_;
 };
-
-std::uint64_t number_from(const char* variable, std::uint64_t otherwise) {
-  const char* value = std::getenv(variable);
-  return value ? std::strtoull(value, nullptr, 10) : otherwise;
-}
 
 TEST(EngineSimulator, Random_faults_break_no_promise) {
   Coverage coverage;

@@ -1,0 +1,451 @@
+// Several daemons over a simulated network, under random faults; what they promise is checked after every step.
+//
+// GS_CLUSTER_SIM_STEPS=n changes the number of steps in all, GS_CLUSTER_SIM_SEED=n begins with another episode. A
+// failure tells its episode's seed and the steps that are needed for it.
+#include <gtest/gtest.h>
+
+#include <array>
+
+#include "common/sanitizers.h"
+#include "gs/cluster_daemon.h"
+
+namespace gs::cluster::test {
+namespace {
+
+using gs::test::number_from;
+
+constexpr std::uint64_t kSteps = ZN_ADDRESS_SANITIZER || ZN_THREAD_SANITIZER ? 40'000 : 400'000;
+constexpr std::size_t kEpisode = 3'000;  // steps
+
+enum class What {
+  kOrder, kReceive, kDeliver, kJudge, kReform, kDatagram, kLoseDatagram, kPass,  // what goes on by itself
+  kRequest, kBeginSession, kEndSession, kWork,                                   // clients
+  kCut, kRingLost, kHostDown, kCorosyncDown, kKill, kStop, kHang,                // faults
+  kHeal, kHostUp, kStart, kWake,                                                 // and their ends
+};
+constexpr std::array kNames{
+    "order", "receive", "deliver", "judge", "reform", "datagram", "lose datagram", "pass",
+    "request", "begin session", "end session", "work",
+    "cut", "ring lost", "host down", "corosync down", "kill", "stop", "hang",
+    "heal", "host up", "start", "wake"};
+
+/// One decision. What it does depends on the state, too: without the steps before it, it may do nothing.
+struct Step {
+  What what = What::kPass;
+  Node node = 1;
+  std::uint64_t dice = 0;
+};
+
+std::map<std::string, std::uint64_t> seen_all;
+class Cluster {
+ public:
+  explicit Cluster(const Plan& plan, std::string* story = nullptr)
+      : world_(plan), daemons_(static_cast<std::size_t>(plan.hosts) + 1) {
+    world_.story = story;
+    for (Node node = 1; node <= hosts(); ++node) {
+      world_.network.host_up(node);
+      daemons_[node] = std::make_unique<Daemon>(world_, node);
+    }
+  }
+
+  std::map<int,int> steps_; ~Cluster() { for (auto [w,n]:steps_) seen_all[std::string("step ")+kNames[w]]+=n; for (auto& [k, n] : world_.seen) seen_all[k] += n; }
+  const std::string& error() const { return world_.history.error(); }
+  Node hosts() const { return world_.network.hosts(); }
+
+  void perform(const Step& step) {
+    ++steps_[static_cast<int>(step.what)];
+    int serving = 0; for (auto& d : daemons_) serving += d && d->replication().serves();
+    ++world_.seen["zserving " + std::to_string(serving) + " of " + std::to_string(hosts())];
+    if (world_.story)
+      *world_.story += std::string(kNames[static_cast<std::size_t>(step.what)]) + " " + std::to_string(step.node) + "\n";
+    Random random(step.dice);
+    Station& host = world_.network.at(step.node);
+    if (step.what < What::kRequest) {
+      move(step, random);
+    } else if (step.what < What::kCut) {
+      if (awake(step.node)) client(step, *daemons_[step.node], random);
+    } else {
+      fault(step, host, random);
+    }
+    for (auto& daemon : daemons_)
+      if (daemon && daemon->has_given_up()) end(daemon, false);
+  }
+
+  /// What can go on by itself.
+  std::vector<Step> moves() {
+    std::vector<Step> moves;
+    for (Node node = 1; node <= hosts(); ++node) {
+      const Station& host = world_.network.at(node);
+      if (world_.network.can_order(host)) moves.push_back({What::kOrder, node});
+      if (world_.network.can_receive(host)) moves.push_back({What::kReceive, node});
+      if (world_.network.is_to_reform(host)) moves.push_back({What::kReform, node});
+      if (!awake(node)) continue;
+      if (!host.inbox.empty()) moves.push_back({What::kDeliver, node});
+      if (!host.verdicts.empty()) moves.push_back({What::kJudge, node});
+    }
+    const auto arrives = [this](const Datagram& d) { return awake(d.to); };
+    if (std::ranges::any_of(world_.datagrams, arrives)) moves.push_back({What::kDatagram, 1});
+    return moves;
+  }
+
+  /// What would mend something.
+  std::vector<Step> repairs() {
+    std::vector<Step> repairs;
+    for (Node node = 1; node <= hosts(); ++node) {
+      const Station& host = world_.network.at(node);
+      if (host.side != 0) repairs.push_back({What::kHeal, node});
+      if (!host.up) repairs.push_back({What::kHostUp, node});
+      if (host.up && !daemons_[node]) repairs.push_back({What::kStart, node});
+      if (daemons_[node] && daemons_[node]->hung) repairs.push_back({What::kWake, node});
+    }
+    return repairs;
+  }
+
+  /// Everything is mended but the daemon of `hung`; all that can go on does, until nothing is left to do.
+  void mend(Node hung = 0) {
+    for (Node node = 1; node <= hosts(); ++node) {
+      world_.network.at(node).side = 0;
+      perform({What::kHostUp, node});
+      if (node != hung) perform({What::kWake, node});
+    }
+    constexpr int kRounds = 3'000;
+    for (int round = 0; round < kRounds && error().empty(); ++round) {
+      for (Node node = 1; node <= hosts(); ++node) if (!daemons_[node]) perform({What::kStart, node});
+      if (!go_on() && !pass_idle()) return;
+    }
+    world_.history.error("no rest: it does not come to an end" + states());
+  }
+
+  void check_served(Node hung = 0) {
+    for (Node node = 1; node <= hosts(); ++node) {
+      if (node == hung) continue;
+      if (!daemons_[node]->replication().serves()) world_.history.error("not served: after all is mended" + states());
+      if (daemons_[node]->has_pending()) world_.history.error("no answer: a request has not ended" + states());
+    }
+  }
+  void check_same() {
+    for (Node node = 1; node <= hosts() && error().empty(); ++node) {
+      const Daemon& daemon = *daemons_[node];
+      if (daemon.place() != daemons_[1]->place()) world_.history.error("states differ: after all is mended");
+      if (daemon.missing()) world_.history.error("session missing: a subscription that was told is not there");
+      for (const SessionId& id : world_.over)
+        if (daemon.knows(id)) world_.history.error("ghost: a session that is over is still there");
+    }
+  }
+  /// One that hangs does not hold up the others.
+  void check_hung(std::uint64_t dice) {
+    const Node hung = static_cast<Node>(1 + dice % hosts()), other = hung % hosts() + 1;
+    perform({What::kHang, hung});
+    perform({What::kBeginSession, other});
+    for (std::uint64_t i = 0; i < 5; ++i) perform({What::kRequest, other, dice + i});
+    mend(hung);
+    if (!error().empty()) return;
+    check_served(hung);
+    mend();
+  }
+
+ private:
+  bool awake(Node node) const { return daemons_[node] && !daemons_[node]->hung && world_.network.at(node).up; }
+
+  void end(std::unique_ptr<Daemon>& daemon, bool late) {
+    if (!daemon) return;
+    world_.network.died(daemon->self(), late);
+    daemon.reset();
+  }
+
+  void move(const Step& step, Random& random) {
+    const auto some = static_cast<std::size_t>(1 + random.below(6));
+    if (step.what == What::kOrder) world_.network.order(step.node);
+    if (step.what == What::kReceive) world_.network.receive(step.node, some);
+    if (step.what == What::kReform) world_.network.reform(step.node, step.dice == 0 ? nullptr : &random);
+    if (step.what == What::kDatagram || step.what == What::kLoseDatagram)
+      datagram(random, step.what == What::kLoseDatagram, step.dice == 0);
+    if (step.what == What::kPass) pass(Duration(step.dice % 20'000));
+    if (!awake(step.node)) return;
+    if (step.what == What::kDeliver) daemons_[step.node]->deliver(some);
+    if (step.what == What::kJudge) daemons_[step.node]->judge();
+  }
+
+  /// Any of those under way, or the first that can arrive.
+  void datagram(Random& random, bool lost, bool first) {
+    auto& all = world_.datagrams;
+    const auto arrives = [this](const Datagram& d) { return awake(d.to); };
+    auto at = std::ranges::find_if(all, arrives);
+    if (at == all.end()) return;
+    if (!first) at = std::ranges::find_if(all.begin() + random.below(static_cast<int>(all.size())), all.end(), arrives);
+    if (at == all.end()) return;
+    const Datagram datagram = *at;
+    if (lost || first || random.chance(90)) all.erase(at);
+    if (!lost && world_.network.connected(datagram.from, datagram.to)) daemons_[datagram.to]->take(datagram);
+  }
+
+  void pass(Duration time) {
+    world_.now += time;
+    for (Node node = 1; node <= hosts(); ++node)
+      if (awake(node)) daemons_[node]->replication().advance(world_.now);
+  }
+  /// On to what somebody waits for.
+  bool pass_idle() {
+    std::optional<Time> next;
+    for (Node node = 1; node <= hosts(); ++node) {
+      if (!awake(node)) continue;
+      const auto deadline = daemons_[node]->replication().next_deadline();
+      if (deadline) next = next ? std::min(*next, *deadline) : *deadline;
+    }
+    if (!next) return false;
+    pass(std::max(*next - world_.now, Duration(1)));
+    return true;
+  }
+  bool go_on() {
+    auto moves = this->moves();
+    for (const Step& step : moves) perform(step);
+    for (Node node = 1; node <= hosts(); ++node) {
+      Random random(0);
+      if (awake(node)) daemons_[node]->work(random, true);
+    }
+    return !moves.empty() || !this->moves().empty();
+  }
+
+  static void client(const Step& step, Daemon& daemon, Random& random) {
+    if (step.what == What::kRequest) daemon.request(random);
+    if (step.what == What::kBeginSession) daemon.begin_session();
+    if (step.what == What::kEndSession) daemon.end_session(random);
+    if (step.what == What::kWork) daemon.work(random, false);
+  }
+
+  /// That takes a while.
+  std::unique_ptr<Daemon> start(Node node) {
+    world_.now += Duration(5);
+    return std::make_unique<Daemon>(world_, node);
+  }
+  void fault(const Step& step, Station& host, Random& random) {
+    auto& daemon = daemons_[step.node];
+    switch (step.what) {
+      case What::kCut:
+        for (Node node = 1; node <= hosts(); ++node) world_.network.at(node).side = random.below(2);
+        break;
+      case What::kHeal:
+        for (Node node = 1; node <= hosts(); ++node) world_.network.at(node).side = 0;
+        break;
+      case What::kRingLost:
+        world_.network.reform(step.node, &random);
+        break;
+      case What::kHostDown:
+        end(daemon, false);
+        world_.network.host_down(step.node);
+        break;
+      case What::kCorosyncDown:
+        world_.network.host_down(step.node);
+        if (daemon) daemon->replication().gone("Corosync is not there");
+        break;
+      case What::kHostUp:
+        world_.network.host_up(step.node);
+        break;
+      case What::kKill:
+        end(daemon, random.chance(50));
+        break;
+      case What::kStop:
+        if (!awake(step.node)) break;
+        daemon->leave();
+        daemon.reset();
+        host.verdicts.clear();
+        break;
+      case What::kStart:
+        if (!daemon && host.up) daemon = start(step.node);
+        break;
+      default:
+        if (daemon) daemon->hung = step.what == What::kHang;
+    }
+  }
+  std::string states() const {
+    std::string all;
+    for (const auto& daemon : daemons_)
+      if (daemon) all += "\n  node " + std::to_string(daemon->self().node) + " is " + daemon->replication().state();
+    return all;
+  }
+
+  World world_;
+  std::vector<std::unique_ptr<Daemon>> daemons_;  // by node
+};
+
+// ----------------------------------------------------------------------------------------------------- episodes
+
+/// Every seed is a cluster of its own kind.
+Plan plan_of(std::uint64_t seed, bool safe, Rule without) {
+  Random random(seed);
+  Plan plan;
+  plan.hosts = 3 + random.below(3);
+  plan.safe = safe;
+  plan.without = without;
+  plan.piece = random.chance(50) ? 64 : 1024;
+  if (random.chance(50)) plan.limits.slice = 1;
+  return plan;
+}
+
+/// Makes up the steps of an episode, as they go: times of faults, and times in which most is mended.
+class Chance {
+ public:
+  explicit Chance(std::uint64_t seed) : random_(seed ^ 0xC0FFEE) {
+    pause_ = 50 + random_.below(400);
+    clients_ = 30 + random_.below(120);
+  }
+  Step next(Cluster& cluster) {
+    const auto moves = cluster.moves();
+    Step step{What::kPass, static_cast<Node>(1 + random_.below(static_cast<int>(cluster.hosts()))), random_.next()};
+    if (random_.below(pause_) == 0) storm_ = random_.below(80);
+    const int faults = storm_ > 0 ? 60 : 0, mends = storm_ > 0 ? 20 : 60;  // of a thousand steps
+    storm_ = std::max(storm_ - 1, 0);
+    const int dice = random_.below(1000);
+    const auto repairs = cluster.repairs();
+    if (dice < faults) {
+      step.what = one_of(What::kCut, What::kHang);
+    } else if (dice < faults + mends && !repairs.empty()) {
+      const Step& repair = random_.one_of(repairs);
+      step.what = repair.what;
+      step.node = repair.node;
+    } else if (dice < faults + mends + clients_) {
+      const int kind = random_.below(100);
+      step.what = kind < 75   ? What::kRequest
+                  : kind < 87 ? What::kBeginSession
+                  : kind < 92 ? What::kEndSession
+                              : What::kWork;
+    } else if (moves.empty() || dice > 970) {
+      step.dice = random_.next() % (random_.chance(moves.empty() ? 30 : 3) ? 2'000 : 50);
+    } else {
+      const Step& move = some_move(moves);
+      step.what = move.what == What::kDatagram && random_.chance(15) ? What::kLoseDatagram : move.what;
+      step.node = move.node;
+    }
+    return step;
+  }
+
+ private:
+  /// Some do their part late for a while.
+  const Step& some_move(const std::vector<Step>& moves) {
+    if (random_.chance(2)) late_ = random_.next() & random_.next();
+    const Step* move = nullptr;
+    for (int i = 0; i < 5; ++i) {
+      move = &random_.one_of(moves);
+      if (!(late_ >> (static_cast<std::uint64_t>(move->what) * 6 + move->node) & 1)) break;
+    }
+    return *move;
+  }
+  What one_of(What first, What last) {
+    const int count = static_cast<int>(last) - static_cast<int>(first) + 1;
+    return static_cast<What>(static_cast<int>(first) + random_.below(count));
+  }
+  Random random_;
+  int pause_ = 0;  // steps between times of faults
+  int storm_ = 0;  // how many more of this one
+  int clients_ = 0;
+  std::uint64_t late_ = 0;  // a bit for each kind of move of each host
+};
+
+std::string finish(Cluster& cluster, std::uint64_t dice) {
+  const auto so_far = [&] { return cluster.error().empty(); };
+  cluster.mend();
+  if (so_far()) cluster.check_served();
+  if (so_far()) cluster.check_same();
+  if (so_far()) cluster.check_hung(dice);
+  if (so_far()) cluster.check_served();
+  if (so_far()) cluster.check_same();
+  return cluster.error();
+}
+
+using Trace = std::vector<Step>;
+
+std::string run(const Plan& plan, std::uint64_t seed, Trace& trace) {
+  Cluster cluster(plan);
+  Chance chance(seed);
+  while (trace.size() < kEpisode && cluster.error().empty()) {
+    trace.push_back(chance.next(cluster));
+    cluster.perform(trace.back());
+  }
+  return cluster.error().empty() ? finish(cluster, seed) : cluster.error();
+}
+
+std::string run_again(const Plan& plan, std::uint64_t seed, const Trace& trace, std::string* story = nullptr) {
+  Cluster cluster(plan, story);
+  for (const Step& step : trace) {
+    cluster.perform(step);
+    if (!cluster.error().empty()) return cluster.error();
+  }
+  return finish(cluster, seed);
+}
+
+/// Leaves out what is not needed for an error of the same kind.
+Trace shrink(const Plan& plan, std::uint64_t seed, Trace trace, const std::string& error) {
+  const std::string kind = error.substr(0, error.find(':'));
+  int runs = 3'000;
+  for (std::size_t chunk = trace.size() / 2; chunk > 0; chunk /= 2) {
+    for (std::size_t from = 0; from < trace.size() && runs > 0;) {
+      Trace less(trace.begin(), trace.begin() + static_cast<std::ptrdiff_t>(from));
+      const std::size_t rest = std::min(from + chunk, trace.size());
+      less.insert(less.end(), trace.begin() + static_cast<std::ptrdiff_t>(rest), trace.end());
+      --runs;
+      if (run_again(plan, seed, less).starts_with(kind)) {
+        trace = std::move(less);
+      } else {
+        from += chunk;
+      }
+    }
+  }
+  return trace;
+}
+
+std::string report(const Plan& plan, std::uint64_t seed, const Trace& trace, const std::string& error) {
+  std::string all = error + "\nepisode " + std::to_string(seed) + ", " + std::to_string(plan.hosts) + " hosts\n";
+  const Trace shrunk = shrink(plan, seed, trace, error);
+  std::string story;
+  const std::string again = run_again(plan, seed, shrunk, &story);
+  return all + std::to_string(shrunk.size()) + " steps:\n" + story + again + "\n";
+}
+
+/// Empty, or what went wrong and how.
+std::string search(std::uint64_t steps, bool safe, Rule without, bool tell) {
+  std::uint64_t seed = number_from("GS_CLUSTER_SIM_SEED", 1);
+  for (std::uint64_t done = 0; done < steps; ++seed) {
+    const Plan plan = plan_of(seed, safe, without);
+    Trace trace;
+    const std::string error = run(plan, seed, trace);
+    done += trace.size();
+    if (error.empty()) continue;
+    return tell ? report(plan, seed, trace, error)
+                : error + " (episode " + std::to_string(seed) + ", " + std::to_string(done) + " steps)";
+  }
+  return "";
+}
+
+TEST(ClusterSimulator, Random_faults_break_no_promise) {
+  const std::string error = search(number_from("GS_CLUSTER_SIM_STEPS", kSteps), true, Rule::kNone, true);
+  EXPECT_TRUE(error.empty()) << error;
+}
+
+TEST(ClusterSimulator, Random_faults_break_no_promise_of_agreed_delivery) {
+  const std::string error = search(number_from("GS_CLUSTER_SIM_STEPS", kSteps) / 2, false, Rule::kNone, true);
+  EXPECT_TRUE(error.empty()) << error;
+}
+
+class ClusterRule : public testing::TestWithParam<Rule> {};
+
+struct Print { ~Print() { for (auto& [k, n] : seen_all) std::cerr << n << " " << k << "\n"; } } print_;
+
+TEST_P(ClusterRule, Left_out_is_found) {
+  const std::string error = search(number_from("GS_CLUSTER_SIM_STEPS", kSteps), true, GetParam(), false);
+  EXPECT_NE(error, "");
+  std::cerr << "rule " << static_cast<int>(GetParam()) << ": " << error << "\n";
+}
+
+constexpr std::array kRules{
+    Rule::kVerdictFirst,   Rule::kPassOver,           Rule::kEveryRing,
+    Rule::kWordNamesBegin, Rule::kConfirmDecision,    Rule::kConfirmNamesExchange,
+    Rule::kConfirmAll,     Rule::kHostsAreState,      Rule::kLives,
+    Rule::kAside,          Rule::kPieceNamesBegin,    Rule::kBeginWhenCaughtUp,
+    Rule::kSnapshotAtDecision, Rule::kVotesOfHolders, Rule::kEvictedIsToldToLose,
+    Rule::kEvictedBeginsAgain, Rule::kNumbersGoOn,    Rule::kHistoryOfRing,
+    Rule::kHistoryOfExchanges, Rule::kHistoryOfMessages};
+
+INSTANTIATE_TEST_SUITE_P(Each, ClusterRule, testing::ValuesIn(kRules));
+
+}  // namespace
+}  // namespace gs::cluster::test
