@@ -27,16 +27,16 @@ die() { echo "$*" >&2; exit 1; }
 # await TEXT FILE: until a line of the file has the text.
 await() {
   local end=$((SECONDS + 60))
-  until grep -q -- "$1" "$2"; do
+  until grep -qs -- "$1" "$2"; do
     [ $SECONDS -lt $end ] || die "no \"$1\" in $2"
     sleep 0.05
   done
 }
 
 start_daemon() { # HOST LOG: and waits until it serves
-  "$cluster" on "$1" "$bin/gsd" --ordering corosync --member-timeout 2 --socket-path /run/gsd.sock >"$2" 2>&1 &
+  "$cluster" on "$1" "$bin/gsd" --ordering corosync --member-timeout 2 --socket-path /run/gsd.sock >>"$2" 2>&1 &
   daemon[$1]=$!
-  await " serving" "$2"
+  await "info serving" "$2"
 }
 
 # member HOST NUMBER: joins; what is written into in.NUMBER are its commands.
@@ -90,6 +90,17 @@ for n in 1 3 4 5 6; do
   events 2 | sed -n "/^${first%% *} /,\$p" | head -n "$(wc -l <told.$n)" >expected.$n
   [ -s told.$n ] && cmp told.$n expected.$n || die "member $n was told another history than member 2"
 done
+
+# Corosync dies under a living daemon, and is started again.
+: >gsd2.log
+"$cluster" kill 2
+await DIED_HORRIBLY member2.log
+for n in 5 6; do await "2 has failed" member$n.log; done
+"$cluster" start 2
+await "info serving" gsd2.log
+member 2 7
+for n in 5 6 7; do await "members: 5 6 7" member$n.log; done
+
 kill "${daemon[@]}"
 wait "${daemon[@]}"
 echo "one history"

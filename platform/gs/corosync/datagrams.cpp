@@ -4,6 +4,7 @@
 
 #include <array>
 #include <cstring>
+#include <utility>
 
 namespace gs::cluster {
 namespace {
@@ -62,6 +63,7 @@ void Datagrams::set_peers(const std::map<Node, Word>& words) {
     if (space == std::string::npos) continue;
     parse_address(word.address.substr(0, space), word.address.substr(space + 1), &peer.address, &peer.length);
   }
+  if (readable_ && !kept_.empty()) event_active(readable_.get(), EV_READ, 0);
 }
 
 void Datagrams::send(const Confirmed& confirmed) {
@@ -75,17 +77,23 @@ void Datagrams::send(const Confirmed& confirmed) {
 }
 
 void Datagrams::read() {
+  for (auto& packet : std::exchange(kept_, {})) take(std::move(packet));
   std::array<std::byte, 2048> packet;
+  for (int i = 0; i < kAtOnce; ++i) {
+    const ssize_t size = recv(socket_.get(), packet.data(), packet.size(), 0);
+    if (size < 0) return;
+    take({packet.begin(), packet.begin() + size});
+  }
+}
+
+void Datagrams::take(std::vector<std::byte> packet) {
   const auto key_of = [this](Node node) -> const std::string* {
     const auto found = peers_.find(node);
     return found == peers_.end() ? nullptr : &found->second.key;
   };
-  for (int i = 0; i < kAtOnce; ++i) {
-    const ssize_t size = recv(socket_.get(), packet.data(), packet.size(), 0);
-    if (size < 0) return;
-    const auto opened = gs::cluster::open(std::span(packet).first(static_cast<std::size_t>(size)), key_of);
-    if (opened) receive_(opened->first, opened->second);
-  }
+  if (const auto opened = gs::cluster::open(packet, key_of)) return receive_(opened->first, opened->second);
+  if (kept_.size() == kMostKept) kept_.pop_front();
+  kept_.push_back(std::move(packet));
 }
 
 }  // namespace gs::cluster

@@ -4,10 +4,12 @@
 #include <event2/event.h>
 #include <sys/socket.h>
 
+#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "cluster/datagram.h"
 #include "common/descriptor.h"
@@ -40,9 +42,11 @@ class Datagrams {
   struct FreeEvent {
     void operator()(event* e) const { event_free(e); }
   };
-  static constexpr int kAtOnce = 64;  // before others are served
+  static constexpr int kAtOnce = 64;            // before others are served
+  static constexpr std::size_t kMostKept = 64;  // whose sender may become known
 
   void read();
+  void take(std::vector<std::byte> packet);
 
   event_base* const base_;
   const Receive receive_;
@@ -52,6 +56,7 @@ class Datagrams {
   platform::Descriptor socket_;
   std::unique_ptr<event, FreeEvent> readable_;  // goes before its descriptor
   std::map<Node, Peer> peers_;
+  std::deque<std::vector<std::byte>> kept_;  // the word with its sender's key may come behind it
 };
 
 }  // namespace gs::cluster
