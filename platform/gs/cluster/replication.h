@@ -47,8 +47,8 @@ class Order {
   virtual void send(const Message& message) = 0;
   /// Beside the order: may be lost, doubled, late.
   virtual void confirm(const Confirmed& confirmed) = 0;
-  /// Who may confirm from now on, as far as they are known, with their addresses and keys: others may have read the
-  /// last word before.
+  /// Who may confirm from now on, as far as they are known, with their addresses and keys: others may have read
+  /// the last word before.
   virtual void set_peers(const std::map<Node, Word>& peers) = 0;
   /// Of this daemon, for its words.
   virtual std::string address() const = 0;
@@ -102,6 +102,21 @@ enum class Rule {
   kHistoryOfMessages,
 };
 
+/// A state that is being received.
+struct CatchingUp {
+  Track track;
+  std::uint32_t next = 0;  // piece
+  std::vector<std::byte> bytes;
+};
+
+/// A state that is being sent.
+struct Donation {
+  BeginId begin;
+  std::vector<std::byte> bytes;
+  std::uint32_t sent = 0;   // pieces
+  std::uint32_t count = 0;  // likewise
+};
+
 /// Not safe for concurrent use. `advance` comes before any other input that has happened later.
 class Replication {
  public:
@@ -152,18 +167,6 @@ class Replication {
   static constexpr Duration kBetweenRanks{250};  // until the next one asks for an eviction
   static constexpr Duration kFirstPause{250};    // before it joins again
   static constexpr Duration kLongestPause{30'000};
-
-  struct CatchingUp {
-    Track track;
-    std::uint32_t next = 0;  // piece
-    std::vector<std::byte> bytes;
-  };
-  struct Donation {
-    BeginId begin;
-    std::vector<std::byte> bytes;
-    std::uint32_t sent = 0;
-    std::uint32_t count = 0;
-  };
 
   void on(const Process& from, const Begin& begin);
   void on(const Process& from, const Word& word);
