@@ -6,7 +6,7 @@ STORM_SECONDS ?= 3600
 SEED ?= 1
 MEMBERS ?= 10
 
-.PHONY: all demo test storm bench install package help
+.PHONY: all cluster demo test storm bench install package help
 
 all: ## build everything, optimised
 	@scripts/build.sh release
@@ -17,6 +17,11 @@ demo: ## processes vote, talk and die, one timeline of what each saw; then daemo
 
 test: ## the whole suite: release build, address+undefined sanitizers, thread sanitizer
 	@scripts/test.sh release asan tsan
+
+cluster: ## a shell on the first of three hosts on this machine, to play with; needs no root
+	@scripts/dependencies.sh cluster
+	@scripts/build.sh release
+	@scripts/cluster.sh run 3 $(CURDIR)/scripts/cluster_shell.sh $(CURDIR)/$(release)/bin
 
 storm: ## processes killed and stopped at random, what they saw compared; STORM_SECONDS=3600 SEED=1 MEMBERS=10
 	@scripts/build.sh release storm

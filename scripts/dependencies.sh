@@ -1,5 +1,5 @@
 #!/bin/bash
-# dependencies.sh build|test|package: installs with apt whatever of the packages below is missing; silent when nothing is.
+# dependencies.sh build|test|cluster|package: installs with apt whatever of the packages below is missing; silent when nothing is.
 . "$(dirname "$0")/common.sh"
 
 wanted=(g++ cmake ninja-build pkg-config libevent-dev libflatbuffers-dev flatbuffers-compiler libcli11-dev
@@ -7,7 +7,8 @@ wanted=(g++ cmake ninja-build pkg-config libevent-dev libflatbuffers-dev flatbuf
         libcfg-dev libcorosync-common-dev libgtest-dev libgmock-dev libbenchmark-dev)
 # The sanitizer builds use clang. Where its runtimes are a package of their own they are wanted too, elsewhere
 # (Ubuntu 22.04) they come with the compiler. The symbolizer of llvm makes the sanitizers' reports readable.
-if [ "${1:-build}" = test ]; then wanted+=(clang llvm libclang-rt-dev corosync iproute2); fi
+if [ "${1:-build}" = test ]; then wanted+=(clang llvm libclang-rt-dev); fi
+if [[ "${1:-build}" = test || "${1:-build}" = cluster ]]; then wanted+=(corosync iproute2); fi
 
 if [ "${1:-build}" = package ]; then wanted+=(dpkg-dev); fi
 

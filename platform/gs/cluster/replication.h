@@ -92,7 +92,6 @@ enum class Rule {
   kAside,
   kPieceNamesBegin,
   kBeginWhenCaughtUp,
-  kSnapshotAtDecision,
   kVotesOfHolders,
   kEvictedIsToldToLose,
   kEvictedBeginsAgain,

@@ -48,7 +48,7 @@ void serve(gs::daemon::Options options, std::function<gs::daemon::Options()> rer
   gs::daemon::Server server(options, log);
   service->attach(server, options, manager);
   held.reset();
-  log->info("gsd " GSD_VERSION " serves {} as node {}", options.socket_path, options.node_number);
+  log->info("gsd " GSD_VERSION " {}", gs::daemon::serves(options));
   tell_ready(options.ready_fd);
   service->tell_ready();
   server.run();

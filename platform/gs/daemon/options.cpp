@@ -182,6 +182,11 @@ bool is_missing(const std::string& path) {
 
 }  // namespace
 
+std::string serves(const Options& options) {
+  return "serves " + options.socket_path +
+         (options.corosync ? " with Corosync" : " as node " + std::to_string(options.node_number));
+}
+
 Options read_config(const std::string& path, Options options) {
   const toml::value file = platform::parse_toml_file(path);
   for (const auto& [name, value] : file.as_table()) apply(name, value, options);

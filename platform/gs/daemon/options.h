@@ -44,6 +44,9 @@ using OptionError = platform::SettingError;
 /// --version was asked for and is answered on standard output. Throws OptionError.
 std::optional<Options> parse_options(int argc, const char* const* argv);
 
+/// For people: what it serves, and as what.
+std::string serves(const Options& options);
+
 /// As in `options`, with what the configuration file says put in its place. Throws OptionError.
 Options read_config(const std::string& path, Options options);
 

@@ -34,6 +34,15 @@ void print_group(const Engine::GroupStatus& group) {
   line("  subscribers", std::to_string(group.subscribers));
 }
 
+std::string domain_of(const Domain* domain) {
+  if (domain == nullptr) return "serving nobody";
+  std::string text = "node " + std::to_string(domain->self);
+  if (domain->nodes.size() == 1) return text;
+  text += " of";
+  for (const Node node : domain->nodes) text += " " + std::to_string(node);
+  return text;
+}
+
 void print_session(const SessionLayer::SessionStatus& session) {
   line("session", std::to_string(session.number) + " " + session.program + " (pid " + std::to_string(session.pid) +
                       ", uid " + std::to_string(session.uid) + ")");
@@ -60,9 +69,7 @@ void Service::attach(Server& server, Options& options, const platform::ServiceMa
   if (getStopCode() != 0) server.stop(getStopMsg());  // SIGTERM came before the server took it over
 }
 
-void Service::tell_ready() const {
-  manager_->ready("serves " + options_->socket_path + " as node " + std::to_string(options_->node_number));
-}
+void Service::tell_ready() const { manager_->ready(serves(*options_)); }
 
 void Service::on_request() {
   doKPLreq();
@@ -142,8 +149,8 @@ void Service::longStatus() {
   const auto sessions = server_->sessions();
   for (const auto& group : groups) print_group(group);
   for (const auto& session : sessions) print_session(session);
-  line("total", std::to_string(groups.size()) + " groups, " + std::to_string(sessions.size()) +
-                    " sessions, node " + std::to_string(options_->node_number));
+  line("total", std::to_string(groups.size()) + " groups, " + std::to_string(sessions.size()) + " sessions, " +
+                    domain_of(server_->domain()));
 }
 
 }  // namespace gs::daemon

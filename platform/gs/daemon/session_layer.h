@@ -106,6 +106,8 @@ class SessionLayer : private PingSink, private Replica {
     std::size_t answer_bytes = 0;        // that wait for the client to read them
     std::size_t notification_bytes = 0;  // likewise
   };
+  /// Null: no client is served.
+  const Domain* domain() const { return serving_ ? &domain_ : nullptr; }
   /// In the order of their numbers.
   std::vector<SessionStatus> status() const;
   std::vector<Engine::GroupStatus> groups() const { return engine_->status(); }
