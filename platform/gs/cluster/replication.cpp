@@ -317,19 +317,21 @@ void Replication::apply_confirmed() {
 
 /// Who is there is what the engine knows: whose life does not go on has failed, whatever came before.
 void Replication::apply(const Decision& decision) {
+  const Lives before = std::exchange(own_.hosts, decision.holders);
+  const auto apply = [this](const Event& event) {
+    if (state_ == State::kRunning) replica_.apply(event);  // else it has failed with the one before
+  };
   const auto goes_on = [&](const auto& host) { return same(decision.holders, host.first, host.second); };
-  const bool somebody_gone = own_.hosts.empty() || !std::ranges::all_of(own_.hosts, goes_on);
-  if (somebody_gone && keeps(Rule::kNumbersGoOn)) replica_.apply(NumbersEvent{decision.numbers});
-  for (const auto& host : own_.hosts) {
+  const bool somebody_gone = before.empty() || !std::ranges::all_of(before, goes_on);
+  if (somebody_gone && keeps(Rule::kNumbersGoOn)) apply(NumbersEvent{decision.numbers});
+  for (const auto& host : before) {
     if (goes_on(host) || (!keeps(Rule::kHostsAreState) && !decision.left.contains(host.first))) continue;
     const auto code = decision.left.find(host.first);
-    replica_.apply(
-        HostGoneEvent{host.first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
+    apply(HostGoneEvent{host.first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
   }
   for (const auto& [node, life] : decision.holders) {
-    if (!same(own_.hosts, node, life)) replica_.apply(HostCameEvent{node});
+    if (!same(before, node, life)) apply(HostCameEvent{node});
   }
-  own_.hosts = decision.holders;
   if (state_ != State::kRunning || decision.begin != decision_->begin) return;
   serve(decision);
   donate(decision);

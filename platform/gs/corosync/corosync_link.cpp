@@ -243,19 +243,19 @@ void CorosyncLink::on_quorum(bool quorate, const quorum_ring_id& ring, std::span
 // --------------------------------------------------------------------------------------------------- what it is
 // told
 
-void CorosyncLink::join() {
-  tasks_.emplace_back(Join{});
-  work_off();
-}
+void CorosyncLink::join() { enqueue(Join{}); }
 
 void CorosyncLink::leave() {
   tasks_.clear();
-  tasks_.emplace_back(Leave{});
-  work_off();
+  enqueue(Leave{});
 }
 
-void CorosyncLink::send(std::vector<std::byte> message) {
-  tasks_.emplace_back(std::move(message));
+void CorosyncLink::send(std::vector<std::byte> message) { enqueue(std::move(message)); }
+
+/// Where Corosync is not there, there is no group to do anything in.
+void CorosyncLink::enqueue(Task task) {
+  if (cpg_ == 0) return;
+  tasks_.push_back(std::move(task));
   work_off();
 }
 
@@ -292,7 +292,7 @@ void CorosyncLink::work_off() {
       log_->debug("{}", text("Corosync refuses a task", error));  // its descriptor tells the rest
     tasks_.pop_front();
   }
-  if (!tasks_.empty()) event_add(work_later_.get(), &kUntilTaken);
+  if (cpg_ != 0 && !tasks_.empty()) event_add(work_later_.get(), &kUntilTaken);
 }
 
 }  // namespace gs::cluster

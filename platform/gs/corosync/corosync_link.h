@@ -77,6 +77,7 @@ class CorosyncLink {
   void lose(const std::string& what);
   template <typename Dispatch>
   void dispatch(const char* what, Dispatch dispatch);
+  void enqueue(Task task);
   void work_off();
   bool leave_group();
   cs_error_t run(const Task& task);
