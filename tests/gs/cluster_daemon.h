@@ -207,7 +207,10 @@ class Daemon : public Order, public Replica, public Host {
     world_.history.hold(self_.node, place_);
     if (world_.plan.safe) note_confirmed();
     world_.history.applied(self_.node, place_, beside());
-    if (serving_) world_.history.serves(self_.node, ring_, place_, beside());
+    if (serving_) {
+      world_.history.serves(self_.node, ring_, place_, beside());
+      world_.history.told(place_, out.timers);
+    }
     if (const auto* request = std::get_if<RequestEvent>(&event)) answer(*request, out.rc);
     if (std::holds_alternative<ContinueEvent>(event)) continued_ = false;
   }

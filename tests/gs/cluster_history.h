@@ -29,7 +29,9 @@ class History {
     const auto [known, is_new] = children_.try_emplace({at, event}, static_cast<Place>(places_.size()));
     if (is_new) {
       places_.push_back({at, places_[at].depth + 1, digest, places_[at].number, 0});
-      number(known->second, timers);
+      for (const TimerRequest& timer : timers)
+        if (timer.id.phase == 1 && timer.id.protocol <= std::exchange(places_.back().number, timer.id.protocol))
+          error("numbers go back: in one sequence");
     }
     if (places_[known->second].digest != digest) error("states differ: after the same events");
     return known->second;
@@ -48,6 +50,12 @@ class History {
   }
   void serves_no_more(Node node) { serving_.erase(node); }
 
+  /// What clients are told of a protocol by its number, they are told of no other one.
+  void told(Place at, const std::vector<TimerRequest>& timers) {
+    for (const TimerRequest& timer : timers)
+      if (timer.id.phase == 1 && numbers_.try_emplace(timer.id.protocol, at).first->second != at)
+        error("numbers twice: one names two protocols");
+  }
   /// Where a majority is in this exchange, it has what a majority holds.
   void applied(Node node, Place at, const std::set<Node>& beside) {
     if (never_taken_back_ && beside.size() >= majority_ && !on_one_way(at, kept_))
@@ -88,14 +96,6 @@ class History {
     Node holders = 0;
   };
 
-  /// A new protocol's number is above all before it, and nobody else's.
-  void number(Place at, const std::vector<TimerRequest>& timers) {
-    for (const TimerRequest& timer : timers) {
-      if (timer.id.phase != 1) continue;
-      if (timer.id.protocol <= std::exchange(places_[at].number, timer.id.protocol)) error("numbers go back");
-      if (!numbers_.try_emplace(timer.id.protocol, at).second) error("numbers twice: one names two protocols");
-    }
-  }
   bool on_one_way(Place a, Place b) const {
     if (places_[a].depth > places_[b].depth) std::swap(a, b);
     while (places_[b].depth > places_[a].depth) b = places_[b].parent;

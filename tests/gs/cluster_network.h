@@ -143,12 +143,11 @@ class Network {
   void reform(Node node, Random* random) {
     if (!at(node).up) return;
     auto members = component(node);
-    if (random && members.size() > 1 && random->chance(10))
-      std::erase_if(members, [&, out = random->one_of(members)](Node m) { return m == out && m != node; });
+    if (random && random->chance(20)) std::erase_if(members, [&](Node m) { return m != node && random->chance(40); });
     auto ring = std::make_shared<Ring>(Ring{{0, members.front()}, members, {}});
     for (const Node m : members) ring->id.sequence = std::max(ring->id.sequence, at(m).sequence + 4);
     const auto apart = equalise(members, ring->id);
-    const int percent = !random || random->chance(80) ? 100 : random->chance(50) ? 0 : 50;
+    const int percent = !random || random->chance(60) ? 100 : random->chance(60) ? 0 : 50;
     std::set<Node> shown;
     for (const Node m : members)
       if (percent == 100 || random->chance(percent)) shown.insert(m);

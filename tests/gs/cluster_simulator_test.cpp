@@ -286,7 +286,7 @@ Plan plan_of(std::uint64_t seed, bool safe, Rule without) {
 class Chance {
  public:
   explicit Chance(std::uint64_t seed) : random_(seed ^ 0xC0FFEE) {
-    pause_ = 50 + random_.below(400);
+    pause_ = 100 + random_.below(900);
     clients_ = 30 + random_.below(120);
   }
   Step next(Cluster& cluster) {
