@@ -5,12 +5,14 @@
 #include <unordered_map>
 
 #include "engine/engine.h"
+#include "engine/text.h"
 #include "gs/cluster_history.h"
 #include "gs/cluster_network.h"
 #include "gs/cluster_text.h"
-#include "engine/text.h"
 
 namespace gs::cluster::test {
+
+using Seen = std::map<std::string, std::uint64_t>;  // how often what has happened
 
 struct Plan {
   int hosts = 3;
@@ -30,8 +32,7 @@ struct Datagram {
 
 /// What the hosts of one simulation share.
 struct World {
-  explicit World(const Plan& of)
-      : plan(of), network(of.hosts), history(static_cast<Node>(of.hosts), of.safe) {}
+  explicit World(const Plan& of) : plan(of), network(of.hosts), history(static_cast<Node>(of.hosts), of.safe) {}
 
   /// For whoever reads a failure.
   void tell(Node node, const std::string& what) {
@@ -44,16 +45,16 @@ struct World {
   History history;
   Time now{0};
   std::vector<Datagram> datagrams;
-  std::deque<TimerId> timers;                       // that somebody has armed
-  std::set<SessionId> sessions;                     // all that have begun
-  std::set<SessionId> over;                         // those that have ended
-  std::map<Node, Word> words;                       // everybody's last, since it has lost its state
+  std::deque<TimerId> timers;    // that somebody has armed
+  std::set<SessionId> sessions;  // all that have begun
+  std::set<SessionId> over;      // those that have ended
+  std::map<Node, Word> words;    // everybody's last, since it has lost its state
   struct Named {
     std::uint64_t name = 0;
     std::shared_ptr<const Event> event;
   };
   std::unordered_map<const Event*, Named> events;  // all that were ever sent
-  std::map<std::string, std::uint64_t> seen;  // how often what has happened
+  Seen seen;
   std::uint64_t last_life = 0;
   std::uint32_t last_pid = 0;
 };
@@ -64,13 +65,14 @@ class Daemon : public Order, public Replica, public Host {
       : world_(world),
         self_{node, ++world.last_pid},
         engine_(std::make_unique<Engine>(world.plan.limits)),
-        replication_({.self = self_,
-                      .safe = world.plan.safe,
-                      .member_timeout = Duration(1'000),
-                      .piece = world.plan.piece,
-                      .without = world.plan.without},
-                     *this, *this, *this, [this] { return Random(++world_.last_life).next(); },
-                     [this] { return 1'700'000'000'000u + static_cast<std::uint64_t>(world_.now.count()); }) {
+        replication_(
+            {.self = self_,
+             .safe = world.plan.safe,
+             .member_timeout = Duration(1'000),
+             .piece = world.plan.piece,
+             .without = world.plan.without},
+            *this, *this, *this, [this] { return Random(++world_.last_life).next(); },
+            [this] { return 1'700'000'000'000u + static_cast<std::uint64_t>(world_.now.count()); }) {
     world_.network.start(node);
   }
   Daemon(const Daemon&) = delete;
@@ -101,7 +103,8 @@ class Daemon : public Order, public Replica, public Host {
     replication_.advance(world_.now);
     const Verdict verdict = std::move(verdicts.front());
     verdicts.pop_front();
-    world_.tell(self_.node, "hears of ring " + text(verdict.ring) + (verdict.quorate ? " quorate" : " not quorate"));
+    world_.tell(self_.node,
+                "hears of ring " + text(verdict.ring) + (verdict.quorate ? " quorate" : " not quorate"));
     replication_.verdict(verdict);
   }
   void take(const Datagram& datagram) {
@@ -148,7 +151,6 @@ class Daemon : public Order, public Replica, public Host {
 
   // ---------------------------------------------------------------------------------------------------- checks
 
-  bool is_busy() const { return engine_->busy(); }
   bool has_pending() const {
     return std::ranges::any_of(clients_, [](const auto& c) { return c.second.pending > 0; });
   }
@@ -176,8 +178,6 @@ class Daemon : public Order, public Replica, public Host {
     lose_state();
   }
   void send(const Message& message) override {
-    constexpr const char* kKinds[] = {"begin", "word", "ordered", "piece", "confirmed", "evict"};
-    ++world_.seen[kKinds[message.index()]];
     if (const auto* word = std::get_if<Word>(&message)) {
       world_.words[self_.node] = *word;
       own_word_ = *word;
@@ -198,15 +198,15 @@ class Daemon : public Order, public Replica, public Host {
   // --------------------------------------------------------------------------------------------------- Replica
 
   void apply(const Event& event) override {
-    ++world_.seen["applied"];
     const auto out = engine_->apply(event);
     for (const TimerRequest& timer : out.timers) world_.timers.push_back(timer.id);
     while (world_.timers.size() > 8) world_.timers.pop_front();
     place_ = world_.history.apply(place_, name_of(event), engine_->digest(), out.timers);
     world_.tell(self_.node, "applies " + gs::text(event) + ", is at " + std::to_string(place_));
+    if (!world_.network.is_quorate(ring_)) world_.history.error("no quorum: but something is applied");
+    world_.history.applied(self_.node, place_, beside());
     world_.history.hold(self_.node, place_);
     if (world_.plan.safe) note_confirmed();
-    world_.history.applied(self_.node, place_, beside());
     if (serving_) {
       world_.history.serves(self_.node, ring_, place_, beside());
       world_.history.told(place_, out.timers);
@@ -235,7 +235,7 @@ class Daemon : public Order, public Replica, public Host {
     return true;
   }
   void serve(const Domain& domain) override {
-    ++world_.seen["served"];
+    world_.history.applied(self_.node, place_, beside());
     world_.tell(self_.node, "serves");
     domain_ = domain;
     serving_ = true;
@@ -316,11 +316,16 @@ class Daemon : public Order, public Replica, public Host {
   void note_confirmed() {
     auto best = own_word_.history;
     for (const auto& [node, word] : peers_) best = std::max(best, word.history);
+    Node holders = 0;
     for (const auto& [node, word] : peers_) {
+      if (word.history != best) continue;
+      ++holders;
       const auto last = world_.words.find(node);
-      const bool lives = last != world_.words.end() && last->second.life == word.life;
-      if (lives && word.history == best) world_.history.confirmed(node, place_);
+      if (last != world_.words.end() && last->second.life == word.life) world_.history.confirmed(node, place_);
     }
+    if (holders >= world_.history.majority()) return;
+    for (const Node node : world_.network.members(ring_))
+      if (!peers_.contains(node) && world_.history.holds_something(node)) world_.history.confirmed(node, place_);
   }
   /// What was sent is the same wherever it is applied; the rest comes of a decision.
   std::uint64_t name_of(const Event& event) const {

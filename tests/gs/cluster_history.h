@@ -12,10 +12,11 @@ namespace gs::cluster::test {
 /// A tree: a place in it is a sequence of events, the root an empty engine. Replicas that are at the same place
 /// must be in the same state.
 ///
-/// A host *holds* a place when it has applied it, or has confirmed it while it had the state before it, and has not
-/// lost its state since; it loses it by dying, by leaving the group, and where it takes up a state without that
-/// place. What a replica has applied and a majority of all hosts holds, is on every later replica's way: each ring
-/// with quorum has somebody who holds it.
+/// A host *holds* a place when it has applied it, or has confirmed it while it had the state before it, and has
+/// not lost its state since; it loses it by dying, by leaving the group, and where it takes up a state without
+/// that place. What a replica has applied and a majority of all hosts holds, is on every later replica's way: each
+/// ring with quorum has somebody who holds it. Where an exchange without a majority of holders leaves somebody out
+/// who has a state, he counts as if he held what is applied: such an exchange must not be.
 class History {
  public:
   using Place = std::uint32_t;
@@ -66,6 +67,8 @@ class History {
     const Place held = held_[node];
     if (places_[held].depth < places_[at].depth || !on_one_way(held, at)) hold(node, at);
   }
+  Node majority() const { return majority_; }
+  bool holds_something(Node node) const { return held_[node] != kEmpty; }
   void hold(Node node, Place to) {
     Place from = std::exchange(held_[node], to), best = kEmpty;
     while (from != to) {

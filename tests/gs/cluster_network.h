@@ -41,14 +41,14 @@ struct Ring {
 struct Station {
   Node node = 0;
   bool up = false;
-  int side = 0;                 // of the cut
-  std::shared_ptr<Ring> ring;   // the last that was shown
-  std::size_t position = 0;     // received of its order
-  bool gathering = true;        // the ring is over, the next one is not there
+  int side = 0;                  // of the cut
+  std::shared_ptr<Ring> ring;    // the last that was shown
+  std::size_t position = 0;      // received of its order
+  bool gathering = true;         // the ring is over, the next one is not there
   std::uint64_t companions = 0;  // differs from that of those who were not in the rings that were not shown
-  std::uint64_t sequence = 0;   // of the last ring; survives
-  std::set<Process> group;      // as it was shown
-  std::set<Process> local;      // of the group
+  std::uint64_t sequence = 0;    // of the last ring; survives
+  std::set<Process> group;       // as it was shown
+  std::set<Process> local;       // of the group
   std::deque<Sent> outbox;
   std::optional<Sent> owed;  // the leave of a daemon that died, not yet sent
   // Its daemon's.
@@ -70,6 +70,9 @@ class Network {
   bool connected(Node a, Node b) const {
     return stations_[a].up && stations_[b].up && stations_[a].side == stations_[b].side;
   }
+
+  bool is_quorate(const RingId& ring) const { return 2 * rings_.at(ring).size() > hosts(); }
+  const std::vector<Node>& members(const RingId& ring) const { return rings_.at(ring); }
 
   // ---------------------------------------------------------------------------------------------- of a daemon
 
@@ -143,9 +146,11 @@ class Network {
   void reform(Node node, Random* random) {
     if (!at(node).up) return;
     auto members = component(node);
-    if (random && random->chance(20)) std::erase_if(members, [&](Node m) { return m != node && random->chance(40); });
+    if (random && random->chance(20))
+      std::erase_if(members, [&](Node m) { return m != node && random->chance(40); });
     auto ring = std::make_shared<Ring>(Ring{{0, members.front()}, members, {}});
     for (const Node m : members) ring->id.sequence = std::max(ring->id.sequence, at(m).sequence + 4);
+    rings_[ring->id] = members;
     const auto apart = equalise(members, ring->id);
     const int percent = !random || random->chance(60) ? 100 : random->chance(60) ? 0 : 50;
     std::set<Node> shown;
@@ -157,7 +162,8 @@ class Network {
       Station& host = at(m);
       host.sequence = ring->id.sequence;
       host.gathering = !shown.contains(m);
-      if (!host.gathering) install(host, ring, group, random && random->chance(30) ? apart.at(m) : std::set<Node>());
+      if (!host.gathering)
+        install(host, ring, group, random && random->chance(30) ? apart.at(m) : std::set<Node>());
       judge(host, *ring, shown.size() < members.size() ? random : nullptr);
     }
   }
@@ -227,7 +233,7 @@ class Network {
   /// That of a ring that is given up (`random`) may never come.
   void judge(Station& host, const Ring& ring, Random* random) {
     if (random && random->chance(60)) return;
-    Verdict verdict{ring.id, 2 * ring.members.size() > hosts(), {}, hosts() / 2 + 1};
+    Verdict verdict{ring.id, is_quorate(ring.id), {}, hosts() / 2 + 1};
     for (const Node m : ring.members) verdict.votes[m] = 1;
     host.latest = verdict;
     host.verdicts.push_back(std::move(verdict));
@@ -265,6 +271,7 @@ class Network {
   }
 
   std::vector<Station> stations_;
+  std::map<RingId, std::vector<Node>> rings_;  // all that were ever formed
   std::uint64_t connections_ = 0;
 };
 
