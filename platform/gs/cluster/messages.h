@@ -59,7 +59,7 @@ struct Begin {
   RingId ring;
   std::vector<Process> asked;
   std::map<Node, std::uint32_t> votes;  // in the quorum
-  std::uint32_t needed = 0;             // votes of those who have the state; 0: somebody is enough
+  std::uint32_t needed = 0;             // votes of the holders; 0: one is enough
   std::map<Node, std::uint32_t> left;   // leave codes of hosts that went, as far as they are known
   std::uint64_t clock = 0;              // milliseconds since 1970
 };
