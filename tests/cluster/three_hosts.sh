@@ -102,5 +102,5 @@ member 2 7
 for n in 5 6 7; do await "members: 5 6 7" member$n.log; done
 
 kill "${daemon[@]}"
-wait "${daemon[@]}"
+for d in "${daemon[@]}"; do wait "$d" || die "a daemon ended with status $?"; done
 echo "one history"

@@ -57,7 +57,8 @@ class Reader {
   }
   std::optional<Message> value_of(const fb::Word* m) {
     Word result{
-        value(m->begin()), m->version(), m->life(), {}, m->address()->str(), bytes_of<std::string>(m->key())};
+        value(m->begin()), m->version(), m->life(), {}, m->address()->str(), bytes_of<std::string>(m->key()),
+        m->limits()};
     if (m->history() != nullptr) result.history = value(m->history());
     return result;
   }

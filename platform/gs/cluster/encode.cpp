@@ -75,7 +75,8 @@ MessageBody body(Builder& b, const Word& m) {
   const auto address = b.CreateString(m.address);
   const auto key = put_bytes(b, m.key);
   return {fb::Body::Word,
-          fb::CreateWord(b, &begin, m.version, m.life, m.history ? &history : nullptr, address, key).Union()};
+          fb::CreateWord(b, &begin, m.version, m.life, m.history ? &history : nullptr, address, key, m.limits)
+              .Union()};
 }
 MessageBody body(Builder& b, const Ordered& m) {
   const auto event = std::visit([&b](const auto& e) { return body(b, e); }, *m.event);

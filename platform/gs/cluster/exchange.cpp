@@ -5,7 +5,7 @@
 namespace gs::cluster {
 namespace {
 
-/// Greater than any before: a ring's sequence never goes back, and where it was lost the clock has gone on.
+/// Greater than any before, as long as Corosync keeps the sequence of its rings.
 std::uint64_t numbers_of(const Begin& begin) {
   constexpr int kClockBits = 42;  // of milliseconds: until 2109
   return (begin.ring.sequence << kClockBits) | (begin.clock & ((std::uint64_t{1} << kClockBits) - 1));
@@ -21,8 +21,10 @@ bool Exchange::asks(const Process& process) const {
   return std::ranges::find(begin_.asked, process) != begin_.asked.end();
 }
 
-void Exchange::add(Node from, const Word& word) {
-  if (word.begin == begin_.id && asks(from)) words_[from] = word;
+bool Exchange::add(Node from, const Word& word) {
+  if (word.begin != begin_.id || !asks(from)) return false;
+  words_[from] = word;
+  return true;
 }
 
 std::vector<Process> Exchange::missing() const {

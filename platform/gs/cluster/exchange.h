@@ -15,7 +15,8 @@ class Exchange {
   bool asks(Node node) const;
   bool asks(const Process& process) const;
   /// Of a host's two daemons, one of which is going, the later word counts.
-  void add(Node from, const Word& word);
+  /// False: it does not answer this begin, or not by who was asked.
+  bool add(Node from, const Word& word);
   std::vector<Process> missing() const;
 
   /// The same at all who have read the same. Nothing: words are missing, or votes of those who have the state.

@@ -72,6 +72,7 @@ struct Word {
   std::optional<History> history;  // none: there is no state
   std::string address;             // for datagrams
   std::string key;                 // that the sender's datagrams are authenticated with
+  std::uint64_t limits = 0;        // of its engine, in one number: replicas must have the same
 };
 
 /// An event of the engine.

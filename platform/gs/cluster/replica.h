@@ -31,6 +31,8 @@ class Replica {
   virtual bool restore(const std::vector<std::byte>& snapshot, std::string* error) = 0;
   /// Clients may come, or the domain has changed.
   virtual void serve(const Domain& domain) = 0;
+  /// Who waits to be a client waits in vain.
+  virtual void wait_no_more() {}
   /// All clients end, and none may come; the state stays.
   virtual void drop_clients(const std::string& why) = 0;
   /// The same, and the state is empty again.

@@ -1,6 +1,7 @@
 #include "cluster/replication.h"
 
 #include <algorithm>
+#include <iterator>
 #include <utility>
 
 namespace gs::cluster {
@@ -8,6 +9,14 @@ namespace {
 
 std::string name_of(const Process& process) {
   return "node " + std::to_string(process.node) + " (pid " + std::to_string(process.pid) + ")";
+}
+
+/// A daemon speaks for its own clients, and of hosts nobody speaks: they come and go by the decisions.
+bool may_order(Node from, const Event& event) {
+  if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session.node == from;
+  if (const auto* gone = std::get_if<SessionGoneEvent>(&event)) return gone->session.node == from;
+  if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session.node == from;
+  return std::holds_alternative<TimerExpiredEvent>(event) || std::holds_alternative<ContinueEvent>(event);
 }
 
 bool same(const Lives& lives, Node node, Life life) {
@@ -72,7 +81,10 @@ void Replication::verdict(const Verdict& verdict) {
     order_.leave();
     joining_ = false;
   }
-  if (state_ == State::kOut) return join_if_quorate();
+  if (state_ == State::kOut) {
+    if (!verdict.quorate) replica_.wait_no_more();
+    return join_if_quorate();
+  }
   if (!verdict.quorate && verdict.ring.sequence >= ring_.sequence) return lose("this host has no quorum");
   begin_if_lowest();
   answer_begin();
@@ -107,7 +119,8 @@ void Replication::join_if_quorate() {
 void Replication::gone(const std::string& why) {
   verdict_.reset();
   joining_ = false;
-  if (state_ != State::kOut) lose(why);
+  if (state_ == State::kOut) return replica_.wait_no_more();
+  lose(why);
 }
 
 void Replication::lose(const std::string& why) {
@@ -195,6 +208,7 @@ void Replication::answer_begin() {
   if (word.history && !keeps(Rule::kHistoryOfRing)) word.history->ring = 0;
   if (word.history && !keeps(Rule::kHistoryOfExchanges)) word.history->exchanges = 0;
   if (word.history && !keeps(Rule::kHistoryOfMessages)) word.history->messages = 0;
+  word.limits = settings_.limits;
   word.address = order_.address();
   word.key = order_.key();
   order_.send(word);
@@ -204,7 +218,7 @@ void Replication::on(const Process& from, const Word& word) {
   if (state_ != State::kExchange) return;
   Word taken = word;
   if (!keeps(Rule::kWordNamesBegin)) taken.begin = exchange_->begin().id;
-  exchange_->add(from.node, taken);
+  if (!exchange_->add(from.node, taken)) return;
   order_.set_peers(exchange_->words());
   progress();
   conclude();
@@ -230,13 +244,20 @@ void Replication::conclude() {
   apply_confirmed();
 }
 
-/// A daemon that speaks another version than those who have the state cannot be among them.
+/// A daemon that speaks another version than those who have the state, or has other limits, cannot be among them.
 bool Replication::fits(const Decision& decision) const {
-  const auto& words = exchange_->words();
-  const std::uint16_t version = words.at(decision.holders.begin()->first).version;
-  if (version == kProtocolVersion) return true;
-  host_.give_up("the daemons of this cluster speak protocol version " + std::to_string(version) + ", not " +
-                std::to_string(kProtocolVersion));
+  const auto& [node, life] = *decision.holders.begin();
+  const Word& word = exchange_->words().at(node);
+  const std::string holder = "the daemon of node " + std::to_string(node);
+  if (word.version != kProtocolVersion) {
+    host_.give_up(holder + " speaks protocol version " + std::to_string(word.version) + ", not " +
+                  std::to_string(kProtocolVersion) + ": run the same release on all hosts");
+    return false;
+  }
+  if (word.limits == settings_.limits) return true;
+  host_.give_up(holder +
+                " has another state-bound, session-state-bound, user-state-bound or max-phase-time: "
+                "set the same on all hosts");
   return false;
 }
 
@@ -267,6 +288,7 @@ void Replication::on(const Process& from, const Ordered& ordered) {
   Track& track = current();
   if (!catching_up_ && aside_) return;
   if (!track.history || (keeps(Rule::kLives) && !track.counts(from.node, ordered.life))) return;
+  if (!may_order(from.node, *ordered.event)) return;
   if (track.waiting.empty()) progress();
   track.append(ordered);
   if (state_ != State::kRunning) return;
@@ -334,7 +356,7 @@ void Replication::apply(const Decision& decision) {
   }
   if (state_ != State::kRunning || decision.begin != decision_->begin) return;
   serve(decision);
-  donate(decision);
+  if (state_ == State::kRunning) donate(decision);
 }
 
 void Replication::serve(const Decision& decision) {
@@ -357,7 +379,8 @@ void Replication::donate(const Decision& decision) {
   if (!lowest || decision.holders.size() == decision.asked.size()) return;
   donation_ = Donation{decision.begin, replica_.snapshot()};
   if (donation_->bytes.empty()) {
-    host_.log("the state is too large to be sent: no other host can come");
+    host_.log("the state is over 1.5 GiB and cannot be sent: set a lower state-bound on all hosts");
+    order_.send(Piece{decision.begin, 0, 1, {}});
     return donation_.reset();
   }
   donation_->count = static_cast<std::uint32_t>((donation_->bytes.size() + settings_.piece - 1) / settings_.piece);
@@ -378,7 +401,7 @@ void Replication::send_piece() {
 void Replication::on(const Process& from, const Piece& piece) {
   if (donation_ && from == settings_.self && piece.begin == donation_->begin) return send_piece();
   if (!catching_up_ || (keeps(Rule::kPieceNamesBegin) && piece.begin != exchange_->begin().id)) return;
-  if (piece.index != catching_up_->next) return;
+  if (from.node != decision_->holders.begin()->first || piece.index != catching_up_->next) return;
   ++catching_up_->next;
   catching_up_->bytes.insert(catching_up_->bytes.end(), piece.bytes.begin(), piece.bytes.end());
   progress();
@@ -462,7 +485,8 @@ void Replication::evict_who_holds_up() {
 
 void Replication::on(const Process&, const Evict& evict) {
   if (evict.ring != ring_) return;
-  evicted_.insert(evict.who.begin(), evict.who.end());
+  std::ranges::copy_if(evict.who, std::inserter(evicted_, evicted_.end()),
+                       [this](const Process& process) { return std::ranges::binary_search(view_, process); });
   stop();
 }
 

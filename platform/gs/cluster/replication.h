@@ -16,10 +16,9 @@
 //
 //   (1) Every view and every ring, and every eviction, ends what runs and asks for an exchange of its own.
 //   (2) By the lowest daemon of the view that is not evicted.
-//   (3) Words and begins wait for the verdict that this ring is quorate. Not quorate, this ring or a later one:
-//   lose. (4) Who has the greatest history is a holder and goes on; it serves once all have confirmed the
-//   decision. Who has
-//       none of it has lost its clients and catches up: it takes the state as the lowest holder sends it.
+//   (3) Words and begins wait for the verdict that this ring is quorate. Not quorate, this or a later ring: lose.
+//   (4) Who has the greatest history is a holder and goes on; it serves once all have confirmed the decision. Who
+//       has it not has lost its clients and catches up: it takes the state as the lowest holder sends it.
 //   (5) With the last of them it has the state and orders a begin, in which it is a holder.
 //
 // To lose is to leave the group, drop all clients and all state and begin a new life; who has quorum comes back.
@@ -124,6 +123,7 @@ class Replication {
     bool safe = true;  // false: events are applied as they are ordered
     Duration member_timeout{5'000};
     std::size_t piece = 128 * 1024;  // bytes
+    std::uint64_t limits = 0;        // of the engine, in one number
     Rule without = Rule::kNone;
   };
   /// `random`: 64 bits that nobody has had before. `clock`: milliseconds since 1970.
@@ -153,6 +153,8 @@ class Replication {
   void fail(const std::string& why) { lose(why); }
 
   bool is_member() const { return state_ != State::kOut; }
+  /// What this one says counts for the state.
+  bool relies_on(Node node) const { return current().lives.contains(node); }
   bool serves() const { return serves_; }
   /// Or will as soon as others have answered, as far as this host can know.
   bool will_serve() const { return verdict_ && verdict_->quorate; }

@@ -15,6 +15,10 @@ constexpr std::chrono::milliseconds kFirstPause{250};
 constexpr std::chrono::milliseconds kLongestPause{10'000};
 constexpr timeval kUntilTaken = {0, 1'000};  // before what Corosync did not take is tried again
 constexpr Node kMaxNode = 32'767;
+constexpr cs_dispatch_flags_t kOne = CS_DISPATCH_ONE_NONBLOCKING;
+constexpr std::uint32_t kUnknown = UINT32_MAX;  // votes that nobody has
+constexpr int kLeaveTries = 40;
+constexpr useconds_t kBetweenTries = 5'000;  // microseconds
 
 bool try_again(cs_error_t error) { return error == CS_ERR_TRY_AGAIN || error == CS_ERR_BUSY; }
 
@@ -38,24 +42,35 @@ std::vector<Process> processes(const cpg_address* list, std::size_t count) {
 
 }  // namespace
 
-CorosyncLink::CorosyncLink(const Settings& settings, event_base* base, CorosyncListener& listener,
+CorosyncLink::CorosyncLink(const Settings& settings, event_base* base, Around around, CorosyncListener& listener,
                            std::shared_ptr<spdlog::logger> log)
-    : settings_(settings), base_(base), listener_(listener), log_(std::move(log)), pause_(kFirstPause) {
+    : settings_(settings),
+      base_(base),
+      around_(std::move(around)),
+      listener_(listener),
+      log_(std::move(log)),
+      pause_(kFirstPause) {
   name_.length = static_cast<std::uint32_t>(std::min<std::size_t>(settings.group.size(), CPG_MAX_NAME_LENGTH));
   std::memcpy(name_.value, settings.group.data(), name_.length);
-  const auto timer = [this](event_callback_fn callback) {
-    EventPtr made(event_new(base_, -1, 0, callback, this));
-    if (!made) throw std::bad_alloc();
-    return made;
+  work_later_ = timer<&CorosyncLink::work_off>();
+  lose_later_ = timer<&CorosyncLink::lose_broken>();
+  connect_later_ = timer<&CorosyncLink::try_to_connect>();
+}
+
+template <void (CorosyncLink::*Member)()>
+CorosyncLink::EventPtr CorosyncLink::timer() {
+  const auto callback = [](evutil_socket_t, short, void* link) {
+    auto* self = static_cast<CorosyncLink*>(link);
+    self->around_([self] { (self->*Member)(); });
   };
-  work_later_ = timer([](evutil_socket_t, short, void* self) { static_cast<CorosyncLink*>(self)->work_off(); });
-  connect_later_ =
-      timer([](evutil_socket_t, short, void* self) { static_cast<CorosyncLink*>(self)->try_to_connect(); });
+  EventPtr made(event_new(base_, -1, 0, callback, this));
+  if (!made) throw std::bad_alloc();
+  return made;
 }
 
 /// In order: the others are told that this host has left, not that something has died.
 CorosyncLink::~CorosyncLink() {
-  if (cpg_ != 0) cpg_leave(cpg_, &name_);
+  for (int i = 0; i < kLeaveTries && cpg_ != 0 && try_again(cpg_leave(cpg_, &name_)); ++i) usleep(kBetweenTries);
   disconnect();
 }
 
@@ -67,15 +82,19 @@ void CorosyncLink::try_to_connect() {
   std::string why;
   if (connect(&why)) {
     log_->info("connected with Corosync");
-    told_ = false;
+    told_.clear();
     pause_ = kFirstPause;
     return;
   }
   disconnect();
-  if (!std::exchange(told_, true)) log_->error("Corosync cannot be used: {}; it is tried again", why);
-  const timeval after = {pause_.count() / 1000, static_cast<suseconds_t>(pause_.count() % 1000 * 1000)};
-  event_add(connect_later_.get(), &after);
+  if (std::exchange(told_, why) != why) log_->error("Corosync cannot be used: {}; it is tried again", why);
+  connect_after(pause_);
   pause_ = std::min(2 * pause_, kLongestPause);
+}
+
+void CorosyncLink::connect_after(std::chrono::milliseconds pause) {
+  const timeval after = {pause.count() / 1000, static_cast<suseconds_t>(pause.count() % 1000 * 1000)};
+  event_add(connect_later_.get(), &after);
 }
 
 bool CorosyncLink::connect(std::string* why) {
@@ -123,8 +142,9 @@ bool CorosyncLink::connect_quorum(std::string* why) {
         "it has no quorum provider: set \"provider: corosync_votequorum\" in the quorum section of corosync.conf";
     return false;
   }
-  if (votequorum_initialize(&votes_, nullptr) != CS_OK) votes_ = 0;
-  return true;
+  error = votequorum_initialize(&votes_, nullptr);
+  if (error != CS_OK) votes_ = 0;
+  return error == CS_OK || !settings_.require_quorum || failed("votequorum_initialize", error, why);
 }
 
 /// Where the other hosts reach this one.
@@ -148,11 +168,11 @@ std::string CorosyncLink::host_address(Node node) const {
 bool CorosyncLink::watch(int fd, EventPtr* readable) {
   const auto callback = [](evutil_socket_t ready, short, void* link) {
     auto* self = static_cast<CorosyncLink*>(link);
-    if (self->cpg_readable_ && ready == event_get_fd(self->cpg_readable_.get()))
-      self->dispatch("cpg_dispatch", [=] { return cpg_dispatch(self->cpg_, CS_DISPATCH_ONE_NONBLOCKING); });
-    else
-      self->dispatch("quorum_dispatch",
-                     [=] { return quorum_dispatch(self->quorum_, CS_DISPATCH_ONE_NONBLOCKING); });
+    const bool cpg = self->cpg_readable_ && ready == event_get_fd(self->cpg_readable_.get());
+    self->around_([=] {
+      if (cpg) return self->dispatch("cpg_dispatch", [=] { return cpg_dispatch(self->cpg_, kOne); });
+      self->dispatch("quorum_dispatch", [=] { return quorum_dispatch(self->quorum_, kOne); });
+    });
   };
   readable->reset(event_new(base_, fd, EV_READ | EV_PERSIST, callback, this));
   return *readable && event_add(readable->get(), nullptr) == 0;
@@ -169,8 +189,8 @@ void CorosyncLink::disconnect() {
 void CorosyncLink::lose(const std::string& what) {
   const std::string why = "Corosync is gone (" + what + ")";
   disconnect();
-  told_ = true;
-  event_active(connect_later_.get(), EV_TIMEOUT, 0);
+  told_.clear();
+  connect_after(kFirstPause);
   listener_.gone(why);
 }
 
@@ -180,9 +200,10 @@ void CorosyncLink::lose(const std::string& what) {
 template <typename Dispatch>
 void CorosyncLink::dispatch(const char* what, Dispatch dispatch) {
   cs_error_t error = CS_OK;
-  dispatching_ = true;
-  for (int i = 0; i < kAtOnce && error == CS_OK; ++i) error = dispatch();
-  dispatching_ = false;
+  {
+    const Dispatching now{dispatching_ = true};
+    for (int i = 0; i < kAtOnce && error == CS_OK; ++i) error = dispatch();
+  }
   if (error != CS_OK && error != CS_ERR_TRY_AGAIN) return lose(text(what, error));
   listener_.settle();
   work_off();
@@ -230,12 +251,15 @@ quorum_model_v1_data_t CorosyncLink::quorum_callbacks() {
 }
 
 void CorosyncLink::on_quorum(bool quorate, const quorum_ring_id& ring, std::span<const std::uint32_t> members) {
-  Verdict verdict{{ring.seq, ring.nodeid}, quorate || !settings_.require_quorum, {}, 0};
+  const bool required = settings_.require_quorum;
+  Verdict verdict{{ring.seq, ring.nodeid}, quorate || !required, {}, required ? kUnknown : 0};
   for (const std::uint32_t node : members) {
     votequorum_info info{};
+    if (node > kMaxNode) log_->error("the node id {} is over 32767: change it in corosync.conf", node);
+    if (node > kMaxNode) continue;
     if (votes_ == 0 || votequorum_getinfo(votes_, node, &info) != CS_OK) continue;
     verdict.votes[node] = info.node_votes;
-    verdict.needed = settings_.require_quorum ? info.quorum : 0;
+    if (required) verdict.needed = info.quorum;
   }
   listener_.verdict(verdict);
 }
@@ -276,6 +300,13 @@ cs_error_t CorosyncLink::run(const Task& task) {
   const auto& message = std::get<std::vector<std::byte>>(task);
   const iovec bytes = {const_cast<std::byte*>(message.data()), message.size()};
   return cpg_mcast_joined(cpg_, CPG_TYPE_AGREED, &bytes, 1);
+}
+
+/// Whoever has asked for it is not called from inside.
+void CorosyncLink::break_later(const std::string& why) {
+  broken_ = why;
+  tasks_.clear();
+  event_active(lose_later_.get(), EV_TIMEOUT, 0);
 }
 
 /// Not from inside a callback of Corosync's: what it calls stays as it is until it is done.

@@ -11,6 +11,7 @@
 #include <spdlog/logger.h>
 
 #include <deque>
+#include <functional>
 #include <memory>
 #include <span>
 #include <variant>
@@ -18,6 +19,9 @@
 #include "cluster/replication.h"
 
 namespace gs::cluster {
+
+/// Runs what the loop calls, and does what the loop needs after it.
+using Around = std::function<void(const std::function<void()>& action)>;
 
 /// What Corosync tells. None of it comes from inside a call of the link's.
 class CorosyncListener {
@@ -42,7 +46,7 @@ class CorosyncLink {
     bool require_quorum = true;
   };
   /// `base` and `listener` outlive it.
-  CorosyncLink(const Settings& settings, event_base* base, CorosyncListener& listener,
+  CorosyncLink(const Settings& settings, event_base* base, Around around, CorosyncListener& listener,
                std::shared_ptr<spdlog::logger> log);
   ~CorosyncLink();
   CorosyncLink(const CorosyncLink&) = delete;
@@ -65,6 +69,11 @@ class CorosyncLink {
   struct Leave {};
   using Task = std::variant<Join, Leave, std::vector<std::byte>>;
   static constexpr int kAtOnce = 64;  // callbacks before others are served
+  /// Over when a callback throws, too.
+  struct Dispatching {
+    bool& on;
+    ~Dispatching() { on = false; }
+  };
 
   bool connect(std::string* why);
   bool connect_cpg(std::string* why);
@@ -78,7 +87,12 @@ class CorosyncLink {
   template <typename Dispatch>
   void dispatch(const char* what, Dispatch dispatch);
   void enqueue(Task task);
+  template <void (CorosyncLink::*Member)()>
+  EventPtr timer();
+  void connect_after(std::chrono::milliseconds pause);
   void work_off();
+  void break_later(const std::string& why);
+  void lose_broken() { lose(broken_); }
   bool leave_group();
   cs_error_t run(const Task& task);
   void on_quorum(bool quorate, const quorum_ring_id& ring, std::span<const std::uint32_t> members);
@@ -89,6 +103,7 @@ class CorosyncLink {
 
   const Settings settings_;
   event_base* const base_;
+  const Around around_;
   CorosyncListener& listener_;
   const std::shared_ptr<spdlog::logger> log_;
   cpg_name name_{};
@@ -96,10 +111,12 @@ class CorosyncLink {
   quorum_handle_t quorum_ = 0;
   votequorum_handle_t votes_ = 0;
   bool dispatching_ = false;
-  bool told_ = false;  // that Corosync is not there
+  std::string told_;    // why Corosync is not there
+  std::string broken_;  // what it has refused
   EventPtr cpg_readable_;
   EventPtr quorum_readable_;
   EventPtr work_later_;
+  EventPtr lose_later_;
   EventPtr connect_later_;
   std::deque<Task> tasks_;
   std::chrono::milliseconds pause_;

@@ -34,7 +34,8 @@ std::string port_of(int socket) {
 
 }  // namespace
 
-Datagrams::Datagrams(event_base* base, Receive receive) : base_(base), receive_(std::move(receive)) {}
+Datagrams::Datagrams(event_base* base, Around around, Receive receive)
+    : base_(base), around_(std::move(around)), receive_(std::move(receive)) {}
 
 void Datagrams::open(Node self, const std::string& host) {
   self_ = self;
@@ -46,7 +47,8 @@ void Datagrams::open(Node self, const std::string& host) {
   socket_ = platform::Descriptor(socket(address.ss_family, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   if (bind(socket_.get(), reinterpret_cast<sockaddr*>(&address), length) != 0) return;
   const auto callback = [](evutil_socket_t, short, void* datagrams) {
-    static_cast<Datagrams*>(datagrams)->read();
+    auto* receiver = static_cast<Datagrams*>(datagrams);
+    receiver->around_([receiver] { receiver->read(); });
   };
   readable_.reset(event_new(base_, socket_.get(), EV_READ | EV_PERSIST, callback, this));
   if (!readable_ || event_add(readable_.get(), nullptr) != 0) return;

@@ -13,6 +13,7 @@
 
 #include "cluster/datagram.h"
 #include "common/descriptor.h"
+#include "corosync/corosync_link.h"
 
 namespace gs::cluster {
 
@@ -22,7 +23,7 @@ class Datagrams {
  public:
   using Receive = std::function<void(Node from, const Confirmed& confirmed)>;
   /// `receive` is called by the loop, once `open` has been called.
-  Datagrams(event_base* base, Receive receive);
+  Datagrams(event_base* base, Around around, Receive receive);
 
   /// Has an address at `host` from now on; none where `host` is empty or not this host's.
   void open(Node self, const std::string& host);
@@ -49,6 +50,7 @@ class Datagrams {
   void take(std::vector<std::byte> packet);
 
   event_base* const base_;
+  const Around around_;
   const Receive receive_;
   const std::string key_ = new_key();
   Node self_ = 0;

@@ -8,6 +8,7 @@
 #include <system_error>
 
 #include "cluster/codec.h"
+#include "engine/digest.h"
 
 namespace gs::daemon {
 namespace {
@@ -29,6 +30,15 @@ std::uint64_t random_number() {
   return value;
 }
 
+std::uint64_t digest_of(const Limits& limits) {
+  Digest digest;
+  for (const std::uint64_t limit :
+       {std::uint64_t{limits.slice}, std::uint64_t{limits.session_bytes}, std::uint64_t{limits.user_bytes},
+        std::uint64_t{limits.total_bytes}, std::uint64_t{limits.max_phase_time}})
+    digest.add(limit);
+  return digest.value();
+}
+
 bool runs(std::uint32_t pid) { return kill(static_cast<pid_t>(pid), 0) == 0 || errno == EPERM; }
 
 std::string text(const Process& process) {
@@ -37,17 +47,20 @@ std::string text(const Process& process) {
 
 }  // namespace
 
-CorosyncOrdering::CorosyncOrdering(const Settings& settings, event_base* base, std::shared_ptr<spdlog::logger> log,
+CorosyncOrdering::CorosyncOrdering(const Settings& settings, event_base* base, Around around,
+                                   std::shared_ptr<spdlog::logger> log,
                                    std::function<void(const std::string& why)> give_up)
     : settings_(settings),
+      around_(std::move(around)),
       log_(std::move(log)),
       give_up_(std::move(give_up)),
-      link_(settings.link, base, *this, log_),
-      datagrams_(base, [this](Node from, const Confirmed& confirmed) {
+      link_(settings.link, base, around_, *this, log_),
+      datagrams_(base, around_, [this](Node from, const Confirmed& confirmed) {
         tell([&] { replication_->confirmed(from, confirmed); });
       }) {
   const auto callback = [](evutil_socket_t, short, void* self) {
-    static_cast<CorosyncOrdering*>(self)->tell([] {});
+    auto* ordering = static_cast<CorosyncOrdering*>(self);
+    ordering->around_([ordering] { ordering->tell([] {}); });
   };
   deadline_.reset(event_new(base, -1, 0, callback, this));
   if (!deadline_) throw std::bad_alloc();
@@ -58,13 +71,18 @@ void CorosyncOrdering::start(Replica& replica) {
   link_.start();
 }
 
-/// Gives the replication an input with the time at which it comes.
+/// Gives the replication an input with the time at which it comes. Nothing is thrown through Corosync: after an
+/// input that could not be taken the state is not the others'.
 template <typename Input>
 void CorosyncOrdering::tell(Input input) {
   if (!replication_) return;
   const std::string before = replication_->state();
-  replication_->advance(now());
-  input();
+  try {
+    replication_->advance(now());
+    input();
+  } catch (const std::exception& error) {
+    replication_->fail(std::string("an event of the cluster could not be taken: ") + error.what());
+  }
   if (replication_->state() != before) log_->info("{}, was: {}", replication_->state(), before);
   arm();
 }
@@ -77,8 +95,12 @@ void CorosyncOrdering::arm() {
   event_add(deadline_.get(), &after);
 }
 
+/// What it throws concerns the event alone: it was not sent.
 void CorosyncOrdering::submit(Event event) {
-  tell([&] { replication_->submit(std::move(event)); });
+  if (!replication_) return;
+  replication_->advance(now());
+  replication_->submit(std::move(event));
+  arm();
 }
 
 void CorosyncOrdering::fail(const std::string& why) {
@@ -94,8 +116,10 @@ void CorosyncOrdering::connected(const Process& self, const std::string& host_ad
   }
   if (replication_ && self == self_) return;
   self_ = self;
-  const Replication::Settings settings{
-      .self = self, .safe = settings_.safe, .member_timeout = settings_.member_timeout};
+  const Replication::Settings settings{.self = self,
+                                       .safe = settings_.safe,
+                                       .member_timeout = settings_.member_timeout,
+                                       .limits = digest_of(settings_.engine)};
   Order& order = *this;  // named, since only here they are known to be
   Host& host = *this;
   replication_.emplace(settings, order, *replica_, host, random_number, milliseconds_since_1970);
@@ -136,7 +160,8 @@ void CorosyncOrdering::received(const Process& from, std::span<const std::byte> 
   tell([&] {
     if (message) return replication_->received(from, *message);
     log_->error("what {} has sent is no message: {}", text(from), error);
-    replication_->fail("what " + text(from) + " has sent is no message of this release");
+    if (replication_->relies_on(from.node))
+      replication_->fail("what " + text(from) + " has sent is no message: run the same release on all hosts");
   });
 }
 

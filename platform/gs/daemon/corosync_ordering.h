@@ -6,6 +6,7 @@
 #include "corosync/corosync_link.h"
 #include "corosync/datagrams.h"
 #include "daemon/ordering.h"
+#include "engine/limits.h"
 
 namespace gs::daemon {
 
@@ -19,10 +20,11 @@ class CorosyncOrdering : public Ordering,
     cluster::CorosyncLink::Settings link;
     bool safe = true;
     std::chrono::milliseconds member_timeout{5'000};
+    Limits engine;
   };
   /// `give_up` is called, by the loop, where this daemon cannot be one of the cluster's.
-  CorosyncOrdering(const Settings& settings, event_base* base, std::shared_ptr<spdlog::logger> log,
-                   std::function<void(const std::string& why)> give_up);
+  CorosyncOrdering(const Settings& settings, event_base* base, cluster::Around around,
+                   std::shared_ptr<spdlog::logger> log, std::function<void(const std::string& why)> give_up);
 
   void start(Replica& replica) override;
   void submit(Event event) override;
@@ -58,6 +60,7 @@ class CorosyncOrdering : public Ordering,
   void arm();
 
   const Settings settings_;
+  const cluster::Around around_;
   const std::shared_ptr<spdlog::logger> log_;
   const std::function<void(const std::string& why)> give_up_;
   std::unique_ptr<event, FreeEvent> deadline_;

@@ -16,6 +16,7 @@ class LocalOrdering : public Ordering {
     replica_->serve(domain_);
   }
   void fail(const std::string& why) override {
+    waiting_.clear();  // of clients that are no more
     replica_->reset(why);
     replica_->serve(domain_);
   }

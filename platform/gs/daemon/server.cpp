@@ -179,7 +179,12 @@ std::unique_ptr<Ordering> Server::make_ordering(const Options& options) {
   settings.link.require_quorum = options.require_quorum;
   settings.safe = options.safe;
   settings.member_timeout = options.member_timeout;
-  return std::make_unique<CorosyncOrdering>(settings, base_.get(), log_,
+  settings.engine = options.engine;
+  const auto around = [this](const std::function<void()>& action) {
+    guarded(0, action);
+    arm_deadline();
+  };
+  return std::make_unique<CorosyncOrdering>(settings, base_.get(), around, log_,
                                             [this](const std::string& why) { give_up(why); });
 }
 

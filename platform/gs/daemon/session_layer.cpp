@@ -15,13 +15,6 @@ bool needs_memory(const Request& request) {
          !std::holds_alternative<VoteRequest>(request) && !std::holds_alternative<UnsubscribeRequest>(request);
 }
 
-/// The session that an event comes from; number 0: none.
-SessionId origin(const Event& event) {
-  if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session;
-  if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session;
-  return {};
-}
-
 }  // namespace
 
 SessionLayer::SessionLayer(const Settings& settings, Environment environment)
@@ -59,9 +52,13 @@ void SessionLayer::opened(ConnectionId id, const Peer& peer) {
   if (const char* problem = accounts_.problem_with_connection(connection.share.account())) {
     return refuse(id, problem);
   }
-  connection.handshake = timers_.arm(env_.now() + settings_.handshake_limit, [this, id] {
-    end(id, End::kFault, "said neither Hello nor Attach in time");
-  });
+  connection.handshake = timers_.arm(env_.now() + settings_.handshake_limit, [this, id] { handshake_over(id); });
+}
+
+void SessionLayer::handshake_over(ConnectionId id) {
+  if (!find(id)->hello) return end(id, End::kFault, "said neither Hello nor Attach in time");
+  answer(id, WYX_CONNECT_FAILED);
+  end(id, End::kGone, "this host still waits for others");
 }
 
 void SessionLayer::received(ConnectionId id, std::span<const std::byte> packet) {
@@ -180,7 +177,7 @@ void SessionLayer::on_hello(ConnectionId id, Connection& connection, const wire:
   if (serving_) return begin_session(id, connection, hello);
   if (env_.ordering.will_serve()) return void(connection.hello = hello);
   answer(id, WYX_CONNECT_FAILED);
-  end(id, End::kGone, "this host has no quorum");
+  end(id, End::kGone, "this host has no quorum, or no Corosync");
 }
 
 /// Of those who wait for it: clients are served now, or there is no hope of it.
@@ -190,8 +187,10 @@ void SessionLayer::answer_hellos() {
     if (connection.hello) waiting.push_back(id);
   std::ranges::sort(waiting);
   for (const ConnectionId id : waiting) {
-    Connection& connection = connections_.at(id);
-    on_hello(id, connection, *std::exchange(connection.hello, std::nullopt));
+    Connection* connection = find(id);
+    if (connection == nullptr || !connection->hello) continue;
+    const wire::Hello hello = *std::exchange(connection->hello, std::nullopt);
+    on_hello(id, *connection, hello);
   }
 }
 
@@ -236,6 +235,9 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& 
   Session* session = find_session(connection.session);
   if (session->event == 0) return end(id, End::kFault, "out of order: a request before its event channel");
   if (session->answer_due) return end(id, End::kFault, "out of order: a request before the answer to the last");
+  if (const auto problem = wire::problem_with(call.request); !problem.empty()) {
+    return end(id, End::kFault, "malformed: " + problem);
+  }
   if (short_of_memory_ && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
   session->answer_due = true;
   env_.ordering.submit(
@@ -274,8 +276,6 @@ void SessionLayer::too_slow(std::uint64_t session) {
 // ------------------------------------------------------------------------------------------------ ordered side
 
 void SessionLayer::apply(const Event& event) {
-  const SessionId from = origin(event);
-  if (from.node == domain_.self && from.number != 0 && from.number <= last_forgotten_) return;
   Outcome outcome;
   try {
     outcome = engine_->apply(event);
@@ -356,7 +356,6 @@ void SessionLayer::reset(const std::string& why) {
 
 void SessionLayer::forget_sessions() {
   serving_ = false;
-  last_forgotten_ = last_session_;
   while (!sessions_.empty()) {
     const ConnectionId request = sessions_.begin()->second.request, event = sessions_.begin()->second.event;
     timers_.cancel(sessions_.begin()->second.attach_limit);
@@ -698,6 +697,7 @@ void SessionLayer::end_session(std::uint64_t number, End how, const std::string&
   sessions_.erase(found);
   drop(request);
   if (event != 0) drop(event);
+  if (said_farewell_) return;  // to other hosts all of this one's end at once, with the reason
   try {
     env_.ordering.submit(SessionGoneEvent{id_of(number)});
   } catch (const std::exception& error) {  // else its members would stay for ever

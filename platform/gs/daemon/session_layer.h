@@ -175,6 +175,7 @@ class SessionLayer : private PingSink, private Replica {
   static constexpr Duration kBetweenLooks{100};                     // for those who are stalled
 
   // One message of a client; each may close the connection it came on.
+  void handshake_over(ConnectionId id);
   void on_part_of_message(ConnectionId id, Connection& connection);
   void on_message(ConnectionId id, Connection& connection, wire::ClientMessage& message);
   void on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message);
@@ -196,6 +197,7 @@ class SessionLayer : private PingSink, private Replica {
   std::vector<std::byte> snapshot() override { return engine_->snapshot(); }
   bool restore(const std::vector<std::byte>& snapshot, std::string* error) override;
   void serve(const Domain& domain) override;
+  void wait_no_more() override { answer_hellos(); }
   void drop_clients(const std::string& why) override;
   void reset(const std::string& why) override;
   void forget_sessions();
@@ -272,8 +274,7 @@ class SessionLayer : private PingSink, private Replica {
   const EncodedPtr farewell_ = packets_of(wire::Farewell{});
   const EncodedPtr fanout_end_ = packets_of(wire::FanoutEnd{});
   std::uint64_t last_session_ = 0;
-  std::uint64_t last_forgotten_ = 0;  // sessions up to this one are not the engine's
-  bool queued_ = false;               // something, since the bounds were enforced
+  bool queued_ = false;  // something, since the bounds were enforced
   bool short_of_memory_ = false;
   Time next_look_{};           // for those who are stalled
   std::size_t most_held_ = 0;  // bytes, since memory was returned
