@@ -9,6 +9,8 @@
 #include <optional>
 #include <string_view>
 
+#include "common/clock.h"
+
 namespace platform {
 
 /// Lets through kBurst lines for each user and kBurstOfAll for all of them together, then so many a second. It
@@ -18,7 +20,7 @@ namespace platform {
 /// Not safe for concurrent use. It knows no clock: it is told the time, which never goes back.
 class ClientLog {
  public:
-  using Time = std::chrono::milliseconds;
+  using Time = platform::Time;
   static constexpr double kBurst = 100;
   static constexpr double kPerSecond = 10;
   static constexpr double kBurstOfAll = 400;

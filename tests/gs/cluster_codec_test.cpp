@@ -71,7 +71,7 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
 TEST(ClusterDatagram, WhatAHostHasSealed_OpensWithItsKey_AndNothingElseDoes) {
   const std::string key = new_key(), other = new_key();
   const auto key_of_node = [&](Node node) { return node == 7 ? &key : node == 8 ? &other : nullptr; };
-  const Confirmed confirmed{samples::kBegin, 0x100000002, {1, 32767}};
+  const Confirmed confirmed{samples::kBegin, 0x100000002, {}};
   auto bytes = seal(confirmed, 7, key);
   const auto back = open(bytes, key_of_node);
   ASSERT_TRUE(back && back->first == 7);
@@ -87,6 +87,7 @@ TEST(ClusterDatagram, WhatAHostHasSealed_OpensWithItsKey_AndNothingElseDoes) {
   for (std::size_t length = 0; length < bytes.size(); ++length)
     EXPECT_FALSE(open(std::span(bytes).first(length), key_of_node)) << length;
   EXPECT_TRUE(seal(confirmed, 7, "short").empty());
+  EXPECT_TRUE(seal({samples::kBegin, 1, {2}}, 7, key).empty()) << "who asks does so in the order";
 }
 
 }  // namespace

@@ -497,14 +497,19 @@ TEST_P(ClusterRule, Left_out_is_found) {
   RecordProperty("found", error);
 }
 
-// Those that a short search finds. Not found in 2,000,000 steps: kPassOver, kWordNamesBegin, kConfirmDecision,
-// kConfirmNamesExchange, kPieceNamesBegin, kHistoryOfRing, kHistoryOfExchanges, kHistoryOfMessages.
+// Those that a short search finds.
 constexpr std::array kRules{Rule::kVerdictFirst,       Rule::kEveryRing,      Rule::kConfirmAll,
                             Rule::kHostsAreState,      Rule::kLives,          Rule::kAside,
                             Rule::kBeginWhenCaughtUp,  Rule::kVotesOfHolders, Rule::kEvictedIsToldToLose,
                             Rule::kEvictedBeginsAgain, Rule::kNumbersGoOn};
 
 INSTANTIATE_TEST_SUITE_P(Each, ClusterRule, testing::ValuesIn(kRules));
+
+// Those that 2,000,000 steps do not.
+INSTANTIATE_TEST_SUITE_P(DISABLED_NotFoundYet, ClusterRule,
+                         testing::Values(Rule::kPassOver, Rule::kWordNamesBegin, Rule::kConfirmDecision,
+                                         Rule::kConfirmNamesExchange, Rule::kPieceNamesBegin, Rule::kHistoryOfRing,
+                                         Rule::kHistoryOfExchanges, Rule::kHistoryOfMessages));
 
 }  // namespace
 }  // namespace gs::cluster::test

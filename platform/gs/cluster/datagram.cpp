@@ -25,11 +25,9 @@ struct Head {
 };
 static_assert(sizeof(Head) == 32);
 
-using AskedNode = std::uint16_t;
 using Tag = std::array<unsigned char, 2 * crypto_shorthash_BYTES>;
 static_assert(kKeySize == 2 * crypto_shorthash_KEYBYTES);
-constexpr std::size_t kSmallest = sizeof(Head) + sizeof(Tag);
-constexpr std::size_t kLargest = kSmallest + kMaxNodes * sizeof(AskedNode);
+constexpr std::size_t kSize = sizeof(Head) + sizeof(Tag);
 
 void require_sodium() {
   static const bool works = sodium_init() >= 0;
@@ -63,42 +61,30 @@ std::string new_key() {
 }
 
 std::vector<std::byte> seal(const Confirmed& confirmed, Node from, const std::string& key) {
-  if (from < 1 || from > kMaxNodeNumber || key.size() != kKeySize || !problem_with(confirmed).empty()) return {};
+  const bool asks = !confirmed.ask.empty();
+  if (asks || from < 1 || from > kMaxNodeNumber || key.size() != kKeySize || !problem_with(confirmed).empty())
+    return {};
   Head head;
   head.from = static_cast<std::uint16_t>(from);
   head.begin_life = confirmed.begin.life;
   head.begin_number = confirmed.begin.number;
   head.position = confirmed.position;
-  std::vector<std::byte> bytes(kSmallest + confirmed.ask.size() * sizeof(AskedNode));
+  std::vector<std::byte> bytes(kSize);
   std::memcpy(bytes.data(), &head, sizeof head);
-  std::byte* end = bytes.data() + sizeof head;
-  for (const Node node : confirmed.ask) {
-    const auto asked = static_cast<AskedNode>(node);
-    std::memcpy(end, &asked, sizeof asked);
-    end += sizeof asked;
-  }
-  const Tag tag = tag_of({bytes.data(), end}, key);
-  std::memcpy(end, tag.data(), tag.size());
+  const Tag tag = tag_of(std::span(bytes).first(sizeof head), key);
+  std::memcpy(bytes.data() + sizeof head, tag.data(), tag.size());
   return bytes;
 }
 
 std::optional<std::pair<Node, Confirmed>> open(std::span<const std::byte> bytes, const KeyOfNode& key_of_node) {
-  if (bytes.size() < kSmallest || bytes.size() > kLargest) return std::nullopt;
-  const auto content = bytes.first(bytes.size() - sizeof(Tag));
-  const auto asked = content.subspan(sizeof(Head));
+  if (bytes.size() != kSize) return std::nullopt;
   Head head;
-  std::memcpy(&head, content.data(), sizeof head);
-  if (head.magic != Head().magic || head.version != kProtocolVersion || asked.size() % sizeof(AskedNode) != 0) {
-    return std::nullopt;
-  }
+  std::memcpy(&head, bytes.data(), sizeof head);
+  if (head.magic != Head().magic || head.version != kProtocolVersion) return std::nullopt;
+  const auto content = bytes.first(sizeof head);
   if (!is_genuine(content, bytes.last(sizeof(Tag)), key_of_node(head.from))) return std::nullopt;
 
   Confirmed confirmed{{head.begin_life, head.begin_number}, head.position, {}};
-  for (std::size_t at = 0; at < asked.size(); at += sizeof(AskedNode)) {
-    AskedNode node = 0;
-    std::memcpy(&node, asked.data() + at, sizeof node);
-    confirmed.ask.push_back(node);
-  }
   if (!problem_with(confirmed).empty()) return std::nullopt;
   return std::pair(Node{head.from}, std::move(confirmed));
 }

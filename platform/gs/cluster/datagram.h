@@ -7,8 +7,7 @@
 // which together are 16 bytes and take a tenth of the time of a longer hash. So nobody outside the process group,
 // who has not read the words with the keys, can confirm in a daemon's name or change what it confirms. It does not
 // protect from a daemon of the group, which has all keys; from being read; from being lost, late or sent once
-// more. The last is harmless: positions only grow within the exchange that is named, and what `ask` asks for is
-// cheap.
+// more. The last is harmless: positions only grow within the exchange that is named.
 //
 // All of it is safe to use from several threads at once on different objects.
 #pragma once
@@ -26,7 +25,7 @@ inline constexpr std::size_t kKeySize = 32;  // bytes
 /// kKeySize random bytes, for a daemon's words.
 std::string new_key();
 
-/// Empty: the others would refuse it, or `key` is none.
+/// Empty: the others would refuse it, it asks somebody (which goes by the order), or `key` is none.
 std::vector<std::byte> seal(const Confirmed& confirmed, Node from, const std::string& key);
 
 /// A daemon's key as its word has it; null: there is no such daemon.

@@ -29,6 +29,9 @@ struct Process {
   std::uint32_t pid = 0;
   auto operator<=>(const Process&) const = default;
 };
+inline std::string name_of(const Process& process) {
+  return "node " + std::to_string(process.node) + " (pid " + std::to_string(process.pid) + ")";
+}
 
 /// A membership of hosts. Of two rings that one host was in, the later has the greater sequence.
 struct RingId {

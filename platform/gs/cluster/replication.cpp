@@ -7,21 +7,12 @@
 namespace gs::cluster {
 namespace {
 
-std::string name_of(const Process& process) {
-  return "node " + std::to_string(process.node) + " (pid " + std::to_string(process.pid) + ")";
-}
-
 /// A daemon speaks for its own clients, and of hosts nobody speaks: they come and go by the decisions.
 bool may_order(Node from, const Event& event) {
   if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session.node == from;
   if (const auto* gone = std::get_if<SessionGoneEvent>(&event)) return gone->session.node == from;
   if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session.node == from;
   return std::holds_alternative<TimerExpiredEvent>(event) || std::holds_alternative<ContinueEvent>(event);
-}
-
-bool same(const Lives& lives, Node node, Life life) {
-  const auto found = lives.find(node);
-  return found != lives.end() && found->second == life;
 }
 
 }  // namespace
@@ -234,7 +225,7 @@ void Replication::conclude() {
   if (!fits(*decision)) return;
   state_ = State::kRunning;
   decision_ = decision;
-  if (same(decision->holders, settings_.self.node, life_))
+  if (has(decision->holders, settings_.self.node, life_))
     become_holder(decision);
   else
     catch_up(decision);
@@ -287,7 +278,7 @@ void Replication::submit(Event event) {
 void Replication::on(const Process& from, const Ordered& ordered) {
   Track& track = current();
   if (!catching_up_ && aside_) return;
-  if (!track.history || (keeps(Rule::kLives) && !track.counts(from.node, ordered.life))) return;
+  if (!track.history || (keeps(Rule::kLives) && !has(track.lives, from.node, ordered.life))) return;
   if (!may_order(from.node, *ordered.event)) return;
   if (track.waiting.empty()) progress();
   track.append(ordered);
@@ -343,7 +334,7 @@ void Replication::apply(const Decision& decision) {
   const auto apply = [this](const Event& event) {
     if (state_ == State::kRunning) replica_.apply(event);  // else it has failed with the one before
   };
-  const auto goes_on = [&](const auto& host) { return same(decision.holders, host.first, host.second); };
+  const auto goes_on = [&](const auto& host) { return has(decision.holders, host.first, host.second); };
   const bool somebody_gone = before.empty() || !std::ranges::all_of(before, goes_on);
   if (somebody_gone && keeps(Rule::kNumbersGoOn)) apply(NumbersEvent{decision.numbers});
   for (const auto& host : before) {
@@ -352,7 +343,7 @@ void Replication::apply(const Decision& decision) {
     apply(HostGoneEvent{host.first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
   }
   for (const auto& [node, life] : decision.holders) {
-    if (!same(before, node, life)) apply(HostCameEvent{node});
+    if (!has(before, node, life)) apply(HostCameEvent{node});
   }
   if (state_ != State::kRunning || decision.begin != decision_->begin) return;
   serve(decision);

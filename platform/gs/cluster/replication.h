@@ -24,17 +24,17 @@
 // To lose is to leave the group, drop all clients and all state and begin a new life; who has quorum comes back.
 #pragma once
 
-#include <chrono>
 #include <functional>
 #include <set>
 
 #include "cluster/exchange.h"
 #include "cluster/replica.h"
+#include "common/clock.h"
 
 namespace gs::cluster {
 
-using Duration = std::chrono::milliseconds;
-using Time = Duration;  // since a moment of the caller's own; never goes back
+using platform::Duration;
+using platform::Time;
 
 /// What carries the messages. Nothing is delivered from inside a call.
 class Order {

@@ -9,6 +9,10 @@
 namespace gs::cluster {
 
 using Lives = std::map<Node, Life>;
+inline bool has(const Lives& lives, Node node, Life life) {
+  const auto found = lives.find(node);
+  return found != lives.end() && found->second == life;
+}
 
 /// How an exchange ended. An event itself: it is confirmed and applied in its place in the order.
 struct Decision {
@@ -32,10 +36,6 @@ struct Track {
   std::deque<Entry> waiting;       // received and not applied
   std::uint64_t received = 0;      // position of the last
 
-  bool counts(Node from, Life life) const {
-    const auto found = lives.find(from);
-    return found != lives.end() && found->second == life;
-  }
   void append(const Ordered& message) {
     ++history->messages;
     history->digest = mix(mix(history->digest, message.life), message.number);

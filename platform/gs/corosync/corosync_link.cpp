@@ -184,6 +184,7 @@ void CorosyncLink::disconnect() {
   if (votes_ != 0) votequorum_finalize(std::exchange(votes_, 0));
   if (quorum_ != 0) quorum_finalize(std::exchange(quorum_, 0));
   tasks_.clear();
+  event_del(lose_later_.get());
 }
 
 void CorosyncLink::lose(const std::string& what) {
@@ -194,8 +195,7 @@ void CorosyncLink::lose(const std::string& what) {
   listener_.gone(why);
 }
 
-// --------------------------------------------------------------------------------------------------- what it
-// tells
+// ------------------------------------------------------------------------------------------------ what it tells
 
 template <typename Dispatch>
 void CorosyncLink::dispatch(const char* what, Dispatch dispatch) {
@@ -264,8 +264,7 @@ void CorosyncLink::on_quorum(bool quorate, const quorum_ring_id& ring, std::span
   listener_.verdict(verdict);
 }
 
-// --------------------------------------------------------------------------------------------------- what it is
-// told
+// ---------------------------------------------------------------------------------------------- what it is told
 
 void CorosyncLink::join() { enqueue(Join{}); }
 
@@ -319,8 +318,7 @@ void CorosyncLink::work_off() {
     }
     const cs_error_t error = run(tasks_.front());
     if (try_again(error)) break;
-    if (error != CS_OK)
-      log_->debug("{}", text("Corosync refuses a task", error));  // its descriptor tells the rest
+    if (error != CS_OK) return break_later(text("it refuses a task", error));
     tasks_.pop_front();
   }
   if (cpg_ != 0 && !tasks_.empty()) event_add(work_later_.get(), &kUntilTaken);

@@ -1,7 +1,8 @@
 // Corosync in the daemon's event loop: its process group, its rings and its quorum.
 //
 // Nothing blocks longer than Corosync's own calls do. What it cannot take yet waits here, in its order. Where it
-// is not there, goes away or is started again, that is logged once and tried again, with longer and longer pauses.
+// is not there, goes away or is started again, each reason is logged once and it is tried again, with longer and
+// longer pauses.
 #pragma once
 
 #include <corosync/cpg.h>
@@ -17,6 +18,7 @@
 #include <variant>
 
 #include "cluster/replication.h"
+#include "common/event_ptr.h"
 
 namespace gs::cluster {
 
@@ -61,10 +63,7 @@ class CorosyncLink {
   void send(std::vector<std::byte> message);
 
  private:
-  struct FreeEvent {
-    void operator()(event* e) const { event_free(e); }
-  };
-  using EventPtr = std::unique_ptr<event, FreeEvent>;
+  using EventPtr = platform::EventPtr;
   struct Join {};
   struct Leave {};
   using Task = std::variant<Join, Leave, std::vector<std::byte>>;

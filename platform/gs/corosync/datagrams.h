@@ -40,9 +40,6 @@ class Datagrams {
     socklen_t length = 0;  // 0: it has none
     std::string key;
   };
-  struct FreeEvent {
-    void operator()(event* e) const { event_free(e); }
-  };
   static constexpr int kAtOnce = 64;            // before others are served
   static constexpr std::size_t kMostKept = 64;  // whose sender may become known
 
@@ -56,7 +53,7 @@ class Datagrams {
   Node self_ = 0;
   std::string address_;
   platform::Descriptor socket_;
-  std::unique_ptr<event, FreeEvent> readable_;  // goes before its descriptor
+  platform::EventPtr readable_;  // goes before its descriptor
   std::map<Node, Peer> peers_;
   std::deque<std::vector<std::byte>> kept_;  // the word with its sender's key may come behind it
 };

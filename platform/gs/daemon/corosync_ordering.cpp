@@ -1,49 +1,34 @@
 #include "daemon/corosync_ordering.h"
 
 #include <signal.h>
-#include <sys/random.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <system_error>
+#include <string_view>
 
 #include "cluster/codec.h"
+#include "common/random_number.h"
 #include "engine/digest.h"
 
 namespace gs::daemon {
 namespace {
 
 using namespace cluster;
-
-cluster::Time now() {
-  return std::chrono::duration_cast<cluster::Time>(std::chrono::steady_clock::now().time_since_epoch());
-}
+using platform::now;
+using platform::random_number;
 
 std::uint64_t milliseconds_since_1970() {
   const auto since = std::chrono::system_clock::now().time_since_epoch();
   return static_cast<std::uint64_t>(std::chrono::duration_cast<std::chrono::milliseconds>(since).count());
 }
 
-std::uint64_t random_number() {
-  std::uint64_t value = 0;
-  if (getrandom(&value, sizeof value, 0) != sizeof value) throw std::system_error(errno, std::generic_category());
-  return value;
-}
-
 std::uint64_t digest_of(const Limits& limits) {
   Digest digest;
-  for (const std::uint64_t limit :
-       {std::uint64_t{limits.slice}, std::uint64_t{limits.session_bytes}, std::uint64_t{limits.user_bytes},
-        std::uint64_t{limits.total_bytes}, std::uint64_t{limits.max_phase_time}})
-    digest.add(limit);
+  digest.add(limits);
   return digest.value();
 }
 
 bool runs(std::uint32_t pid) { return kill(static_cast<pid_t>(pid), 0) == 0 || errno == EPERM; }
-
-std::string text(const Process& process) {
-  return "node " + std::to_string(process.node) + " (pid " + std::to_string(process.pid) + ")";
-}
 
 }  // namespace
 
@@ -76,7 +61,7 @@ void CorosyncOrdering::start(Replica& replica) {
 template <typename Input>
 void CorosyncOrdering::tell(Input input) {
   if (!replication_) return;
-  const std::string before = replication_->state();
+  const std::string_view before = replication_->state();
   try {
     replication_->advance(now());
     input();
@@ -138,7 +123,7 @@ void CorosyncOrdering::view_changed(const View& view) {
                     ") is this host's in the cluster: stop one");
   }
   std::string members;
-  for (const Process& member : view.members) members += (members.empty() ? "" : ", ") + text(member);
+  for (const Process& member : view.members) members += (members.empty() ? "" : ", ") + name_of(member);
   log_->debug("in the group: {}", members);
   tell([&] { replication_->view_changed(view); });
 }
@@ -159,9 +144,9 @@ void CorosyncOrdering::received(const Process& from, std::span<const std::byte> 
   const auto message = decode(bytes, &error);
   tell([&] {
     if (message) return replication_->received(from, *message);
-    log_->error("what {} has sent is no message: {}", text(from), error);
+    log_->error("what {} has sent is no message: {}", name_of(from), error);
     if (replication_->relies_on(from.node))
-      replication_->fail("what " + text(from) + " has sent is no message: run the same release on all hosts");
+      replication_->fail("what " + name_of(from) + " has sent is no message: run the same release on all hosts");
   });
 }
 
@@ -169,8 +154,7 @@ void CorosyncOrdering::settle() {
   tell([&] { replication_->settle(); });
 }
 
-// ----------------------------------------------------------------------------------------------- of the
-// replication
+// ------------------------------------------------------------------------------------------- of the replication
 
 void CorosyncOrdering::send(const Message& message) {
   auto bytes = encode(message);

@@ -32,10 +32,6 @@ class CorosyncOrdering : public Ordering,
   bool will_serve() const override { return replication_ && replication_->will_serve(); }
 
  private:
-  struct FreeEvent {
-    void operator()(event* e) const { event_free(e); }
-  };
-
   // Of Corosync.
   void connected(const cluster::Process& self, const std::string& host_address) override;
   void gone(const std::string& why) override;
@@ -63,7 +59,7 @@ class CorosyncOrdering : public Ordering,
   const cluster::Around around_;
   const std::shared_ptr<spdlog::logger> log_;
   const std::function<void(const std::string& why)> give_up_;
-  std::unique_ptr<event, FreeEvent> deadline_;
+  platform::EventPtr deadline_;
   Replica* replica_ = nullptr;
   cluster::CorosyncLink link_;
   cluster::Datagrams datagrams_;

@@ -1,7 +1,6 @@
 #include "daemon/server.h"
 
 #include <malloc.h>
-#include <sys/random.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 
@@ -11,6 +10,7 @@
 #include <stdexcept>
 #include <system_error>
 
+#include "common/random_number.h"
 #include "daemon/corosync_ordering.h"
 #include "daemon/local_ordering.h"
 #include "daemon/memory_reserve.h"
@@ -28,13 +28,8 @@ constexpr int kAcceptsAtOnce = 64;                // before the connected are se
 constexpr int kLastPackets = 64;                  // that a process has left behind
 constexpr std::size_t kOwnDescriptors = 32;       // socket, log, loop and the like
 
-Time now() { return std::chrono::duration_cast<Time>(std::chrono::steady_clock::now().time_since_epoch()); }
-
-std::uint64_t random_number() {
-  std::uint64_t value = 0;
-  if (getrandom(&value, sizeof value, 0) != sizeof value) throw std::system_error(errno, std::generic_category());
-  return value;
-}
+using platform::now;
+using platform::random_number;
 
 void add(event* what, const timeval* after = nullptr) {
   if (event_add(what, after) != 0) throw std::bad_alloc();
@@ -118,7 +113,7 @@ void Server::tend_memory() {
   if (!short_of_memory_) log_->warn("there is memory again");
 }
 
-Server::EventPtr Server::make_event(evutil_socket_t fd, short what, event_callback_fn callback, void* argument) {
+EventPtr Server::make_event(evutil_socket_t fd, short what, event_callback_fn callback, void* argument) {
   EventPtr made(event_new(base_.get(), fd, what, callback, argument));
   if (!made) throw std::bad_alloc();
   return made;

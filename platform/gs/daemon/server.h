@@ -13,6 +13,7 @@
 
 #include "common/access.h"
 #include "common/descriptor.h"
+#include "common/event_ptr.h"
 #include "common/listener.h"
 #include "daemon/options.h"
 #include "daemon/ordering.h"
@@ -22,6 +23,7 @@ namespace gs::daemon {
 
 using platform::AccessRule;
 using platform::Descriptor;
+using platform::EventPtr;
 using platform::Listener;
 
 class Server : private Transport {
@@ -53,13 +55,9 @@ class Server : private Transport {
   std::vector<SessionLayer::SessionStatus> sessions() const { return sessions_.status(); }
 
  private:
-  struct FreeEvent {
-    void operator()(event* e) const { event_free(e); }
-  };
   struct FreeBase {
     void operator()(event_base* base) const { event_base_free(base); }
   };
-  using EventPtr = std::unique_ptr<event, FreeEvent>;
 
   /// Calls an action again and again.
   class Repeated {

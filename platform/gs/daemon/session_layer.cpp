@@ -235,9 +235,6 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& 
   Session* session = find_session(connection.session);
   if (session->event == 0) return end(id, End::kFault, "out of order: a request before its event channel");
   if (session->answer_due) return end(id, End::kFault, "out of order: a request before the answer to the last");
-  if (const auto problem = wire::problem_with(call.request); !problem.empty()) {
-    return end(id, End::kFault, "malformed: " + problem);
-  }
   if (short_of_memory_ && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
   session->answer_due = true;
   env_.ordering.submit(

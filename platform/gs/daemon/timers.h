@@ -1,15 +1,16 @@
 // Deadlines and what to do when they pass. Knows no clock: it is told the time.
 #pragma once
 
-#include <chrono>
 #include <functional>
 #include <map>
 #include <optional>
 
+#include "common/clock.h"
+
 namespace gs::daemon {
 
-using Duration = std::chrono::milliseconds;
-using Time = Duration;  // since a moment of the clock's own; never goes back
+using platform::Duration;
+using platform::Time;
 
 /// Not safe for concurrent use. An action may arm and cancel timers.
 class Timers {

@@ -6,6 +6,7 @@
 #include <string_view>
 #include <type_traits>
 
+#include "engine/limits.h"
 #include "engine/types.h"
 
 namespace gs {
@@ -41,6 +42,13 @@ class Digest {
   void add(ProviderId id) {
     add(id.instance);
     add(id.node);
+  }
+  void add(const Limits& limits) {
+    add(limits.slice);
+    add(limits.session_bytes);
+    add(limits.user_bytes);
+    add(limits.total_bytes);
+    add(limits.max_phase_time);
   }
   void add(const ProtocolTerms& terms) {
     add(terms.num_phases);

@@ -126,7 +126,9 @@ std::size_t bulk(const Request& request) {
   return std::visit([](const auto& r) { return bulk_of(r); }, request);
 }
 
-constexpr std::size_t kRequestFrame = 1024;      // bytes, more than a request needs beside its bulk
+constexpr std::size_t kRequestFrame = 1024;  // bytes, more than a request needs beside its bulk
+constexpr const char* kBulkProblem = "a payload that does not fit a message";
+bool bulk_fits(const Request& request) { return bulk(request) <= kMaxClientMessage - kRequestFrame; }
 constexpr std::size_t kNotificationFrame = 512;  // bytes, what a notification mostly needs beside its bulk
 
 }  // namespace
@@ -134,11 +136,11 @@ constexpr std::size_t kNotificationFrame = 512;  // bytes, what a notification m
 std::size_t estimated_size(const Notification& notification) { return bulk(notification) + kNotificationFrame; }
 
 std::string problem_with(const Request& request) {
+  if (!bulk_fits(request)) return kBulkProblem;
   return std::visit(
       [](const auto& r) -> std::string {
         if (!names_fit(r)) return "a name over the limit or with a NUL in it";
         if (!enumerations_known(r)) return "a number that is no value of its enumeration";
-        if (bulk_of(r) > kMaxClientMessage - kRequestFrame) return "a payload that does not fit a message";
         return {};
       },
       request);
@@ -237,6 +239,11 @@ std::optional<ClientMessage> Assembler::take_client_message(std::string* error) 
     fail(error, "a token on a message that has none");
   } else {
     message = detail::parse_client_message(buffer_, error);
+  }
+  const auto* call = message ? std::get_if<Call>(&*message) : nullptr;
+  if (call != nullptr && !bulk_fits(call->request)) {
+    fail(error, kBulkProblem);
+    message.reset();
   }
   if (!message) failed_ = true;
   reset();

@@ -49,9 +49,8 @@ bool ControlServer::keep_in_place() {
 
 void ControlServer::warn_about(std::optional<std::uint32_t> user, const std::string& line) {
   using platform::ClientLog;
-  const auto now =
-      std::chrono::duration_cast<ClientLog::Time>(std::chrono::steady_clock::now().time_since_epoch());
-  if (client_log_.write(user, spdlog::level::warn, line, now)) tell_left_out_.arm(ClientLog::kTellAfter);
+  if (client_log_.write(user, spdlog::level::warn, line, platform::now()))
+    tell_left_out_.arm(ClientLog::kTellAfter);
 }
 
 void ControlServer::on_acceptable() {
