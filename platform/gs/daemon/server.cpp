@@ -3,6 +3,8 @@
 #include <malloc.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
+#include <sys/timerfd.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
@@ -39,6 +41,23 @@ void add(event* what, const timeval* after = nullptr) {
 void enlarge_send_buffer(int fd) {
   if (setsockopt(fd, SOL_SOCKET, SO_SNDBUFFORCE, &kSendBuffer, sizeof kSendBuffer) == 0) return;
   setsockopt(fd, SOL_SOCKET, SO_SNDBUF, &kSendBuffer, sizeof kSendBuffer);
+}
+
+/// Readable again and again, until it is reset. A loop that always has a time limit for its sleep would look at
+/// the clock twice and set the system's timer in each turn.
+Descriptor timer_descriptor(std::chrono::milliseconds every) {
+  Descriptor timer(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK));
+  const timespec time = {every.count() / 1000, every.count() % 1000 * 1'000'000};
+  const itimerspec setting = {time, time};
+  if (!timer || timerfd_settime(timer.get(), 0, &setting, nullptr) != 0)
+    throw std::system_error(errno, std::generic_category(), "a timer");
+  return timer;
+}
+
+void reset(const Descriptor& timer) {
+  std::uint64_t expirations = 0;
+  while (read(timer.get(), &expirations, sizeof expirations) < 0 && errno == EINTR) {
+  }
 }
 
 std::size_t descriptors_for_clients() {
@@ -150,9 +169,7 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
   add(terminated_.get());
   add(interrupted_.get());
   start_accepting();
-  constexpr timeval kLookAgain = {Listener::kLookAgain.count(), 0};
-  look_again_.emplace(
-      *this, -1, 0, [this] { look_at_path(); }, &kLookAgain);
+  look_again_.emplace(*this, Listener::kLookAgain, [this] { look_at_path(); });
 }
 
 Server::~Server() = default;
@@ -188,23 +205,30 @@ void Server::give_up(const std::string& why) {
   stop(why);
 }
 
-Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action,
-                           const timeval* every)
+Server::Repeated::Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action)
     : server_(server),
       action_(std::move(action)),
       event_(server.make_event(fd, static_cast<short>(what | EV_PERSIST), call, this)) {
-  add(event_.get(), every);
+  add(event_.get());
 }
+
+Server::Repeated::Repeated(Server& server, Descriptor timer, std::function<void()> action)
+    : Repeated(server, timer.get(), EV_READ, std::move(action)) {
+  timer_ = std::move(timer);
+}
+
+Server::Repeated::Repeated(Server& server, std::chrono::milliseconds every, std::function<void()> action)
+    : Repeated(server, timer_descriptor(every), std::move(action)) {}
 
 void Server::Repeated::call(evutil_socket_t, short, void* self) {
   const auto* repeated = static_cast<Repeated*>(self);
+  if (repeated->timer_) reset(repeated->timer_);
   repeated->server_.guarded(0, repeated->action_);
   repeated->server_.arm_deadline();
 }
 
 void Server::repeat(std::chrono::milliseconds every, std::function<void()> action) {
-  const timeval time = {every.count() / 1000, every.count() % 1000 * 1000};
-  repeated_.emplace(*this, -1, 0, std::move(action), &time);
+  repeated_.emplace(*this, every, std::move(action));
 }
 
 // ---------------------------------------------------------------------------------------------- new connections

@@ -62,14 +62,16 @@ class Server : private Transport {
   /// Calls an action again and again.
   class Repeated {
    public:
-    Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action,
-             const timeval* every = nullptr);
+    Repeated(Server& server, evutil_socket_t fd, short what, std::function<void()> action);
+    Repeated(Server& server, std::chrono::milliseconds every, std::function<void()> action);
 
    private:
+    Repeated(Server& server, Descriptor timer, std::function<void()> action);
     static void call(evutil_socket_t, short, void* self);
 
     Server& server_;
     const std::function<void()> action_;
+    Descriptor timer_;  // where there is one
     EventPtr event_;
   };
 
