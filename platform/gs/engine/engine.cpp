@@ -29,6 +29,12 @@ struct Engine::State : EngineState {
     return client && client->provider ? client : nullptr;
   }
 
+  /// Who makes a request that has been checked. What comes of it may end it as a client.
+  std::pair<MemberPtr, Groups::iterator> provider_of(const Payer& from, Token token) {
+    const Client& client = *find_provider(from, token);
+    return {client.provider, groups.find(client.group)};
+  }
+
   wyx_rc_t check(const Payer& from, const Request& request) const;
   wyx_rc_t check(const Payer& from, const JoinRequest& request) const;
   wyx_rc_t check(const Payer& from, const StateChangeRequest& request) const;
@@ -64,7 +70,7 @@ struct Engine::State : EngineState {
   void apply(const NumbersEvent& event, Outcome& out);
 
   void lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out);
-  void settle(const std::string& group, Outcome& out);
+  void settle(Groups::iterator group, Outcome& out);
   void stand_in_line(const std::string& group);
   void go_on(Outcome& out);
 };
@@ -199,28 +205,29 @@ void Engine::State::perform(const Payer& from, const JoinRequest& request, Outco
   joiner->local_name = request.local_name;
   joiner->charge = Ledger::Charge(ledger, from, room_for(request));
   clients.add(joiner->to, {name, joiner});
-  groups.try_emplace(name, name).first->second.join(std::move(joiner), request);
-  settle(name, out);
+  const auto group = groups.try_emplace(name, name).first;
+  group->second.join(std::move(joiner), request);
+  settle(group, out);
 }
 
 void Engine::State::perform(const Payer& from, const LeaveRequest& request, Outcome& out) {
-  const Client client = *find_provider(from, request.token);
-  groups.at(client.group).leave(client.provider, request);
-  settle(client.group, out);
+  const auto [provider, group] = provider_of(from, request.token);
+  group->second.leave(provider, request);
+  settle(group, out);
 }
 
 void Engine::State::perform(const Payer& from, const GoodbyeRequest& request, Outcome& out) {
-  const Client client = *find_provider(from, request.token);
+  const auto [provider, group] = provider_of(from, request.token);
   clients.erase({from.session, request.token});
-  groups.at(client.group).lose(client.provider, WYX_PROVIDER_SAID_GOODBYE);
-  settle(client.group, out);
+  group->second.lose(provider, WYX_PROVIDER_SAID_GOODBYE);
+  settle(group, out);
 }
 
 void Engine::State::perform(const Payer& from, const VoteRequest& request, Outcome& out) {
-  const Client client = *find_provider(from, request.token);
+  const auto [provider, group] = provider_of(from, request.token);
   Surroundings env = surroundings(out);
-  groups.at(client.group).vote(*client.provider, request, env);
-  settle(client.group, out);
+  group->second.vote(*provider, request, env);
+  settle(group, out);
 }
 
 void Engine::State::perform(const Payer& from, const SubscribeRequest& request, Outcome& out) {
@@ -240,10 +247,10 @@ void Engine::State::perform(const Payer& from, const UnsubscribeRequest& request
 
 template <typename Proposal>
 void Engine::State::perform(const Payer& from, const Proposal& request, Outcome& out) {
-  const Client client = *find_provider(from, request.token);
+  const auto [provider, group] = provider_of(from, request.token);
   Surroundings env = surroundings(out);
-  groups.at(client.group).propose(*client.provider, request, env);
-  settle(client.group, out);
+  group->second.propose(*provider, request, env);
+  settle(group, out);
 }
 
 // ------------------------------------------------------------------------------------------------ other events
@@ -264,7 +271,7 @@ void Engine::State::apply(const TimerExpiredEvent& event, Outcome& out) {
   auto it = groups.find(event.timer.group);
   if (it == groups.end()) return;
   it->second.expire(event.timer);
-  settle(event.timer.group, out);
+  settle(it, out);
 }
 
 void Engine::State::apply(const ResponsivenessEvent& event, Outcome& out) {
@@ -304,13 +311,12 @@ void Engine::State::lose_clients(SessionId first, SessionId last, std::uint32_t 
 }
 
 /// A group in line waits for its turn, so that what it has left comes before what came later.
-void Engine::State::settle(const std::string& name, Outcome& out) {
-  auto it = groups.find(name);
-  if (it->second.in_line()) return;
+void Engine::State::settle(Groups::iterator group, Outcome& out) {
+  if (group->second.in_line()) return;
   Surroundings env = surroundings(out);
-  it->second.settle(env);
-  if (it->second.unfinished()) stand_in_line(name);
-  if (it->second.finished()) groups.erase(it);
+  group->second.settle(env);
+  if (group->second.unfinished()) stand_in_line(group->first);
+  if (group->second.finished()) groups.erase(group);
 }
 
 void Engine::State::stand_in_line(const std::string& name) {
@@ -325,8 +331,9 @@ void Engine::State::go_on(Outcome& out) {
   while (!line.empty() && work_left > 0) {
     const std::string name = std::move(line.front());
     line.pop_front();
-    groups.at(name).set_in_line(false);
-    settle(name, out);
+    const auto group = groups.find(name);
+    group->second.set_in_line(false);
+    settle(group, out);
   }
 }
 

@@ -78,7 +78,8 @@ void Group::propose(const Member& proposer, const StateChangeRequest& request, S
 
 void Group::propose(const Member& proposer, const MessageRequest& request, Surroundings& env) {
   Run run = new_run(WYX_PROVIDER_MESSAGE, request.terms, proposer.id);
-  run.message = env.keep(proposer, request.message);
+  run.message = request.terms.num_phases == WYX_1_PHASE ? Surroundings::pass_on(request.message)
+                                                        : env.keep(proposer, request.message);
   start(std::move(run), env);
 }
 

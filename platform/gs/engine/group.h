@@ -27,6 +27,8 @@ struct Surroundings {
   const Limits& limits;
   std::size_t& work_left;  // units, of this event
 
+  /// Nobody pays for what is gone when the event is over.
+  static Value pass_on(const Bytes& bytes) { return {std::make_shared<const Bytes>(bytes), nullptr}; }
   Value keep(const Member& whose, const Bytes& bytes) const {
     return {std::make_shared<const Bytes>(bytes),
             std::make_shared<const Ledger::Charge>(ledger, whose.payer(), bytes.size())};
@@ -158,7 +160,7 @@ class Group {
   void add_changing(Run& run, MemberPtr member, LeaveCode code) const;
 
   // The running protocol (group_protocol.cpp).
-  void start(Run run, Surroundings& env);
+  void start(Run&& run, Surroundings& env);
   void open_phase(Surroundings& env);
   void end_phase(Surroundings& env);
   void collect(const Value& value, std::uint32_t flag, Value& into);
@@ -175,7 +177,7 @@ class Group {
   // What a protocol says (group_protocol.cpp).
   ProtocolNotification compose(const Run& run, wyx_notification_type_t type, std::uint32_t summary) const;
   void add_vote_results(const Run& run, Proposal& proposal) const;
-  void send(const Run& run, ProtocolNotification notification, const std::vector<MemberPtr>& to,
+  void send(const Run& run, ProtocolNotification&& notification, const std::vector<MemberPtr>& to,
             Surroundings& env) const;
 
   std::string name_;

@@ -19,6 +19,12 @@ SharedVoteResults as_shared(std::vector<VoteResult> results) {
   return results.empty() ? nullptr : std::make_shared<const std::vector<VoteResult>>(std::move(results));
 }
 
+/// At once, and never little by little.
+void make_room(std::vector<Delivery>& deliveries, std::size_t more) {
+  const std::size_t needed = deliveries.size() + more;
+  if (needed > deliveries.capacity()) deliveries.reserve(std::max(needed, 2 * deliveries.capacity()));
+}
+
 std::vector<MemberPtr> joined(const std::vector<MemberPtr>& a, const std::vector<MemberPtr>& b) {
   std::vector<MemberPtr> all = a;
   all.insert(all.end(), b.begin(), b.end());
@@ -29,7 +35,7 @@ std::vector<MemberPtr> joined(const std::vector<MemberPtr>& a, const std::vector
 
 // ------------------------------------------------------------------------------------------------------ phases
 
-void Group::start(Run run, Surroundings& env) {
+void Group::start(Run&& run, Surroundings& env) {
   if (!run.changing.empty()) {
     Membership ids;
     ids.reserve(run.changing.size());
@@ -168,8 +174,10 @@ void Group::approve(std::uint32_t summary, Surroundings& env) {
   Run run = std::move(*run_);
   run_.reset();
   const bool was_born = born();
-  const std::vector<MemberPtr> audience =
-      run.traits->changing_role == ChangingRole::kVote ? joined(members_, run.changing) : members_;
+  std::vector<MemberPtr> all;  // where the members change
+  if (!run.changing.empty())
+    all = run.traits->changing_role == ChangingRole::kVote ? joined(members_, run.changing) : members_;
+  const std::vector<MemberPtr>& audience = run.changing.empty() ? members_ : all;
 
   change_membership(run);
   if (run.proposed_state) state_value_ = run.proposed_state;
@@ -319,9 +327,10 @@ void Group::add_vote_results(const Run& run, Proposal& proposal) const {
 }
 
 /// One notification for all, but for those who read their own id as the proposer's.
-void Group::send(const Run& run, ProtocolNotification notification, const std::vector<MemberPtr>& to,
+void Group::send(const Run& run, ProtocolNotification&& notification, const std::vector<MemberPtr>& to,
                  Surroundings& env) const {
   const auto shared = std::make_shared<const Notification>(std::move(notification));
+  make_room(env.deliveries, to.size());
   for (const MemberPtr& m : to) {
     if (m->gone()) continue;
     auto what = shared;

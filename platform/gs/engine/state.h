@@ -14,11 +14,13 @@
 namespace gs {
 
 struct EngineState {
+  using Groups = std::map<std::string, Group>;
+
   explicit EngineState(const Limits& wanted) : limits(wanted) {}
 
   const Limits limits;
   Ledger ledger{limits};  // before all that is charged
-  std::map<std::string, Group> groups;
+  Groups groups;
   std::deque<std::string> line;  // the unfinished groups, in the order in which they are gone on with
   SubscriberTable subscribers;
   ClientTable clients;
