@@ -53,7 +53,7 @@ std::string problem_of_built(const Message& message) {
 TEST(WireCodec, EveryMessage_ThereAndBack_IsTheSame) {
   for (const ClientMessage& message : samples::client_messages()) expect_round_trip(message);
   for (const ServerMessage& message : samples::server_messages()) expect_round_trip(message);
-  for (const Request& request : samples::requests()) EXPECT_EQ(problem_with(request), "");
+  for (const Request& request : samples::requests()) EXPECT_EQ(problem_with(request), nullptr);
 }
 
 TEST(WireCodec, LargeMessages_AreSlicedIntoFullPacketsAndPutTogether_AlsoOverTheEnginesLimits) {
@@ -96,7 +96,7 @@ TEST(WireCodec, RequestThatTheDaemonWouldRefuse_IsNamedAndNotEncoded) {
                          LeaveRequest{1, {static_cast<wyx_num_phases_t>(3), 0}, 0},
                          too_large};
   for (const Request& request : bad) {
-    EXPECT_NE(problem_with(request), "") << "kind " << request.index();
+    EXPECT_NE(problem_with(request), nullptr) << "kind " << request.index();
     EXPECT_FALSE(encode(ClientMessage(Call{request})));
     const bool only_too_large = std::holds_alternative<MessageRequest>(request);
     EXPECT_EQ(problem_of_built(ClientMessage(Call{request})).empty(), only_too_large)

@@ -13,9 +13,9 @@ namespace gs::client {
 class Records {
  public:
   /// What the following calls get their values from: what was built from it already is used again. Null: nothing.
-  void begin(const std::shared_ptr<const Notification>& source) {
+  void begin(std::shared_ptr<const Notification> source) {
     if (source == source_) return;
-    source_ = source;
+    source_ = std::move(source);
     built_ = nullptr;
   }
 

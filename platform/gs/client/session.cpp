@@ -59,7 +59,7 @@ wyx_rc_t Session::check_token(Token token, Client::Kind kind) {
 
 wyx_rc_t Session::call(Request request) {
   // The daemon would close a session that sends it such a thing.
-  if (!wire::problem_with(request).empty()) return WYX_BAD_PARAMETER;
+  if (wire::problem_with(request) != nullptr) return WYX_BAD_PARAMETER;
   return transport_->call(std::move(request));
 }
 
@@ -158,14 +158,16 @@ int Session::hand_out_rest(const std::atomic<bool>& stop) {
 
 Session::Step Session::deliver_next() {
   if (gone_seen_) return tell_of_the_end();
-  const Incoming incoming = transport_->take();
+  Incoming incoming = transport_->take();
   switch (incoming.kind) {
     case Incoming::Kind::kNothing:
       records_[level_].begin(nullptr);
       return Step::kNothing;
-    case Incoming::Kind::kNotification:
-      records_[level_].begin(incoming.what);
-      return deliver(incoming.token, *incoming.what);
+    case Incoming::Kind::kNotification: {
+      const Notification& what = *incoming.what;
+      records_[level_].begin(std::move(incoming.what));
+      return deliver(incoming.token, what);
+    }
     case Incoming::Kind::kPing:
       return answer_ping(incoming.ping);
     case Incoming::Kind::kGone:

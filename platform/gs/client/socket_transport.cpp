@@ -134,38 +134,39 @@ Incoming SocketTransport::take() {
       hang_up();
       return {Incoming::Kind::kGone, -1, nullptr, 0};
     }
-    if (auto next = accept(std::move(message))) return std::move(*next);
+    Incoming next = accept(std::move(message));
+    if (next.kind != Incoming::Kind::kNothing) return next;
   }
 }
 
-/// Nothing: the message was part of a fan-out.
-std::optional<Incoming> SocketTransport::accept(wire::ServerMessage message) {
+/// kNothing: the message was part of a fan-out.
+Incoming SocketTransport::accept(wire::ServerMessage&& message) {
   const bool in_fanout = !fanout_.empty();
   if (auto* notify = std::get_if<wire::Notify>(&message)) {
     const bool for_fanout = notify->token == -1;
     if (for_fanout != in_fanout || shared_) return malformed();
-    if (!for_fanout) return Incoming{Incoming::Kind::kNotification, notify->token, std::move(notify->what), 0};
+    if (!for_fanout) return {Incoming::Kind::kNotification, notify->token, std::move(notify->what), 0};
     shared_ = std::move(notify->what);
-    return std::nullopt;
+    return {};
   }
   if (std::holds_alternative<wire::FanoutEnd>(message)) {
     if (!shared_) return malformed();
     fanout_.clear();
     shared_.reset();
-    return std::nullopt;
+    return {};
   }
   if (in_fanout) return malformed();
   if (auto* fanout = std::get_if<wire::Fanout>(&message)) {
     fanout_ = std::move(fanout->tokens);
     handed_out_ = 0;
-    return std::nullopt;
+    return {};
   }
   if (const auto* ping = std::get_if<wire::Ping>(&message)) {
-    return Incoming{Incoming::Kind::kPing, -1, nullptr, ping->number};
+    return {Incoming::Kind::kPing, -1, nullptr, ping->number};
   }
   if (!std::holds_alternative<wire::Farewell>(message)) return malformed();
   lose("farewell", ECONNRESET, "the daemon stops");
-  return Incoming{Incoming::Kind::kGone, -1, nullptr, 0};
+  return {Incoming::Kind::kGone, -1, nullptr, 0};
 }
 
 Incoming SocketTransport::malformed() {

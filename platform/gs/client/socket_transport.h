@@ -43,7 +43,7 @@ class SocketTransport : public Transport {
   void lose_without_answer(const char* step, Channel::Got got, int limit);
   void hang_up();
   Incoming malformed();
-  std::optional<Incoming> accept(wire::ServerMessage message);
+  Incoming accept(wire::ServerMessage&& message);
 
   const std::uint32_t node_number_;
   const std::unique_ptr<Channel> requests_;

@@ -43,7 +43,9 @@ std::string problem(const SessionId& session) { return is_node(session.node) ? "
 
 std::string problem(const RequestEvent& e) {
   const std::string found = problem(e.session);
-  return found.empty() ? wire::problem_with(e.request) : found;
+  if (!found.empty()) return found;
+  const char* wrong = wire::problem_with(e.request);
+  return wrong == nullptr ? std::string() : wrong;
 }
 std::string problem(const SessionGoneEvent& e) { return problem(e.session); }
 std::string problem(const HostGoneEvent& e) {

@@ -25,9 +25,9 @@ class LocalOrdering : public Ordering {
   /// The replica has had the event when this returns, unless it is called from inside it: then the event follows
   /// as soon as it is done.
   void submit(Event event) override {
-    waiting_.push_back(std::move(event));
-    if (delivering_) return;
+    if (delivering_) return waiting_.push_back(std::move(event));
     const Turn turn{delivering_ = true};
+    replica_->apply(event);
     while (!waiting_.empty()) {
       const Event next = std::move(waiting_.front());
       waiting_.pop_front();

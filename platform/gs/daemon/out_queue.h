@@ -13,7 +13,7 @@ class OutQueue {
  public:
   /// A message that is encoded already, or a notification, whose turn comes.
   struct Item {
-    EncodedPtr packets;
+    wire::Encoded packets;
     std::shared_ptr<Outgoing> notification = nullptr;
     Token token = -1;
   };
@@ -31,7 +31,7 @@ class OutQueue {
   OutQueue(const OutQueue&) = delete;
   OutQueue& operator=(const OutQueue&) = delete;
 
-  void push(Item item) {
+  void push(Item&& item) {
     waiting_.emplace_back();
     if (item.notification) {
       try {
@@ -47,7 +47,7 @@ class OutQueue {
   }
 
   /// What does not wait is sent without being queued; what cannot be sent is.
-  Sent send(Item item, Transport& transport, ConnectionId to) {
+  Sent send(Item&& item, Transport& transport, ConnectionId to) {
     if (!empty()) {
       push(std::move(item));
       return Sent::kFull;
@@ -62,7 +62,7 @@ class OutQueue {
     while (!waiting_.empty()) {
       const Sent sent = send_packets(waiting_.front(), transport, to);
       if (sent != Sent::kAll) return sent;
-      const std::size_t size = waiting_.front().packets->size();
+      const std::size_t size = waiting_.front().packets.size();
       pop();
       if (size >= share) return waiting_.empty() ? Sent::kAll : Sent::kFull;
       share -= size;
@@ -78,21 +78,21 @@ class OutQueue {
 
  private:
   static std::size_t size_of(const Item& item) {
-    return item.notification ? item.notification->size() : item.packets->size();
+    return item.notification ? item.notification->size() : item.packets.size();
   }
   /// What is this connection's alone.
   static std::size_t own_bytes(const Item& item) {
-    return sizeof(Item) + (item.notification ? 0 : item.packets->size());
+    return sizeof(Item) + (item.notification ? 0 : item.packets.size());
   }
 
   /// From `next_packet_` on, which is 0 again after the last.
   Sent send_packets(Item& item, Transport& transport, ConnectionId to) {
-    if (!item.packets) item.packets = item.notification->encoded();
-    if (!*item.packets) return Sent::kTooLarge;
+    if (!item.packets && item.notification) item.packets = item.notification->encoded();
+    if (!item.packets) return Sent::kTooLarge;
     if (item.notification) recent_.hold(item.packets);
-    while (next_packet_ < item.packets->packets()) {
+    while (next_packet_ < item.packets.packets()) {
       std::byte header[wire::kHeaderSize];
-      const auto slice = item.packets->packet_for(next_packet_, item.token, header);
+      const auto slice = item.packets.packet_for(next_packet_, item.token, header);
       const auto sent = transport.send_packet(to, header, slice);
       if (sent != Transport::Sent::kDone) return sent == Transport::Sent::kFull ? Sent::kFull : Sent::kGone;
       ++next_packet_;

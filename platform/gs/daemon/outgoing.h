@@ -12,9 +12,6 @@
 
 namespace gs::daemon {
 
-/// Shared by all to whom the same packets go.
-using EncodedPtr = std::shared_ptr<const wire::Encoded>;
-
 /// What waits is the notification itself, which shares its large parts with the engine. Its packets are made when
 /// the first client has room for them, and are gone when the last one that is sent them at the time has them.
 class Outgoing {
@@ -24,15 +21,17 @@ class Outgoing {
   Outgoing(const Outgoing&) = delete;
   Outgoing& operator=(const Outgoing&) = delete;
 
+  const Notification* what() const { return what_.get(); }
+
   /// About the bytes of its packets.
   std::size_t size() const { return size_; }
 
   /// The packets; false where they are over the limit of a message.
-  EncodedPtr encoded() {
-    EncodedPtr packets = packets_.lock();
+  wire::Encoded encoded() {
+    wire::Encoded packets = packets_.lock();
     if (!packets) {
-      packets = std::make_shared<const wire::Encoded>(wire::encode(wire::Notify{-1, what_}));
-      packets_ = packets;
+      packets = wire::encode(wire::Notify{-1, what_});
+      packets_ = wire::Encoded::Weak(packets);
     }
     return packets;
   }
@@ -56,19 +55,19 @@ class Outgoing {
  private:
   const std::shared_ptr<const Notification> what_;
   const std::size_t size_;
-  std::weak_ptr<const wire::Encoded> packets_;
+  wire::Encoded::Weak packets_;
   std::vector<std::pair<Account*, std::size_t>> waiting_;  // for how many clients of whom
 };
 
 /// Holds the packets that were sent last for a while: who is sent the same a moment later finds them.
 class RecentPackets {
  public:
-  void hold(const EncodedPtr& packets) {
+  void hold(const wire::Encoded& packets) {
     if (!held_.empty() && held_.back() == packets) return;
     held_.push_back(packets);
-    bytes_ += packets->size();
+    bytes_ += packets.size();
     while (bytes_ > kBytes) {
-      bytes_ -= held_.front()->size();
+      bytes_ -= held_.front().size();
       held_.pop_front();
     }
   }
@@ -80,7 +79,7 @@ class RecentPackets {
  private:
   static constexpr std::size_t kBytes = 4 * 1024 * 1024;
 
-  std::deque<EncodedPtr> held_;
+  std::deque<wire::Encoded> held_;
   std::size_t bytes_ = 0;
 };
 

@@ -24,7 +24,7 @@ SessionLayer::SessionLayer(const Settings& settings, Environment environment)
       engine_(std::make_unique<Engine>(settings.engine)),
       accounts_(settings.limits) {
   for (std::size_t rc = 0; rc < answers_.size(); ++rc) {
-    answers_[rc] = packets_of(wire::Answer{static_cast<wyx_rc_t>(rc)});
+    answers_[rc] = wire::encode(wire::Answer{static_cast<wyx_rc_t>(rc)});
   }
   env_.ordering.start(*this);
 }
@@ -313,11 +313,21 @@ void SessionLayer::continue_later() {
   timers_.arm(env_.now() + turn(), [this] { continue_work(); });
 }
 
+/// Most outcomes have one notification, which needs no table.
+std::shared_ptr<Outgoing> SessionLayer::outgoing_of(const std::shared_ptr<const Notification>& what) {
+  if (last_outgoing_ && last_outgoing_->what() == what.get()) return last_outgoing_;
+  if (last_outgoing_) outgoing_.try_emplace(last_outgoing_->what(), last_outgoing_);
+  const auto found = outgoing_.find(what.get());
+  last_outgoing_ = found != outgoing_.end() ? found->second : std::make_shared<Outgoing>(what);
+  return last_outgoing_;
+}
+
 /// To clear a table costs what it once held: after a large outcome a new one.
 void SessionLayer::forget_outgoing() {
+  last_outgoing_.reset();
   if (outgoing_.bucket_count() > kFewOutgoing)
     outgoing_ = {};
-  else
+  else if (!outgoing_.empty())
     outgoing_.clear();
 }
 
@@ -399,8 +409,7 @@ void SessionLayer::deliver_run() {
   if (run_.empty()) return;
   const auto session_of = [](const Delivery* d) { return d->to.session.number; };
   if (!std::ranges::is_sorted(run_, {}, session_of)) std::ranges::stable_sort(run_, {}, session_of);
-  std::shared_ptr<Outgoing>& what = outgoing_[run_.front()->what.get()];
-  if (!what) what = std::make_shared<Outgoing>(run_.front()->what);
+  const std::shared_ptr<Outgoing> what = outgoing_of(run_.front()->what);
   for (auto first = run_.begin(); first != run_.end();) {
     const auto last =
         std::find_if(first, run_.end(), [&](const Delivery* d) { return d->to.session != (*first)->to.session; });
@@ -418,10 +427,10 @@ void SessionLayer::deliver_to_session(std::span<const Delivery* const> to, const
   const bool at_once = sent_at_once_ < kEventShare;
   if (at_once) sent_at_once_ += what->size();
   try {
-    if (to.size() == 1) return void(put(event, {nullptr, what, to.front()->to.token}, at_once));
+    if (to.size() == 1) return void(put(event, {{}, what, to.front()->to.token}, at_once));
     wire::Fanout fanout;
     for (const Delivery* delivery : to) fanout.tokens.push_back(delivery->to.token);
-    if (put(event, {packets_of(fanout)}, at_once) && put(event, {nullptr, what}, at_once)) {
+    if (put(event, {wire::encode(fanout)}, at_once) && put(event, {{}, what}, at_once)) {
       put(event, {fanout_end_}, at_once);
     }
   } catch (const std::exception& error) {
@@ -528,7 +537,7 @@ bool SessionLayer::drop_if_stale(PhaseTimers::iterator& at) {
 // --------------------------------------------------------------------------------------------- sending, ending
 
 /// Sends, `at_once` where nothing waits, or queues. False: the connection is not there, or no longer.
-bool SessionLayer::put(ConnectionId to, OutQueue::Item item, bool at_once) {
+bool SessionLayer::put(ConnectionId to, OutQueue::Item&& item, bool at_once) {
   Connection* connection = find(to);
   if (connection == nullptr || (said_farewell_ && item.packets != farewell_)) return false;
   const bool waited = !connection->out.empty();

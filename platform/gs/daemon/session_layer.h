@@ -207,6 +207,7 @@ class SessionLayer : private PingSink, private Replica {
   template <typename Wanted>
   void deliver_to(const std::vector<Delivery>& deliveries, Wanted wanted);
   void deliver_run();
+  std::shared_ptr<Outgoing> outgoing_of(const std::shared_ptr<const Notification>& what);
   void forget_outgoing();
   void deliver_to_session(std::span<const Delivery* const> to, const std::shared_ptr<Outgoing>& what);
   void continue_later();
@@ -222,12 +223,9 @@ class SessionLayer : private PingSink, private Replica {
   const Connection* connection_of(const MissingVoter& voter);
   SessionId id_of(std::uint64_t number) const { return {domain_.self, number}; }
 
-  void send(ConnectionId to, const wire::ServerMessage& message) { put(to, {packets_of(message)}, true); }
+  void send(ConnectionId to, const wire::ServerMessage& message) { put(to, {wire::encode(message)}, true); }
   void answer(ConnectionId to, wyx_rc_t rc) { put(to, {answers_.at(rc)}, true); }
-  static EncodedPtr packets_of(const wire::ServerMessage& message) {
-    return std::make_shared<const wire::Encoded>(wire::encode(message));
-  }
-  bool put(ConnectionId to, OutQueue::Item item, bool at_once);
+  bool put(ConnectionId to, OutQueue::Item&& item, bool at_once);
   bool handle(ConnectionId id, OutQueue::Sent sent);
   void watch_bound(ConnectionId id, Connection& connection);
   void flush(ConnectionId id, std::size_t share);
@@ -267,12 +265,13 @@ class SessionLayer : private PingSink, private Replica {
   std::string swept_;      // the same, for its timer to be dropped
   // Of the outcome being delivered.
   std::unordered_map<const Notification*, std::shared_ptr<Outgoing>> outgoing_;
+  std::shared_ptr<Outgoing> last_outgoing_;
   std::vector<const Delivery*> run_;  // of one notification
   std::size_t sent_at_once_ = 0;      // bytes
 
-  std::array<EncodedPtr, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
-  const EncodedPtr farewell_ = packets_of(wire::Farewell{});
-  const EncodedPtr fanout_end_ = packets_of(wire::FanoutEnd{});
+  std::array<wire::Encoded, WYX_UNEXPECTED_QUORUM_RESP + 1> answers_;
+  const wire::Encoded farewell_ = wire::encode(wire::Farewell{});
+  const wire::Encoded fanout_end_ = wire::encode(wire::FanoutEnd{});
   std::uint64_t last_session_ = 0;
   bool queued_ = false;  // something, since the bounds were enforced
   bool short_of_memory_ = false;

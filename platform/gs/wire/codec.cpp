@@ -27,6 +27,7 @@ struct Header {
 static_assert(sizeof(Header) == kHeaderSize);
 
 constexpr std::size_t kKeptBuffer = 4096;      // bytes that an idle Assembler holds on to
+constexpr std::size_t kShort = 512;            // bytes of a payload
 constexpr std::size_t kKeptBuilder = 1 << 20;  // bytes that a thread's builder holds on to
 
 /// Every thread builds in its own buffer, which grows to what it needs and stays, so that encoding allocates the
@@ -135,13 +136,13 @@ constexpr std::size_t kNotificationFrame = 512;  // bytes, what a notification m
 
 std::size_t estimated_size(const Notification& notification) { return bulk(notification) + kNotificationFrame; }
 
-std::string problem_with(const Request& request) {
+const char* problem_with(const Request& request) {
   if (!bulk_fits(request)) return kBulkProblem;
   return std::visit(
-      [](const auto& r) -> std::string {
+      [](const auto& r) -> const char* {
         if (!names_fit(r)) return "a name over the limit or with a NUL in it";
         if (!enumerations_known(r)) return "a number that is no value of its enumeration";
-        return {};
+        return nullptr;
       },
       request);
 }
@@ -150,7 +151,9 @@ std::string problem_with(const Request& request) {
 
 Encoded::Encoded(const std::uint8_t* payload, std::size_t length, std::size_t limit) {
   if (length > limit) return;
-  std::shared_ptr<std::byte[]> bytes(new std::byte[length]);  // not cleared
+  // Not cleared. Short ones lie together with their counters, and stay while somebody may look for them again.
+  std::shared_ptr<std::byte[]> bytes = length <= kShort ? std::make_shared_for_overwrite<std::byte[]>(length)
+                                                        : std::shared_ptr<std::byte[]>(new std::byte[length]);
   std::memcpy(bytes.get(), payload, length);
   payload_ = std::move(bytes);
   length_ = length;
@@ -171,7 +174,7 @@ std::span<const std::byte> Encoded::packet_for(std::size_t index, Token token,
 
 Encoded encode(const ClientMessage& message) {
   const auto* call = std::get_if<Call>(&message);
-  if (call != nullptr && !problem_with(call->request).empty()) return {nullptr, 1, 0};
+  if (call != nullptr && problem_with(call->request) != nullptr) return {nullptr, 1, 0};
   auto& builder = thread_builder.fresh();
   detail::build(builder, message);
   return {builder.GetBufferPointer(), builder.GetSize(), kMaxClientMessage};
@@ -230,16 +233,11 @@ bool Assembler::add(std::span<const std::byte> packet, std::string* error) {
 }
 
 std::optional<ClientMessage> Assembler::take_client_message(std::string* error) {
-  if (!complete()) {
-    fail(error, "no whole message");
+  if (!complete() || token_ != -1) {
+    fail(error, complete() ? "a token on a message that has none" : "no whole message");
     return std::nullopt;
   }
-  std::optional<ClientMessage> message;
-  if (token_ != -1) {
-    fail(error, "a token on a message that has none");
-  } else {
-    message = detail::parse_client_message(buffer_, error);
-  }
+  auto message = detail::parse_client_message(buffer_, error);
   const auto* call = message ? std::get_if<Call>(&*message) : nullptr;
   if (call != nullptr && !bulk_fits(call->request)) {
     fail(error, kBulkProblem);

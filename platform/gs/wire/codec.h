@@ -35,6 +35,8 @@ inline constexpr std::size_t kMaxSlice = kMaxPacket - kHeaderSize;
 /// each with its own token in the header. Copies share the payload.
 class Encoded {
  public:
+  class Weak;
+
   Encoded() = default;
   /// False: there is no message, or it was over the limit of its direction and cannot be sent.
   explicit operator bool() const { return payload_ != nullptr; }
@@ -45,6 +47,8 @@ class Encoded {
   /// `token` is the receiver's for a Notify, -1 for every other message.
   std::span<const std::byte> packet_for(std::size_t index, Token token,
                                         std::span<std::byte, kHeaderSize> header) const;
+  /// Whether they share their payload.
+  bool operator==(const Encoded& other) const { return payload_ == other.payload_; }
 
  private:
   friend Encoded encode(const ClientMessage&);
@@ -55,6 +59,24 @@ class Encoded {
   std::size_t length_ = 0;  // bytes of the payload
 };
 
+/// Finds packets again as long as somebody else has them.
+class Encoded::Weak {
+ public:
+  Weak() = default;
+  explicit Weak(const Encoded& packets) : payload_(packets.payload_), length_(packets.length_) {}
+  /// False: nobody has them.
+  Encoded lock() const {
+    Encoded packets;
+    packets.payload_ = payload_.lock();
+    packets.length_ = packets ? length_ : 0;
+    return packets;
+  }
+
+ private:
+  std::weak_ptr<const std::byte[]> payload_;
+  std::size_t length_ = 0;
+};
+
 Encoded encode(const ClientMessage& message);
 /// A Notify is encoded without its token: give that to packet_for.
 Encoded encode(const ServerMessage& message);
@@ -63,9 +85,9 @@ Encoded encode(const ServerMessage& message);
 std::size_t estimated_size(const Notification& notification);
 
 /// Why the daemon would take this request for malformed: a name over kMaxWireName or with a NUL in it, an
-/// enumeration value that does not exist, a payload that does not fit a message. Empty: it would not. (An
+/// enumeration value that does not exist, a payload that does not fit a message. Null: it would not. (An
 /// enumeration of 0, "not set", passes: it is the engine's to answer.)
-std::string problem_with(const Request& request);
+const char* problem_with(const Request& request);
 
 /// Puts packets together again, one message at a time. The first thing wrong makes it fail for good.
 class Assembler {

@@ -12,17 +12,12 @@ constexpr std::uint32_t kAttributes = WYX_PROPOSED_GROUP_ATTRIBUTES | WYX_ONGOIN
 
 /// Every part that `whats_changed` names is there. An updated state value is the current one.
 bool has_what_it_says(const Proposal& p) {
-  const struct {
-    std::uint32_t bits;
-    bool there;
-  } parts[] = {{kMembership, p.changing_providers != nullptr},
-               {WYX_PROPOSED_STATE_VALUE | WYX_ONGOING_STATE_VALUE, p.proposed_state != nullptr},
-               {WYX_UPDATED_PROVIDER_MESSAGE, p.message != nullptr},
-               {WYX_EXPEL_INFORMATION, p.expel_info.has_value()},
-               {kAttributes, p.new_attributes != nullptr}};
-  for (const auto& part : parts)
-    if ((p.whats_changed & part.bits) != 0 && !part.there) return false;
-  return true;
+  const auto lacks = [&](std::uint32_t bits, bool there) { return (p.whats_changed & bits) != 0 && !there; };
+  return !lacks(kMembership, p.changing_providers != nullptr) &&
+         !lacks(WYX_PROPOSED_STATE_VALUE | WYX_ONGOING_STATE_VALUE, p.proposed_state != nullptr) &&
+         !lacks(WYX_UPDATED_PROVIDER_MESSAGE, p.message != nullptr) &&
+         !lacks(WYX_EXPEL_INFORMATION, p.expel_info.has_value()) &&
+         !lacks(kAttributes, p.new_attributes != nullptr);
 }
 
 const char* contradiction_in(const ProtocolNotification& n) {

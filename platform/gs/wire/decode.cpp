@@ -213,46 +213,50 @@ class Reader {
     return result;
   }
 
-  Notification value(const fb::Protocol* n) {
-    return ProtocolNotification{enumeration<wyx_notification_type_t>(n->type()),
-                                enumeration<wyx_request_t>(n->protocol()),
-                                flags(n->summary(), kSummaryBits),
-                                n->time_limit(),
-                                value(n->proposal()),
-                                n->seqnum()};
+  ProtocolNotification value(const fb::Protocol* n) {
+    return {enumeration<wyx_notification_type_t>(n->type()),
+            enumeration<wyx_request_t>(n->protocol()),
+            flags(n->summary(), kSummaryBits),
+            n->time_limit(),
+            value(n->proposal()),
+            n->seqnum()};
   }
-  Notification value(const fb::Announcement* n) {
-    return AnnouncementNotification{flags(n->summary(), kSummaryBits), shared_members(n->providers())};
+  AnnouncementNotification value(const fb::Announcement* n) {
+    return {flags(n->summary(), kSummaryBits), shared_members(n->providers())};
   }
-  Notification value(const fb::Subscription* n) {
-    return SubscriptionNotification{flags(n->type(), kSubscriptionTypeBits),
-                                    shared_bytes(n->state()),
-                                    shared_members(n->full_membership()),
-                                    shared_members(n->changing_membership()),
-                                    leave_codes(n->leave_codes(), n->changing_membership()),
-                                    n->seqnum()};
+  SubscriptionNotification value(const fb::Subscription* n) {
+    return {flags(n->type(), kSubscriptionTypeBits),
+            shared_bytes(n->state()),
+            shared_members(n->full_membership()),
+            shared_members(n->changing_membership()),
+            leave_codes(n->leave_codes(), n->changing_membership()),
+            n->seqnum()};
   }
-  Notification value(const fb::DelayedError* n) {
-    return DelayedErrorNotification{enumeration<wyx_request_t>(n->protocol()), enumeration<wyx_rc_t>(n->rc()),
-                                    request(n->failing_request_type(), n->failing_request()),
-                                    shared_value(n->group_attributes())};
+  DelayedErrorNotification value(const fb::DelayedError* n) {
+    return {enumeration<wyx_request_t>(n->protocol()), enumeration<wyx_rc_t>(n->rc()),
+            request(n->failing_request_type(), n->failing_request()), shared_value(n->group_attributes())};
   }
 
-  Notification notification(const fb::Notify& m) {
+  template <typename Table>
+  std::shared_ptr<const Notification> shared_notification(const Table* n) {
+    return std::make_shared<const Notification>(value(n));
+  }
+  /// Null: it is of no kind.
+  std::shared_ptr<const Notification> notification(const fb::Notify& m) {
     switch (m.what_type()) {
       case fb::Notification::Protocol:
-        return value(m.what_as_Protocol());
+        return shared_notification(m.what_as_Protocol());
       case fb::Notification::Announcement:
-        return value(m.what_as_Announcement());
+        return shared_notification(m.what_as_Announcement());
       case fb::Notification::Subscription:
-        return value(m.what_as_Subscription());
+        return shared_notification(m.what_as_Subscription());
       case fb::Notification::DelayedError:
-        return value(m.what_as_DelayedError());
+        return shared_notification(m.what_as_DelayedError());
       case fb::Notification::NONE:
         break;
     }
     fail("a notification of an unknown kind");
-    return {};
+    return nullptr;
   }
 
   // ---------------------------------------------------------------------------------------------- messages
@@ -317,8 +321,8 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
                       node_number(m.body_as_NodeInfo()->domain_master_node())};
     case fb::ServerBody::Notify: {
       if (token < -1) fail("a token below 0");
-      auto what = std::make_shared<const Notification>(notification(*m.body_as_Notify()));
-      if (const char* why = contradiction_in(*what); why != nullptr) fail(why);
+      auto what = notification(*m.body_as_Notify());
+      if (const char* why = what ? contradiction_in(*what) : nullptr; why != nullptr) fail(why);
       return Notify{token, std::move(what)};
     }
     case fb::ServerBody::Ping:
@@ -336,12 +340,14 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
   return {};
 }
 
-/// `value` as it was read; nothing where something in it was wrong.
-template <typename T>
-std::optional<T> unless_wrong(const Reader& reader, T value, std::string* error) {
+/// What `read` reads; nothing where something in it was wrong.
+template <typename Read>
+auto unless_wrong(const Reader& reader, Read read, std::string* error) {
+  std::optional value(read());
   if (reader.problem() == nullptr) return value;
   *error = reader.problem();
-  return std::nullopt;
+  value.reset();
+  return value;
 }
 
 }  // namespace
@@ -350,8 +356,8 @@ std::optional<ClientMessage> parse_client_message(std::span<const std::byte> pay
   const auto* root = verified_root<fb::ClientMessage>(payload, kClientMessageId, error);
   if (root == nullptr) return std::nullopt;
   Reader reader(payload.size());
-  ClientMessage message = reader.client_message(*root);
-  return unless_wrong(reader, std::move(message), error);
+  return unless_wrong(
+      reader, [&] { return reader.client_message(*root); }, error);
 }
 
 std::optional<ServerMessage> parse_server_message(std::span<const std::byte> payload, Token token,
@@ -359,15 +365,15 @@ std::optional<ServerMessage> parse_server_message(std::span<const std::byte> pay
   const auto* root = verified_root<fb::ServerMessage>(payload, kServerMessageId, error);
   if (root == nullptr) return std::nullopt;
   Reader reader(payload.size());
-  ServerMessage message = reader.server_message(*root, token);
-  return unless_wrong(reader, std::move(message), error);
+  return unless_wrong(
+      reader, [&] { return reader.server_message(*root, token); }, error);
 }
 
 std::optional<Request> read_request(fb::Request kind, const void* table, std::size_t message_size,
                                     std::string* error) {
   Reader reader(message_size);
-  Request request = reader.request(kind, table);
-  return unless_wrong(reader, std::move(request), error);
+  return unless_wrong(
+      reader, [&] { return reader.request(kind, table); }, error);
 }
 
 }  // namespace gs::wire::detail
