@@ -42,19 +42,19 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
   const RingId ring{1, 1};
   const std::vector<Process> most(kMaxNodes, Process{1, 1}), over(kMaxNodes + 1, Process{1, 1});
   const std::string address(kMaxAddress, 'a');
-  const Message at_limit[] = {
-      Begin{{}, ring, most, {{1, kMaxVotes}}, 0, {}, 0}, Word{{}, 1, 1, {}, address, address},
-      Piece{{}, 0, 1, std::vector<std::byte>(kMaxPiece)}, Confirmed{{}, 1, std::vector<Node>(kMaxNodes, 1)},
-      ordered(TimerExpiredEvent{{std::string(kMaxGroupName, 'g'), 1, 1}})};
+  const Message at_limit[] = {Begin{{}, ring, most, {{1, kMaxVotes}}, 0, 0}, Word{{}, 1, 1, {}, address, address},
+                              Piece{{}, 0, 1, std::vector<std::byte>(kMaxPiece)},
+                              Confirmed{{}, 1, std::vector<Node>(kMaxNodes, 1)},
+                              ordered(TimerExpiredEvent{{std::string(kMaxGroupName, 'g'), 1, 1}})};
   for (const Message& message : at_limit) {
     std::string error;
     EXPECT_TRUE(decode(encode(message), &error)) << "kind " << message.index() << ": " << error;
   }
   const VoteRequest no_vote{1, static_cast<wyx_vote_value_t>(4), {}, {}, WYX_NULL_VOTE};
-  const Message refused[] = {Begin{{}, ring, over, {}, 0, {}, 0},
-                             Begin{{}, ring, {}, {}, 0, {}, 0},
-                             Begin{{}, ring, most, {{1, kMaxVotes + 1}}, 0, {}, 0},
-                             Begin{{}, ring, most, {}, 0, {{1, 0x2000}}, 0},
+  const Message refused[] = {Begin{{}, ring, over, {}, 0, 0},
+                             Begin{{}, ring, {}, {}, 0, 0},
+                             Begin{{}, ring, most, {{1, kMaxVotes + 1}}, 0, 0},
+                             Word{{}, 1, 1, {}, "", "", 0, {{1, 0x2000}}},
                              Word{{}, 1, 1, {}, address + "a", ""},
                              Word{{}, 1, 1, {}, std::string("a\0b", 3), ""},
                              Word{{}, 1, 1, {}, "", address + "a"},

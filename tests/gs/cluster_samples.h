@@ -17,8 +17,10 @@ inline auto fields(const NumbersEvent& e) { return std::tie(e.above); }
 
 namespace cluster {
 
-inline auto fields(const Begin& m) { return std::tie(m.id, m.ring, m.asked, m.votes, m.needed, m.left, m.clock); }
-inline auto fields(const Word& m) { return std::tie(m.begin, m.version, m.life, m.history, m.address, m.key); }
+inline auto fields(const Begin& m) { return std::tie(m.id, m.ring, m.asked, m.votes, m.needed, m.clock); }
+inline auto fields(const Word& m) {
+  return std::tie(m.begin, m.version, m.life, m.history, m.address, m.key, m.limits, m.left);
+}
 inline auto fields(const Ordered& m) { return std::tie(m.life, m.number, m.event); }
 inline auto fields(const Piece& m) { return std::tie(m.begin, m.index, m.count, m.bytes); }
 inline auto fields(const Confirmed& m) { return std::tie(m.begin, m.position, m.ask); }
@@ -35,8 +37,8 @@ inline std::vector<Message> messages() {
   const SessionId session{kNode, 0x123456789abcdef0};
   const std::string key("\0\xff key", 6);
   std::vector<Message> all = {
-      Begin{kBegin, ring, {{kNode, 5}, {1, 6}}, {{1, 2}, {kNode, 3}}, 4, {{kNode, 16}}, 1ull << 40},
-      Word{kBegin, kProtocolVersion, 9, History{1, 2, 3, kLife}, "192.0.2.1:5405", key},
+      Begin{kBegin, ring, {{kNode, 5}, {1, 6}}, {{1, 2}, {kNode, 3}}, 4, 1ull << 40},
+      Word{kBegin, kProtocolVersion, 9, History{1, 2, 3, kLife}, "192.0.2.1:5405", key, 7, {{kNode, 16}}},
       Word{kBegin, kProtocolVersion + 1, 9, {}, "", ""},
       Piece{kBegin, 2, 3, std::vector<std::byte>(1000, std::byte{0x80})},
       Confirmed{kBegin, 0x100000002, {1, kNode}},

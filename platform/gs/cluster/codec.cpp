@@ -67,12 +67,11 @@ std::string problem(const Begin& m) {
   std::string found = problem(m.ring);
   if (found.empty()) found = problem(m.asked);
   if (found.empty()) found = problem(m.votes, are_votes, "more votes than a host may have");
-  if (found.empty()) found = problem(m.left, is_leave_code, kNoLeaveCode);
   return found;
 }
 std::string problem(const Word& m) {
   if (m.address.size() > kMaxAddress || has_nul(m.address)) return "an address over the limit or with a NUL in it";
-  return m.key.size() > kMaxAddress ? "a key over the limit" : "";
+  return m.key.size() > kMaxAddress ? "a key over the limit" : problem(m.left, is_leave_code, kNoLeaveCode);
 }
 std::string problem(const Ordered& m) {
   if (!m.event) return "no event";

@@ -20,6 +20,8 @@ Content bytes_of(const flatbuffers::Vector<std::uint8_t>* bytes) {
   return Content(data, data + bytes->size());
 }
 
+constexpr const char* kUnordered = "nodes that do not ascend";
+
 /// Turns a verified FlatBuffer into values; whether they are within the limits is not looked at yet. No part is
 /// read more often than a few times, so that no more is made of a message than a few times its size.
 class Reader {
@@ -51,15 +53,17 @@ class Reader {
   }
 
   std::optional<Message> value_of(const fb::Begin* m) {
-    Begin result{value(m->id()), value(m->ring()), processes(m->asked()), {}, m->needed(), {}, m->clock()};
-    if (!read(m->votes(), result.votes) || !read(m->left(), result.left)) return fail("nodes that do not ascend");
+    Begin result{value(m->id()), value(m->ring()), processes(m->asked()), {}, m->needed(), m->clock()};
+    if (!read(m->votes(), result.votes)) return fail(kUnordered);
     return result;
   }
   std::optional<Message> value_of(const fb::Word* m) {
-    Word result{
-        value(m->begin()), m->version(), m->life(), {}, m->address()->str(), bytes_of<std::string>(m->key()),
-        m->limits()};
+    Word result{value(m->begin()),   m->version(),
+                m->life(),           {},
+                m->address()->str(), bytes_of<std::string>(m->key()),
+                m->limits(),         {}};
     if (m->history() != nullptr) result.history = value(m->history());
+    if (!read(m->left(), result.left)) return fail(kUnordered);
     return result;
   }
   std::optional<Message> value_of(const fb::Ordered* m) {

@@ -65,8 +65,7 @@ MessageBody body(Builder& b, const Begin& m) {
   const auto ring = pack(m.ring);
   const auto asked = put<fb::Process>(b, m.asked);
   const auto votes = put<fb::OfNode>(b, m.votes);
-  const auto left = put<fb::OfNode>(b, m.left);
-  return {fb::Body::Begin, fb::CreateBegin(b, &id, &ring, asked, votes, m.needed, left, m.clock).Union()};
+  return {fb::Body::Begin, fb::CreateBegin(b, &id, &ring, asked, votes, m.needed, m.clock).Union()};
 }
 MessageBody body(Builder& b, const Word& m) {
   const auto begin = pack(m.begin);
@@ -74,9 +73,10 @@ MessageBody body(Builder& b, const Word& m) {
   const fb::History history(own.ring, own.exchanges, own.messages, own.digest);
   const auto address = b.CreateString(m.address);
   const auto key = put_bytes(b, m.key);
-  return {fb::Body::Word,
-          fb::CreateWord(b, &begin, m.version, m.life, m.history ? &history : nullptr, address, key, m.limits)
-              .Union()};
+  const auto left = put<fb::OfNode>(b, m.left);
+  return {fb::Body::Word, fb::CreateWord(b, &begin, m.version, m.life, m.history ? &history : nullptr, address,
+                                         key, m.limits, left)
+                              .Union()};
 }
 MessageBody body(Builder& b, const Ordered& m) {
   const auto event = std::visit([&b](const auto& e) { return body(b, e); }, *m.event);

@@ -44,6 +44,7 @@ std::shared_ptr<const Decision> Exchange::decision() const {
     decision->asked[node] = word.life;
     if (word.history != best) continue;
     decision->holders[node] = word.life;
+    decision->left.insert(word.left.begin(), word.left.end());
     const auto own = begin_.votes.find(node);
     if (own != begin_.votes.end()) votes += own->second;
   }
@@ -53,7 +54,6 @@ std::shared_ptr<const Decision> Exchange::decision() const {
   decision->begin = begin_.id;
   decision->history = {begin_.ring.sequence, again ? best->exchanges + 1 : 1, 0,
                        Track::mix(before, begin_.id.number)};
-  decision->left = begin_.left;
   decision->numbers = numbers_of(begin_);
   return decision;
 }

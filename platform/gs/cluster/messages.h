@@ -63,7 +63,6 @@ struct Begin {
   std::vector<Process> asked;
   std::map<Node, std::uint32_t> votes;  // in the quorum
   std::uint32_t needed = 0;             // votes of the holders; 0: one is enough
-  std::map<Node, std::uint32_t> left;   // leave codes of hosts that went, as far as they are known
   std::uint64_t clock = 0;              // milliseconds since 1970
 };
 
@@ -72,10 +71,11 @@ struct Word {
   BeginId begin;
   std::uint16_t version = kProtocolVersion;
   Life life = 0;
-  std::optional<History> history;  // none: there is no state
-  std::string address;             // for datagrams
-  std::string key;                 // that the sender's datagrams are authenticated with
-  std::uint64_t limits = 0;        // of its engine, in one number: replicas must have the same
+  std::optional<History> history;        // none: there is no state
+  std::string address;                   // for datagrams
+  std::string key;                       // that the sender's datagrams are authenticated with
+  std::uint64_t limits = 0;              // of its engine, in one number: replicas must have the same
+  std::map<Node, std::uint32_t> left{};  // leave codes of hosts that have gone since it last took part
 };
 
 /// An event of the engine.

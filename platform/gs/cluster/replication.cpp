@@ -160,7 +160,6 @@ void Replication::order_begin(std::vector<Process> asked) {
   const bool all = asked.size() == view_.size();
   begin.needed = all || !keeps(Rule::kVotesOfHolders) ? 0 : verdict_->needed;
   begin.asked = std::move(asked);
-  begin.left = left_;
   begin.clock = clock_();
   order_.send(begin);
 }
@@ -200,6 +199,7 @@ void Replication::answer_begin() {
   if (word.history && !keeps(Rule::kHistoryOfExchanges)) word.history->exchanges = 0;
   if (word.history && !keeps(Rule::kHistoryOfMessages)) word.history->messages = 0;
   word.limits = settings_.limits;
+  word.left = left_;
   word.address = order_.address();
   word.key = order_.key();
   order_.send(word);
