@@ -69,7 +69,7 @@ class Reader {
   std::optional<Message> value_of(const fb::Ordered* m) {
     auto read = event(*m);
     if (!read) return std::nullopt;
-    return Ordered{m->life(), m->number(), std::make_shared<const Event>(std::move(*read))};
+    return Ordered{m->life(), m->number(), std::make_shared<const Event>(std::move(*read)), message_size_};
   }
   std::optional<Message> value_of(const fb::Piece* m) {
     return Piece{value(m->begin()), m->index(), m->count(), bytes_of<std::vector<std::byte>>(m->bytes())};

@@ -83,6 +83,7 @@ struct Ordered {
   Life life = 0;
   std::uint64_t number = 0;  // in that life
   std::shared_ptr<const Event> event;
+  std::size_t size = 0;  // bytes that were received for it
 };
 
 /// Part of the state as it was when the decision of an exchange was applied.

@@ -318,8 +318,7 @@ void Replication::apply_confirmed() {
   if (state_ != State::kRunning || catching_up_ || !goes_on()) return;
   const std::uint64_t position = confirmed_by_all();
   while (state_ == State::kRunning && !own_.waiting.empty() && own_.waiting.front().position <= position) {
-    const Entry entry = std::move(own_.waiting.front());
-    own_.waiting.pop_front();
+    const Entry entry = own_.take();
     progress();
     if (const auto* event = std::get_if<std::shared_ptr<const Event>>(&entry.what))
       replica_.apply(**event);
@@ -405,7 +404,7 @@ void Replication::take_state(const Process& from) {
     return lose("the state that " + name_of(from) + " sent does not fit: " + error);
   own_ = std::move(catching_up_->track);
   own_.hosts = decision_->holders;
-  own_.waiting.pop_front();  // the decision: the state is what it led to
+  own_.take();  // the decision: the state is what it led to
   catching_up_.reset();
   aside_ = false;
   apply_confirmed();

@@ -156,6 +156,8 @@ class Replication {
   /// What this one says counts for the state.
   bool relies_on(Node node) const { return current().lives.contains(node); }
   bool serves() const { return serves_; }
+  /// Bytes of what was received and not applied, also to the state that is kept while another is received.
+  std::size_t waiting_bytes() const { return own_.bytes + (catching_up_ ? catching_up_->track.bytes : 0); }
   /// Or will as soon as others have answered, as far as this host can know.
   bool will_serve() const { return verdict_ && verdict_->quorate; }
   /// For people.

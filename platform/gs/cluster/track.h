@@ -27,6 +27,7 @@ struct Decision {
 struct Entry {
   std::uint64_t position = 0;  // that everybody has to confirm
   std::variant<std::shared_ptr<const Event>, std::shared_ptr<const Decision>> what;
+  std::size_t size = 0;  // bytes
 };
 
 struct Track {
@@ -34,12 +35,14 @@ struct Track {
   Lives lives;                     // of the last exchange
   Lives hosts;                     // that the engine knows
   std::deque<Entry> waiting;       // received and not applied
+  std::size_t bytes = 0;           // of those
   std::uint64_t received = 0;      // position of the last
 
   void append(const Ordered& message) {
     ++history->messages;
     history->digest = mix(mix(history->digest, message.life), message.number);
-    waiting.push_back({++received, message.event});
+    waiting.push_back({++received, message.event, message.size});
+    bytes += message.size;
   }
   /// What an older view may have confirmed counts no more: it has to be confirmed with the decision.
   void append(const std::shared_ptr<const Decision>& decision) {
@@ -48,6 +51,12 @@ struct Track {
     lives = decision->asked;
     received = 1;
     waiting.push_back({received, decision});
+  }
+  Entry take() {
+    Entry first = std::move(waiting.front());
+    waiting.pop_front();
+    bytes -= first.size;
+    return first;
   }
 
   static std::uint64_t mix(std::uint64_t digest, std::uint64_t word) {

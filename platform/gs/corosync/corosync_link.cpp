@@ -183,7 +183,7 @@ void CorosyncLink::disconnect() {
   quorum_readable_.reset();
   if (votes_ != 0) votequorum_finalize(std::exchange(votes_, 0));
   if (quorum_ != 0) quorum_finalize(std::exchange(quorum_, 0));
-  tasks_.clear();
+  forget_tasks();
   event_del(lose_later_.get());
 }
 
@@ -269,15 +269,21 @@ void CorosyncLink::on_quorum(bool quorate, const quorum_ring_id& ring, std::span
 void CorosyncLink::join() { enqueue(Join{}); }
 
 void CorosyncLink::leave() {
-  tasks_.clear();
+  forget_tasks();
   enqueue(Leave{});
 }
 
 void CorosyncLink::send(std::vector<std::byte> message) { enqueue(std::move(message)); }
 
+void CorosyncLink::forget_tasks() {
+  tasks_.clear();
+  unsent_ = 0;
+}
+
 /// Where Corosync is not there, there is no group to do anything in.
 void CorosyncLink::enqueue(Task task) {
   if (cpg_ == 0) return;
+  unsent_ += size_of(task);
   tasks_.push_back(std::move(task));
   work_off();
 }
@@ -304,7 +310,7 @@ cs_error_t CorosyncLink::run(const Task& task) {
 /// Whoever has asked for it is not called from inside.
 void CorosyncLink::break_later(const std::string& why) {
   broken_ = why;
-  tasks_.clear();
+  forget_tasks();
   event_active(lose_later_.get(), EV_TIMEOUT, 0);
 }
 
@@ -319,6 +325,7 @@ void CorosyncLink::work_off() {
     const cs_error_t error = run(tasks_.front());
     if (try_again(error)) break;
     if (error != CS_OK) return break_later(text("it refuses a task", error));
+    unsent_ -= size_of(tasks_.front());
     tasks_.pop_front();
   }
   if (cpg_ != 0 && !tasks_.empty()) event_add(work_later_.get(), &kUntilTaken);

@@ -61,12 +61,18 @@ class CorosyncLink {
   /// What has not been sent yet is not sent any more.
   void leave();
   void send(std::vector<std::byte> message);
+  /// Bytes of what Corosync has not taken yet.
+  std::size_t unsent() const { return unsent_; }
 
  private:
   using EventPtr = platform::EventPtr;
   struct Join {};
   struct Leave {};
   using Task = std::variant<Join, Leave, std::vector<std::byte>>;
+  static std::size_t size_of(const Task& task) {
+    const auto* message = std::get_if<std::vector<std::byte>>(&task);
+    return message == nullptr ? 0 : message->size();
+  }
   static constexpr int kAtOnce = 64;  // callbacks before others are served
   /// Over when a callback throws, too.
   struct Dispatching {
@@ -86,6 +92,7 @@ class CorosyncLink {
   template <typename Dispatch>
   void dispatch(const char* what, Dispatch dispatch);
   void enqueue(Task task);
+  void forget_tasks();
   template <void (CorosyncLink::*Member)()>
   EventPtr timer();
   void connect_after(std::chrono::milliseconds pause);
@@ -118,6 +125,7 @@ class CorosyncLink {
   EventPtr lose_later_;
   EventPtr connect_later_;
   std::deque<Task> tasks_;
+  std::size_t unsent_ = 0;  // bytes of them
   std::chrono::milliseconds pause_;
 };
 

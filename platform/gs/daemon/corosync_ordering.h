@@ -30,8 +30,13 @@ class CorosyncOrdering : public Ordering,
   void submit(Event event) override;
   void fail(const std::string& why) override;
   bool will_serve() const override { return replication_ && replication_->will_serve(); }
+  bool has_room() const override {
+    return link_.unsent() + (replication_ ? replication_->waiting_bytes() : 0) < kMostWaiting;
+  }
 
  private:
+  static constexpr std::size_t kMostWaiting = 64 * 1024 * 1024;  // bytes, to be sent or applied
+
   // Of Corosync.
   void connected(const cluster::Process& self, const std::string& host_address) override;
   void gone(const std::string& why) override;

@@ -21,6 +21,8 @@ class Ordering {
   virtual void fail(const std::string& why) = 0;
   /// While it does not serve: that is only a matter of time.
   virtual bool will_serve() const = 0;
+  /// For more that keeps memory until it is ordered.
+  virtual bool has_room() const { return true; }
 };
 
 }  // namespace gs::daemon

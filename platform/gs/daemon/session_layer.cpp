@@ -235,7 +235,8 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& 
   Session* session = find_session(connection.session);
   if (session->event == 0) return end(id, End::kFault, "out of order: a request before its event channel");
   if (session->answer_due) return end(id, End::kFault, "out of order: a request before the answer to the last");
-  if (short_of_memory_ && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
+  const bool has_room = !short_of_memory_ && env_.ordering.has_room();
+  if (!has_room && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
   session->answer_due = true;
   env_.ordering.submit(
       RequestEvent{id_of(connection.session), std::move(call.request), false, connection.peer.uid});
