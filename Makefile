@@ -11,7 +11,8 @@ MEMBERS ?= 10
 all: ## build everything, optimised
 	@scripts/build.sh release
 
-demo: ## processes vote, talk and die, one timeline of what each saw; then daemons under their master
+demo: ## processes vote, talk and die, one timeline of what each saw; daemons under their master; three hosts
+	@scripts/dependencies.sh cluster || true # without them the act on three hosts is skipped
 	@scripts/build.sh release demo
 	@$(release)/bin/demo
 

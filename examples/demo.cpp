@@ -1,4 +1,4 @@
-// The demonstration, in two acts. It ends with status 0 only when all that was seen is as it must be.
+// The demonstration, in three acts. It ends with status 0 only when all that was seen is as it must be.
 #include "examples/demo.h"
 
 #include <unistd.h>
@@ -11,7 +11,7 @@
 namespace {
 
 bool is_coloured() {
-  static const bool coloured = isatty(STDOUT_FILENO) && !std::getenv("NO_COLOR");
+  static const bool coloured = std::getenv(zn::kColoured) || (isatty(STDOUT_FILENO) && !std::getenv("NO_COLOR"));
   return coloured;
 }
 
@@ -25,17 +25,32 @@ const char* zn::colour(const char* code) {
 
 const char* zn::colour_off() { return is_coloured() ? "\033[0m" : ""; }
 
+void zn::relay(Process& part, Clock::time_point deadline) {
+  for (bool more = true; more;) {
+    wait_readable({part.output()}, deadline);
+    more = part.read_some();
+    while (auto line = part.next_line()) {
+      const bool is_command = line->rfind("$ ", 0) == 0;
+      std::printf("%s%s%s\n", is_command ? colour("2") : "", line->c_str(), is_command ? colour_off() : "");
+    }
+    std::fflush(stdout);
+  }
+}
+
 int main(int argc, char** argv) {
-  const bool is_inside = argc == 3 && std::string(argv[1]) == zn::kInside;
-  if (argc != 1 && !is_inside) return std::fprintf(stderr, "usage: demo\n"), 2;
+  const std::string part = argc == 3 ? argv[1] : "";
+  if (argc != 1 && part != zn::kInside && part != zn::kOnHosts) return std::fprintf(stderr, "usage: demo\n"), 2;
   zn::catch_interrupts();
   try {
-    if (is_inside) {
+    if (part == zn::kInside) {
       zn::demo_inside(argv[2]);
-      return 0;
+    } else if (part == zn::kOnHosts) {
+      zn::demo_hosts(argv[2]);
+    } else {
+      zn::demo_group();
+      zn::demo_master();
+      zn::demo_cluster();
     }
-    zn::demo_group();
-    zn::demo_master();
     return 0;
   } catch (const zn::Failure& failure) {
     std::fflush(stdout);

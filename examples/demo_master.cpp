@@ -19,10 +19,9 @@ namespace {
 using zn::Clock;
 using zn::content_of;
 using zn::Failure;
+using zn::kStepLimit;
 using zn::Process;
 using Texts = std::vector<std::string>;
-
-constexpr auto kStepLimit = std::chrono::seconds(20);  // a bound on a hang; a step takes milliseconds
 
 struct Outcome {
   int status = 0;  // as of waitpid
@@ -122,6 +121,7 @@ void Host::join_crew() {
   member_ = std::make_unique<Process>(Texts{zn::program("member"), "crew", "1"},
                                       Process::Environment{{"GSD_ENDPOINT", "unix:" + socket_}});
   expect_from_member("1 joins; members: 1");
+  expect_from_member("1 leads");
 }
 
 void Host::tell_member(const std::string& line) {
@@ -229,15 +229,7 @@ void zn::demo_master() {
   const auto start = Clock::now();
   const TempFolder folder;
   Process inside(in_namespaces({program("demo"), kInside, folder.path()}), {});
-  for (bool more = true; more;) {
-    wait_readable({inside.output()}, start + 3 * kStepLimit);
-    more = inside.read_some();
-    while (auto line = inside.next_line()) {
-      const bool is_command = line->rfind("$ ", 0) == 0;
-      std::printf("%s%s%s\n", is_command ? colour("2") : "", line->c_str(), is_command ? colour_off() : "");
-    }
-    std::fflush(stdout);
-  }
+  relay(inside, start + 3 * kStepLimit);
   if (inside.wait_end(Clock::now() + kStepLimit) != 0) throw Failure{"the second act went wrong"};
   std::printf("\nStarted, asked, crashed, started again, stopped: %.0f ms in all.\n",
               std::chrono::duration<double, std::milli>(Clock::now() - start).count());

@@ -40,6 +40,9 @@ class Member : public GSProvider {
 
   void approvedCb(const wyx_approved_notification_t* n) override {
     say(n->gs_event_seqnum, what_happened(n->gs_protocol_type, *n->gs_proposal));
+    const bool leads = is_oldest(n->gs_proposal->gs_current_providers);
+    if (leads && !leads_) say(n->gs_event_seqnum, std::to_string(getInstanceNumber()) + " leads");
+    leads_ = leads;
   }
 
   void rejectedCb(const wyx_rejected_notification_t* n) override {
@@ -59,6 +62,24 @@ class Member : public GSProvider {
     return std::to_string(proposal.gs_proposed_by._gs_provider_info._gs_instance_number);
   }
 
+  // The members' list begins with the oldest, and is the same at all: who is first there may lead with no further
+  // vote.
+  bool is_oldest(const wyx_membership_t* members) {
+    return members && members->gs_count > 0 &&
+           members->gs_providers[0]._gs_provider_info._gs_instance_number == getInstanceNumber();
+  }
+
+  static std::string why_gone(const wyx_leave_info_t* info) {
+    std::string names;
+    for (unsigned i = 0; info && i < info->gs_count; i++) {
+      const unsigned code = info->gs_leave_codes[i].gs_voluntary_or_failure;
+      if (code & WYX_PROVIDER_FAILURE) names += " WYX_PROVIDER_FAILURE";
+      if (code & WYX_HOST_FAILURE) names += " WYX_HOST_FAILURE";
+      if (code & WYX_HOST_LEAVE_DUE_TO_STOP) names += " WYX_HOST_LEAVE_DUE_TO_STOP";
+    }
+    return names;
+  }
+
   static std::string what_happened(wyx_request_t protocol, const wyx_proposal_t& proposal) {
     const std::string members = "; members: " + to_text(proposal.gs_current_providers);
     const std::string who = to_text(proposal.gs_changing_providers);
@@ -68,7 +89,7 @@ class Member : public GSProvider {
       case WYX_LEAVE:
         return who + " leaves" + members;
       case WYX_FAILURE_LEAVE:
-        return who + " has failed" + members;
+        return who + " has failed," + why_gone(proposal.gs_leave_info) + members;
       case WYX_STATE_VALUE_CHANGE:
         return "approved; the state is " + to_text(proposal.gs_current_state_value);
       case WYX_PROVIDER_MESSAGE:
@@ -79,6 +100,7 @@ class Member : public GSProvider {
   }
 
   const std::string veto_;
+  bool leads_ = false;
 };
 
 // Does what one line says and gives the group's first answer; the outcome comes to the callbacks.

@@ -197,6 +197,11 @@ std::vector<bool> wait_readable(const std::vector<int>& descriptors, Clock::time
   return result;
 }
 
+void pause_for(std::chrono::milliseconds time) {
+  pollfd interrupt{interrupts, POLLIN, 0};
+  if (::poll(&interrupt, 1, static_cast<int>(time.count())) > 0) throw Failure{"interrupted"};
+}
+
 PrivateDaemon::PrivateDaemon(const std::vector<std::string>& options) {
   socket_ = folder_.path() + "/gsd.sock";
   std::vector<std::string> command{program("gsd"), "--socket-path", socket_, "--ready-fd", "1"};

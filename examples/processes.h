@@ -88,6 +88,9 @@ class Process {
 /// Waits until one of the descriptors is readable; true for those in the result. Throws like Process::wait_line.
 std::vector<bool> wait_readable(const std::vector<int>& descriptors, Clock::time_point deadline);
 
+/// Stands still. Throws Failure on an interrupt.
+void pause_for(std::chrono::milliseconds time);
+
 /// A daemon on a socket in a folder of its own.
 class PrivateDaemon {
  public:

@@ -3,7 +3,6 @@
 // that is, and the logs of all must fit together (verdict.h). It runs in rounds, each with a seed of its own; a
 // round that fails says its seed and keeps its logs, the others leave nothing behind.
 #include <sys/prctl.h>
-#include <sys/timerfd.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -27,6 +26,7 @@ using std::chrono::milliseconds;
 using storm::Account;
 using zn::Clock;
 using zn::Failure;
+using zn::pause_for;
 using zn::Process;
 
 constexpr auto kHang = std::chrono::seconds(120);  // a bound on a hang, not on what is tested
@@ -40,21 +40,6 @@ struct Settings {
   int subscribers = 2;
   int growth = 32;  // MiB that the daemon may be larger after a round than before
 };
-
-/// Stands still; an interrupt ends it by Failure.
-void pause_for(milliseconds time) {
-  const int timer = ::timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC);
-  itimerspec once{};
-  once.it_value = {time.count() / 1000, time.count() % 1000 * 1'000'000 + 1};
-  ::timerfd_settime(timer, 0, &once, nullptr);
-  try {
-    zn::wait_readable({timer}, Clock::now() + kHang);
-  } catch (...) {
-    ::close(timer);
-    throw;
-  }
-  ::close(timer);
-}
 
 /// Whether a child has ended; it is not reaped.
 bool has_ended(pid_t child) {
