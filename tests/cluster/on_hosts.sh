@@ -1,0 +1,17 @@
+#!/bin/bash
+# on_hosts.sh CLUSTER N COMMAND [ARG...]: runs COMMAND where there are N hosts, in a folder that goes away again; what it
+# leaves there is shown if it fails. 77: this machine does not allow it.
+set -u
+cluster=$1 hosts=$2
+shift 2
+why=$("$cluster" check) || { echo "skipped: $why"; exit 77; }
+here=$(mktemp -d)
+trap 'rm -rf "$here"' EXIT
+chmod 755 "$here"
+cd "$here" || exit 2
+# A user of its own for a daemon, where root may have that.
+printf 'uidgid {\n  uid: 65534\n  gid: 65534\n}\n' >uidgid
+UIDGID=$here/uidgid TOKEN=${TOKEN:-1000} WAIT=60 "$cluster" run "$hosts" "$@" </dev/null
+status=$?
+[ $status -eq 0 ] || tail -n 60 "$here"/*.log 2>/dev/null
+exit $status
