@@ -1,7 +1,8 @@
 // A storm of whole processes around a daemon of its own: members and subscribers come, go, vote and talk at random
-// while they and the daemon are killed, stopped and started again. In the end whoever is left must agree on who
-// that is, and the logs of all must fit together (verdict.h). It runs in rounds, each with a seed of its own; a
-// round that fails says its seed and keeps its logs, the others leave nothing behind.
+// while they and the daemon are killed, stopped and started again; or around the daemons of several hosts, which
+// are cut off, hang and die. In the end whoever is left must agree on who that is, and the logs of all must fit
+// together (verdict.h). It runs in rounds, each with a seed of its own; a round that fails says its seed and keeps
+// its logs, the others leave nothing behind.
 #include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -18,18 +19,23 @@
 #include "examples/processes.h"
 #include "storm/board.h"
 #include "storm/client.h"
+#include "storm/hosts.h"
 #include "storm/verdict.h"
 
 namespace {
 
 using std::chrono::milliseconds;
 using storm::Account;
+using storm::await_good_end;
+using storm::expect_running;
+using storm::Hosts;
+using storm::kHang;
+using storm::wait_until;
 using zn::Clock;
 using zn::Failure;
 using zn::pause_for;
 using zn::Process;
 
-constexpr auto kHang = std::chrono::seconds(120);  // a bound on a hang, not on what is tested
 constexpr auto kRound = std::chrono::seconds(10);  // of storm, at most, before the processes come to rest
 constexpr int kLeftBehind = 8;                     // processes left behind by clients in a round, at most
 
@@ -38,29 +44,8 @@ struct Settings {
   std::uint64_t seed = 1;
   int members = 10;
   int subscribers = 2;
-  int growth = 32;  // MiB that the daemon may be larger after a round than before
+  Hosts::Settings hosts;
 };
-
-/// Whether a child has ended; it is not reaped.
-bool has_ended(pid_t child) {
-  siginfo_t info{};
-  return ::waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOHANG | WNOWAIT) == 0 &&
-         info.si_pid == child;
-}
-
-void await_good_end(Process& process, const std::string& who) {
-  const int status = process.wait_end(Clock::now() + kHang);
-  if (status != 0) throw Failure{"a " + who + " ended with wait status " + std::to_string(status)};
-}
-
-template <class Condition>
-void wait_until(const std::string& what, Condition condition) {
-  const auto deadline = Clock::now() + kHang;
-  while (!condition()) {
-    if (Clock::now() > deadline) throw Failure{"waited in vain: " + what};
-    pause_for(milliseconds(20));
-  }
-}
 
 class Round {
  public:
@@ -70,9 +55,8 @@ class Round {
   Account run(milliseconds time) {
     if (!board_ || ::pipe2(lifeline_, O_CLOEXEC) != 0) throw Failure{"no board or pipe"};
     ::fcntl(lifeline_[0], F_SETFD, 0);
-    start_daemon();
-    descriptors_at_start_ = descriptors();
-    mib_at_start_ = resident_mib();
+    hosts_ = std::make_unique<Hosts>(settings_.hosts, folder_.path(), *board_);
+    hosts_->start();
     for (int i = 0; i < settings_.members; i++) clients_.push_back(start_client("member"));
     for (int i = 0; i < settings_.subscribers; i++) clients_.push_back(start_client("subscriber"));
     clients_.push_back(start_client("deaf"));
@@ -81,13 +65,14 @@ class Round {
       step();
       pause_for(milliseconds(upto(120)));
     }
+    hosts_->repair();
     rally();
     end_clients();
-    end_daemon();
+    end_hosts();
     const std::string errors = zn::content_of(folder_.path() + "/errors");
     if (!errors.empty()) throw Failure{"a client wrote to standard error:\n" + errors};
-    check_daemon_log();
-    return storm::judge(logs());
+    for (const std::string& log : hosts_->logs()) check_daemon_log(log);
+    return storm::judge(logs(), hosts_->are_many());
   }
 
   /// Moves what the processes wrote to where it stays, and says where that is.
@@ -101,6 +86,7 @@ class Round {
  private:
   struct Client {
     std::string role;
+    int host = 0;
     std::unique_ptr<Process> process;
     Clock::time_point resumes{};  // while it is stopped
   };
@@ -127,57 +113,45 @@ class Round {
     command.push_back("--serial=" + std::to_string(serial));
     command.push_back("--seed=" + std::to_string(seed_ * 10007 + static_cast<std::uint64_t>(serial)));
     command.push_back("--lifeline=" + std::to_string(lifeline_[0]));
-    const Process::Environment environment{{"GSD_ENDPOINT", "unix:" + socket_}};
-    Client client{role, std::make_unique<Process>(command, environment, folder_.path() + "/errors"), {}};
+    const int host = 1 + serial % hosts_->count();
+    Client client{role, host, hosts_->start_client(host, command), {}};
     if (role == "deaf") deaf_.insert(client.process->pid());
     return client;
   }
 
-  void start_daemon() {
-    ++board_->life;
-    const std::vector<std::string> command{zn::program("gsd"), "--socket-path=" + socket_, "--ready-fd=1",
-                                           "--log-level=debug",  // which leaves no line out
-                                           "--queue-bound=" + std::to_string(1 << 20)};
-    daemon_ = std::make_unique<Process>(command, Process::Environment{}, folder_.path() + "/gsd.log");
-    daemon_->wait_line(Clock::now() + kHang);
-  }
-
-  void kill_daemon() {
-    daemon_->signal(SIGKILL);
-    daemon_->wait_end(Clock::now() + kHang);
-    start_daemon();
-  }
-
   void step() {
-    if (has_ended(daemon_->pid())) throw Failure{"the daemon has ended by itself"};
-    for (const Client& client : clients_) {
-      if (has_ended(client.process->pid())) throw Failure{"a " + client.role + " has ended by itself"};
-    }
+    hosts_->expect_alive();
+    for (const Client& client : clients_) expect_running(*client.process, client.role);
     resume_those_due();
+    hosts_->cure_those_due();
     Client& client = clients_[static_cast<std::size_t>(upto(static_cast<int>(clients_.size()) - 1))];
     const int dice = upto(99);
     if (dice < 25) return kill(client);
     if (dice < 35) return stop(client);
-    if (dice < 39) {
-      daemon_->signal(SIGSTOP);
-      pause_for(milliseconds(10 + upto(200)));
-      return daemon_->signal(SIGCONT);
-    }
-    if (dice < 41 && seed_ % 3 != 0) return kill_daemon();
-    if (dice < 44 && left_behind_ < kLeftBehind) {
+    if (dice < 38 && left_behind_ < kLeftBehind) {
       left_behind_++;
       return client.process->write_line("fork");
     }
-    if (dice < 47 && client.resumes == Clock::time_point{}) {
+    if (dice < 41 && client.resumes == Clock::time_point{} && !hosts_->is_harmed(client.host)) {
       client.process->write_line("quit");
       await_good_end(*client.process, client.role);
-      replace(client);
+      return replace(client);
+    }
+    // Harm to one of several hosts lasts, and only few can be harmed at a time.
+    if (dice < (hosts_->are_many() ? 70 : 47)) {
+      hosts_->disturb([this](int n) { return upto(n); }, [this](int host) { crash(host); });
     }
   }
 
   void kill(Client& victim) {
     killed_.insert(victim.process->pid());
     replace(victim);
+  }
+
+  void crash(int host) {
+    for (Client& client : clients_) {
+      if (client.host == host) kill(client);
+    }
   }
 
   /// The old one is killed with its object, if it has not ended.
@@ -256,21 +230,15 @@ class Round {
     clients_.clear();
   }
 
-  void end_daemon() {
-    wait_until("the daemon closes the descriptors of its clients",
-               [&] { return descriptors() <= descriptors_at_start_; });
-    const double growth = resident_mib() - mib_at_start_;
-    if (growth > settings_.growth) throw Failure{"the daemon has grown by " + std::to_string(growth) + " MiB"};
-    daemon_->signal(SIGTERM);
-    await_good_end(*daemon_, "daemon");
+  void end_hosts() {
+    hosts_->end();
     ::close(std::exchange(lifeline_[0], -1));
     wait_until("those left behind by clients end", [] { return ::waitpid(-1, nullptr, WNOHANG) < 0; });
-    if (std::filesystem::exists(socket_)) throw Failure{"the daemon has left its socket"};
   }
 
   /// Nobody who reads is closed, nor for a stop that is shorter than the daemon's drain-time.
-  void check_daemon_log() const {
-    std::ifstream log(folder_.path() + "/gsd.log");
+  void check_daemon_log(const std::string& path) const {
+    std::ifstream log(path);
     bool some_quit = false;
     for (std::string line; std::getline(log, line);) {
       const auto reason = line.find(": closed: ");
@@ -283,43 +251,30 @@ class Round {
       // One that attaches was dead when that was read.
       const bool of_dead = why == "its process has ended" || why.rfind("attaches", 0) == 0;
       if (killed_.contains(who) && of_dead) continue;
+      // A host that takes no part, for now or since that one has begun.
+      if (hosts_->are_many() && (why.rfind("this host", 0) == 0 || why.rfind("attaches", 0) == 0)) continue;
       throw Failure{"the daemon has closed a client that reads: " + line};
     }
-    if (!some_quit) throw Failure{"the daemon's log does not say who quits"};
+    if (!some_quit && !hosts_->are_many()) throw Failure{"the daemon's log does not say who quits"};
   }
 
   std::vector<std::string> logs() const {
     std::vector<std::string> all;
     for (const auto& file : std::filesystem::directory_iterator(folder_.path())) {
-      if (file.path().extension() == ".log" && file.path().stem() != "gsd") all.push_back(file.path());
+      if (file.path().extension() == ".log" && file.path().filename().string().rfind("gsd.", 0) != 0)
+        all.push_back(file.path());
     }
     std::sort(all.begin(), all.end());
     return all;
-  }
-
-  std::size_t descriptors() const {
-    const std::filesystem::directory_iterator all("/proc/" + std::to_string(daemon_->pid()) + "/fd");
-    return static_cast<std::size_t>(std::distance(begin(all), end(all)));
-  }
-
-  double resident_mib() const {
-    std::ifstream status("/proc/" + std::to_string(daemon_->pid()) + "/status");
-    for (std::string line; std::getline(status, line);) {
-      if (line.rfind("VmRSS:", 0) == 0) return std::stod(line.substr(6)) / 1024;
-    }
-    throw Failure{"the daemon is gone"};
   }
 
   const Settings settings_;
   const std::uint64_t seed_;
   std::mt19937 random_;
   zn::TempFolder folder_;
-  const std::string socket_ = folder_.path() + "/gsd.sock";
   storm::Board* board_ = storm::map_board(folder_.path());
   int lifeline_[2] = {-1, -1};  // clients hold the reading end, this process alone the other
-  std::unique_ptr<Process> daemon_;
-  std::size_t descriptors_at_start_ = 0;
-  double mib_at_start_ = 0;
+  std::unique_ptr<Hosts> hosts_;
   std::vector<Client> clients_;
   std::set<pid_t> deaf_;  // the daemon may close them
   std::set<pid_t> killed_;
@@ -328,7 +283,9 @@ class Round {
 };
 
 int run_rounds(const Settings& settings) {
-  ::prctl(PR_SET_CHILD_SUBREAPER, 1);  // what clients leave behind is waited for here
+  // What clients leave behind is waited for here; in a cluster Corosyncs would come with it, and its end is
+  // theirs.
+  if (settings.hosts.count == 1) ::prctl(PR_SET_CHILD_SUBREAPER, 1);
   const auto end = Clock::now() + std::chrono::seconds(settings.seconds);
   for (std::uint64_t seed = settings.seed; Clock::now() < end; seed++) {
     Round round(settings, seed);
@@ -363,7 +320,9 @@ int main(int argc, char** argv) {
   app.add_option("--members", settings.members, "Member processes at a time")->check(CLI::Range(1, 200));
   app.add_option("--subscribers", settings.subscribers, "Subscriber processes at a time")
       ->check(CLI::Range(0, 50));
-  app.add_option("--growth", settings.growth, "MiB that the daemon may be larger after a round than before");
+  app.add_option("--growth", settings.hosts.growth, "MiB that a daemon may be larger after a round than before");
+  auto* cluster = app.add_option("--cluster", settings.hosts.cluster, "cluster.sh, which runs this");
+  app.add_option("--hosts", settings.hosts.count, "Its hosts")->check(CLI::Range(3, 9))->needs(cluster);
   app.add_option("--role", client.role)->group("");
   app.add_option("--folder", client.folder)->group("");
   app.add_option("--serial", client.serial)->group("");

@@ -18,7 +18,7 @@ struct Account {
 };
 
 /// Compares the logs of a round with one another, as board.h describes them. Throws zn::Failure with the first
-/// contradiction and the logs that it stands in.
-Account judge(const std::vector<std::string>& logs);
+/// contradiction and the logs that it stands in. `gaps`: there may be some in the numbers of events.
+Account judge(const std::vector<std::string>& logs, bool gaps);
 
 }  // namespace storm
