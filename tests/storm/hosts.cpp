@@ -29,6 +29,12 @@ double resident_mib(const Process& daemon) {
   throw Failure{"the daemon is gone"};
 }
 
+void await_killed(Process& daemon) {
+  const int status = daemon.wait_end(Clock::now() + kHang);
+  if (WIFSIGNALED(status) && WTERMSIG(status) == SIGKILL) return;
+  throw Failure{"a daemon ended before it was killed, with wait status " + std::to_string(status)};
+}
+
 }  // namespace
 
 void expect_running(const Process& child, const std::string& who) {
@@ -103,7 +109,7 @@ void Hosts::wait_until_served(const Host& host) const {
 
 void Hosts::kill_daemon(Host& host) {
   host.daemon->signal(SIGKILL);
-  host.daemon->wait_end(Clock::now() + kHang);
+  await_killed(*host.daemon);
 }
 
 void Hosts::disturb_one(const Upto& upto) {
@@ -167,7 +173,7 @@ void Hosts::harm(Host& host, int how, const OnCrash& on_crash) {
       return;
     default:
       cluster({"crash", number});
-      host.daemon->wait_end(Clock::now() + kHang);
+      await_killed(*host.daemon);
       on_crash(host.number);
       host.cure = [this, number, &host] {
         cluster({"start", number});
