@@ -136,14 +136,20 @@ void Host::expect_from_member(const std::string& expected) {
   if (text != expected) throw Failure{"the client said \"" + text + "\" where \"" + expected + "\" was expected"};
 }
 
-/// The last line that gsd has logged.
+/// The last line that gsd has logged; it is written behind what it tells its clients.
 void Host::expect_in_log(const std::string& expression) const {
-  std::ifstream file(folder_ + "/gsd.log");
+  const std::regex expected("[-0-9T:.+]+ " + expression);
+  const auto deadline = Clock::now() + kStepLimit;
   std::string last;
-  for (std::string line; std::getline(file, line);) last = line;
+  while (!std::regex_match(last, expected)) {
+    if (Clock::now() > deadline) {
+      throw Failure{"gsd logged \"" + last + "\" where \"" + expression + "\" was expected"};
+    }
+    zn::pause_for(std::chrono::milliseconds(2));
+    std::ifstream file(folder_ + "/gsd.log");
+    for (std::string line; std::getline(file, line);) last = line;
+  }
   std::printf("  gsd's log: %s\n", last.c_str());
-  if (std::regex_match(last, std::regex("[-0-9T:.+]+ " + expression))) return;
-  throw Failure{"gsd logged \"" + last + "\" where \"" + expression + "\" was expected"};
 }
 
 void Host::crash(const std::string& subsystem) {
