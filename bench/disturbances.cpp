@@ -3,17 +3,16 @@
 //
 //   disturbances [--quick] [--benchmark_out=FILE]
 #include <signal.h>
-#include <time.h>
 
 #include <algorithm>
 #include <cstdio>
 #include <cstdlib>
-#include <fstream>
 #include <memory>
 #include <vector>
 
 #include "bench/figures.h"
 #include "bench/process_roles.h"
+#include "bench/waits.h"
 #include "examples/processes.h"
 #include "gscl/GSUtils.h"
 
@@ -24,9 +23,7 @@ using zn::Clock;
 using zn::Failure;
 using zn::Process;
 
-constexpr auto kLimit = std::chrono::seconds(300);  // a bound on a hang, not on what is measured
-constexpr int64_t kEvery = 2'000'000;               // nanoseconds from one request to the next
-constexpr int kAtOnce = 20;                         // joins or changes before everybody has to catch up
+constexpr int kAtOnce = 20;  // joins or changes before everybody has to catch up
 
 struct Settings {
   int groups = 1000;
@@ -49,13 +46,10 @@ class Scene {
   zn::Slot& slot(int i) { return board_[i]; }
   pid_t daemon() const { return daemon_.pid(); }
 
-  template <class Condition>
-  void await(const char* what, Condition condition) const;
   /// Tells process `i` to "join" or "state", member by member, `told` processes being told of each by as many
   /// notifications as the function says.
   void tell(int i, const char* what, int members, const std::vector<int>& told);
-  /// Milliseconds from when each request was due to its answer, until `done`: one that hangs makes the next ones
-  /// late, and so counts as often as it would have hurt.
+  /// Milliseconds of each request, until `done`.
   template <class Done>
   std::vector<double> requests(Done done);
   /// How long the last of these went on.
@@ -82,15 +76,6 @@ Scene::Scene(const std::vector<std::string>& options) : daemon_(options) {
   controller_->dispatch(WYX_NON_BLOCKING);
 }
 
-template <class Condition>
-void Scene::await(const char* what, Condition condition) const {
-  const auto deadline = Clock::now() + kLimit;
-  while (!condition()) {
-    if (Clock::now() > deadline) throw Failure{std::string("waited in vain: ") + what};
-    ::usleep(200);
-  }
-}
-
 void Scene::add(const std::string& role, int count, int argument) {
   const int first = static_cast<int>(children_.size());
   for (int i = first; i < first + count; i++) {
@@ -99,7 +84,7 @@ void Scene::add(const std::string& role, int count, int argument) {
                                            std::to_string(argument)};
     children_.push_back(std::make_unique<Process>(command, daemon_.environment()));
   }
-  for (int i = first; i < first + count; i++) await("a process is ready", [&] { return slot(i).ready != 0; });
+  for (int i = first; i < first + count; i++) zn::await("a process is ready", [&] { return slot(i).ready != 0; });
 }
 
 void Scene::tell(int i, const char* what, int members, const std::vector<int>& told) {
@@ -116,7 +101,7 @@ void Scene::tell(int i, const char* what, int members, const std::vector<int>& t
     if (told[0] == 1 && member % kAtOnce != kAtOnce - 1 && member != members - 1) continue;  // a crowd: each alone
     for (size_t who = 0; who < told.size(); who++) {
       const zn::Slot& slot_of = slot(static_cast<int>(who));
-      await("everybody is told", [&] {
+      zn::await("everybody is told", [&] {
         if (slot_of.ready == 0) throw Failure{"a reader was closed while its groups were set up"};
         return slot_of.count >= targets[who];
       });
@@ -127,21 +112,16 @@ void Scene::tell(int i, const char* what, int members, const std::vector<int>& t
 
 template <class Done>
 std::vector<double> Scene::requests(Done done) {
-  std::vector<double> samples;
-  const auto deadline = Clock::now() + kLimit;
   char text[] = "unrelated";
   const int64_t start = zn::now_ns();
-  for (int64_t due = start + kEvery; samples.empty() || !done(samples.size()) || due < zn::now_ns();
-       due += kEvery) {
-    if (Clock::now() > deadline) throw Failure{"waited in vain: the disturbance is over"};
-    const timespec when{due / 1'000'000'000, due % 1'000'000'000};
-    ::clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &when, nullptr);
-    const wyx_rc_t rc = unrelated_->send_message(wyx_provider_message_t{sizeof text, text}, WYX_1_PHASE, 0);
-    if (rc != WYX_OK)
-      throw Failure{"an unrelated request was refused: " + std::string(zelt_gscl::gscl_rc_name(rc))};
-    samples.push_back(static_cast<double>(zn::now_ns() - due) / 1e6);
-    controller_->dispatch(WYX_NON_BLOCKING);
-  }
+  std::vector<double> samples = zn::steadily(
+      [&] {
+        const wyx_rc_t rc = unrelated_->send_message({sizeof text, text}, WYX_1_PHASE, 0);
+        controller_->dispatch(WYX_NON_BLOCKING);
+        if (rc == WYX_OK) return;
+        throw Failure{"an unrelated request was refused: " + std::string(zelt_gscl::gscl_rc_name(rc))};
+      },
+      done);
   lasted_ms_ = static_cast<double>(zn::now_ns() - start) / 1e6;
   return samples;
 }
@@ -223,24 +203,16 @@ void end_of_a_crowd(const Settings& s, zn::Figures* figures) {
   figures->add("  time that the disturbance lasted", scene.lasted_ms(), "ms");
 }
 
-double resident_mib(pid_t process) {
-  std::ifstream status("/proc/" + std::to_string(process) + "/status");
-  for (std::string line; std::getline(status, line);) {
-    if (line.rfind("VmRSS:", 0) == 0) return std::atof(line.c_str() + 6) / 1024;
-  }
-  throw Failure{"the daemon is gone"};
-}
-
 void memory_after_the_deaf(const Settings& s, zn::Figures* figures) {
   Scene scene({"--queue-bound", std::to_string(4 * 1024 * 1024)});
-  const double before = resident_mib(scene.daemon());
+  const double before = zn::resident_kib(scene.daemon()) / 1024;
   scene.add("deaf", s.deaf, 0);
-  const double meanwhile = resident_mib(scene.daemon());
+  const double meanwhile = zn::resident_kib(scene.daemon()) / 1024;
   for (int i = 0; i < s.deaf; i++) scene.at(i).write_line("on");
-  scene.await("all are closed", [&] { return scene.closed(0, s.deaf) == s.deaf; });
-  for (int i = 0; i < s.deaf; i++) scene.at(i).wait_end(Clock::now() + kLimit);
+  zn::await("all are closed", [&] { return scene.closed(0, s.deaf) == s.deaf; });
+  for (int i = 0; i < s.deaf; i++) scene.at(i).wait_end(Clock::now() + zn::kWaitLimit);
   scene.requests([](size_t count) { return count >= 300; });  // memory is given back ten times a second
-  const double after = resident_mib(scene.daemon());
+  const double after = zn::resident_kib(scene.daemon()) / 1024;
   figures->add("memory of the daemon after " + std::to_string(s.deaf) + " sessions that did not read 4 MiB",
                after - before, "MiB over before");
   figures->add("  while they were there", meanwhile - before, "MiB over before");

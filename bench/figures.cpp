@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <cstdlib>
 #include <fstream>
 #include <thread>
 
@@ -78,6 +79,14 @@ double percentile(std::vector<double>& samples, double share) {
   if (samples.empty()) return 0;
   std::sort(samples.begin(), samples.end());
   return samples[std::min(samples.size() - 1, static_cast<size_t>(share * static_cast<double>(samples.size())))];
+}
+
+double resident_kib(pid_t process) {
+  std::ifstream status("/proc/" + std::to_string(process) + "/status");
+  for (std::string line; std::getline(status, line);) {
+    if (line.rfind("VmRSS:", 0) == 0) return std::atof(line.c_str() + 6);
+  }
+  return 0;
 }
 
 }  // namespace zn

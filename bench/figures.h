@@ -1,6 +1,8 @@
 // Figures of a benchmark run, each beside its bound: a table to read and JSON for machines.
 #pragma once
 
+#include <sys/types.h>
+
 #include <optional>
 #include <string>
 #include <vector>
@@ -40,5 +42,8 @@ bool flag(int argc, char** argv, const std::string& name);
 
 /// The sample below which `share` (0 to 1) of all lie; the samples are sorted.
 double percentile(std::vector<double>& samples, double share);
+
+/// Memory of a process that is in the machine's; 0 when it is gone.
+double resident_kib(pid_t process);
 
 }  // namespace zn

@@ -73,8 +73,11 @@ int member(GSController& controller, Slot& slot, int number, const char* group) 
   BenchMember member(group, static_cast<short>(number), slot);
   if (member.joinGroup() != WYX_OK) return 1;
   return serve(controller, [&](const std::string& line) {
-    for (long left = std::atol(line.c_str() + std::strlen("send ")); left > 0;) {
-      const wyx_rc_t rc = member.send_next_message();
+    long left = 0;
+    int length = 0;
+    if (std::sscanf(line.c_str(), "send %ld %d", &left, &length) != 2) return;
+    while (left > 0) {
+      const wyx_rc_t rc = member.send_next_message(length);
       if (rc == WYX_OK) left--;
       if (rc != WYX_OK && rc != WYX_COLLIDE) return member.witness().fault();
       controller.dispatch(WYX_NON_BLOCKING);
@@ -94,7 +97,10 @@ class CountingMember : public zelt_gscl_V1::GSProvider {
   CountingMember(const std::string& group, int instance, Slot& slot)
       : GSProvider(group.c_str(), static_cast<short>(instance), nullptr), slot_(slot) {}
   void approvedCb(const wyx_approved_notification_t* n) override {
-    if (n->gs_protocol_type == WYX_FAILURE_LEAVE) slot_.failures++;
+    if (n->gs_protocol_type == WYX_FAILURE_LEAVE) {
+      slot_.time = now_ns();
+      slot_.failures++;
+    }
     slot_.count.fetch_add(1, std::memory_order_release);
   }
   void announcementCb(const wyx_announcement_notification_t*) override { slot_.ready = 0; }  // the session is over
@@ -157,14 +163,16 @@ int deaf(Slot& slot, int number) {
 
 }  // namespace
 
-void Payload::write(char (&bytes)[kPayload]) const {
-  std::memset(bytes, static_cast<int>(number & 0xff), sizeof bytes);
-  std::memcpy(bytes, this, sizeof *this);
+std::string Payload::bytes() const {
+  std::string bytes(static_cast<size_t>(length), static_cast<char>(number & 0xff));
+  std::memcpy(bytes.data(), this, sizeof *this);
+  return bytes;
 }
 
 bool Payload::read(const char* bytes, int length, Payload* payload) {
-  if (length != kPayload) return false;
+  if (length < static_cast<int>(sizeof *payload)) return false;
   std::memcpy(payload, bytes, sizeof *payload);
+  if (payload->length != length) return false;
   for (int i = static_cast<int>(sizeof *payload); i < length; i++) {
     if (bytes[i] != static_cast<char>(payload->number & 0xff)) return false;
   }
@@ -199,17 +207,15 @@ void Witness::failure() {
 }
 
 wyx_rc_t BenchMember::propose_next_state(wyx_num_phases_t phases) {
-  char bytes[kPayload];
-  Payload{sender_, next_number_}.write(bytes);
-  const wyx_rc_t rc = changeStateValue(wyx_state_value_t{kPayload, bytes}, phases, 30);
+  std::string bytes = Payload{sender_, kPayload, next_number_}.bytes();
+  const wyx_rc_t rc = changeStateValue(wyx_state_value_t{kPayload, bytes.data()}, phases, 30);
   if (rc == WYX_OK) next_number_++;
   return rc;
 }
 
-wyx_rc_t BenchMember::send_next_message() {
-  char bytes[kPayload];
-  Payload{sender_, next_number_}.write(bytes);
-  const wyx_rc_t rc = send_message(wyx_provider_message_t{kPayload, bytes}, WYX_1_PHASE, 0);
+wyx_rc_t BenchMember::send_next_message(int length) {
+  std::string bytes = Payload{sender_, length, next_number_}.bytes();
+  const wyx_rc_t rc = send_message(wyx_provider_message_t{length, bytes.data()}, WYX_1_PHASE, 0);
   if (rc == WYX_OK) next_number_++;
   return rc;
 }
@@ -243,7 +249,11 @@ int run_role(const std::string& role, int argc, char** argv) {
   if (role == "receiver") return receiver(board[number], argv[2]);
 
   GSController controller;
-  if (controller.initialize() != WYX_OK) return 1;
+  while (controller.initialize() != WYX_OK) {
+    if (role != "newcomer") return 1;
+    ::usleep(1000);
+  }
+  if (role == "newcomer") board[number].time = now_ns();
   if (role == "member") return member(controller, board[number], number, argv[2]);
   if (role == "subscriber") return subscriber(controller, board[number], argv[2]);
   if (role == "everywhere") return everywhere(controller, board[number], number, std::atoi(argv[2]));

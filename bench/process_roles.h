@@ -1,4 +1,5 @@
-// The processes that processes.cpp and disturbances.cpp measure. All are the program itself, started with
+// The processes that processes.cpp, disturbances.cpp and cluster.cpp measure. All are the program itself, started
+// with
 // --role=...
 #pragma once
 
@@ -14,11 +15,12 @@ namespace zn {
 constexpr int kPayload = 64;          // bytes of every state value and message that is not big
 constexpr int kBigState = 64 * 1024;  // the most there can be
 
-/// What is sent: who sent it and which of its messages it is.
+/// What is sent: who sent it, which of its messages it is, and as many bytes as it says.
 struct Payload {
   uint32_t sender = 0;
+  int32_t length = kPayload;
   uint64_t number = 0;
-  void write(char (&bytes)[kPayload]) const;
+  std::string bytes() const;
   static bool read(const char* bytes, int length, Payload* payload);
 };
 
@@ -46,7 +48,7 @@ class BenchMember : public zelt_gscl_V1::GSProvider {
       : GSProvider(group, instance, nullptr), witness_(slot), sender_(static_cast<uint32_t>(instance)) {}
 
   wyx_rc_t propose_next_state(wyx_num_phases_t phases);
-  wyx_rc_t send_next_message();
+  wyx_rc_t send_next_message(int length);
   Witness& witness() { return witness_; }
 
   void nPhaseCb(const wyx_n_phase_notification_t* n) override;
@@ -63,9 +65,10 @@ class BenchMember : public zelt_gscl_V1::GSProvider {
 /// Runs a role; the process ends with the result.
 ///   echo PATH              sends every packet back
 ///   receiver BOARD SLOT PATH   reports every packet
-///   member BOARD SLOT GROUP    a group member; "send N" on its input makes it send N messages
+///   member BOARD SLOT GROUP    a group member; "send N BYTES" on its input makes it send N messages
 ///   subscriber BOARD SLOT GROUP
 ///   idle BOARD SLOT            a session and nothing else
+///   newcomer BOARD SLOT        the same as soon as it is served, and reports when that was
 ///   everywhere BOARD SLOT N    providers in N groups; "join I", "state I" on its input makes one join, propose
 ///                              64 KiB
 ///   crowd BOARD SLOT N         the same with N providers in one group

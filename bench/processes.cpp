@@ -13,7 +13,6 @@
 
 #include <cstdio>
 #include <cstdlib>
-#include <fstream>
 #include <memory>
 #include <vector>
 
@@ -242,7 +241,8 @@ void Benchmark::message_rate(int senders, double ping_pong_us) {
   }
   const int64_t start = zn::now_ns();
   for (int i = 0; i < senders; i++)
-    talkers[static_cast<size_t>(i)]->write_line("send " + std::to_string(settings_.messages));
+    talkers[static_cast<size_t>(i)]->write_line("send " + std::to_string(settings_.messages) + " " +
+                                                std::to_string(zn::kPayload));
   const uint64_t total = static_cast<uint64_t>(senders) * static_cast<uint64_t>(settings_.messages);
   const double seconds = static_cast<double>(await_counts(kTalker, 3, total) - start) / 1e9;
   check(kTalker, 3);
@@ -254,21 +254,14 @@ void Benchmark::message_rate(int senders, double ping_pong_us) {
 // With a daemon that has served nobody yet, so that no memory of earlier clients is used again.
 void Benchmark::idle_memory() {
   zn::PrivateDaemon fresh;
-  auto resident_kib = [&] {
-    std::ifstream status("/proc/" + std::to_string(fresh.pid()) + "/status");
-    for (std::string line; std::getline(status, line);) {
-      if (line.rfind("VmRSS:", 0) == 0) return std::atof(line.c_str() + 6);
-    }
-    throw Failure{"the daemon is gone"};
-  };
-  const double before = resident_kib();
+  const double before = zn::resident_kib(fresh.pid());
   Children idle = start_many(fresh, "idle", kFirstOfMany, settings_.spread, "");
   const auto deadline = Clock::now() + kLimit;
   for (int i = kFirstOfMany; i < kFirstOfMany + settings_.spread; i++) {
     while (board_[i].ready == 0 && Clock::now() < deadline) ::usleep(200);
     if (board_[i].ready == 0) throw Failure{"an idle client did not connect"};
   }
-  const double clients = resident_kib() - before;
+  const double clients = zn::resident_kib(fresh.pid()) - before;
   figures_.add("memory of the daemon for an idle client", clients / settings_.spread, "KiB", 64);
   figures_.add("  " + std::to_string(settings_.spread) + " of them, over the daemon without clients",
                clients / before, "x");
@@ -305,11 +298,11 @@ double Benchmark::bare_spread(int receivers) {
   for (int i = 0; i < receivers; i++) sockets.push_back(::accept(listening, nullptr, nullptr));
   std::vector<double> samples;
   for (int i = 1; i <= settings_.changes; i++) {
-    char bytes[zn::kPayload];
-    zn::Payload{1, static_cast<uint64_t>(i)}.write(bytes);
+    const std::string bytes = zn::Payload{1, zn::kPayload, static_cast<uint64_t>(i)}.bytes();
     const int64_t start = zn::now_ns();
     for (int socket : sockets) {
-      if (::send(socket, bytes, sizeof bytes, MSG_NOSIGNAL) != zn::kPayload) throw Failure{"bare send failed"};
+      if (::send(socket, bytes.data(), bytes.size(), MSG_NOSIGNAL) != zn::kPayload)
+        throw Failure{"bare send failed"};
     }
     const int64_t end = await_counts(kFirstOfMany, receivers, static_cast<uint64_t>(i));
     samples.push_back(static_cast<double>(end - start) / 1e3);

@@ -8,7 +8,9 @@ status=0
 for program in "$bin"/*; do
   name=$(basename "$program")
   echo "== $name"
-  "$program" --benchmark_out="$out/$name.json" --benchmark_out_format=json || status=1
+  run=("$program")
+  if [ "$name" = cluster ]; then run=(scripts/cluster_bench.sh "$1"); fi
+  "${run[@]}" --benchmark_out="$out/$name.json" --benchmark_out_format=json || status=1
 done
 echo "JSON: $out"
 exit $status
