@@ -37,6 +37,7 @@ int main(int argc, char** argv) {
     return figures.write_json(zn::option(argc, argv, "benchmark_out")) ? 0 : 1;
   } catch (const zn::Failure& failure) {
     std::fprintf(stderr, "cluster: %s\n", failure.text.c_str());
+    zn::Hosts::print_logs(nodes);
     return 1;
   }
 }

@@ -21,10 +21,10 @@ struct ClusterSettings {
   int raw_messages = 30000;
   int daemon_deaths = 200;
   int host_deaths = 8;
-  int newcomers = 5;
-  int quiet = 500;  // requests with nothing going on
+  int newcomers = 8;
+  int quiet = 100;  // requests with nothing going on, before each newcomer
 
-  static ClusterSettings quick() { return {2, 50, 200, 2000, 5, 2, 1, 100}; }
+  static ClusterSettings quick() { return {2, 50, 200, 2000, 5, 2, 2, 50}; }
 };
 
 class ClusterScene {

@@ -13,6 +13,7 @@ namespace {
 constexpr int kMany = 20, kNewcomer = 21;  // slots
 constexpr int kGroups = 1000;
 constexpr int kStates = (16 << 20) / kBigState;  // 16 MiB
+constexpr int64_t kEvery = 5'000'000;            // nanoseconds from one request to the next
 constexpr int kAtOnce = 20;                      // before the member of all groups has to catch up
 
 void tell(ClusterScene& scene, Process& many, const char* what, int groups) {
@@ -45,6 +46,7 @@ std::vector<double> requests(ClusterScene& scene, zelt_gscl_V1::GSProvider& memb
                              const std::function<bool(size_t)>& done) {
   char text[] = "unrelated";
   return steadily(
+      kEvery,
       [&] {
         const wyx_rc_t rc = member.send_message({sizeof text, text}, WYX_1_PHASE, 0);
         scene.controller().dispatch(WYX_NON_BLOCKING);

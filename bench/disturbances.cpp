@@ -23,7 +23,8 @@ using zn::Clock;
 using zn::Failure;
 using zn::Process;
 
-constexpr int kAtOnce = 20;  // joins or changes before everybody has to catch up
+constexpr int64_t kEvery = 2'000'000;  // nanoseconds from one request to the next
+constexpr int kAtOnce = 20;            // joins or changes before everybody has to catch up
 
 struct Settings {
   int groups = 1000;
@@ -115,6 +116,7 @@ std::vector<double> Scene::requests(Done done) {
   char text[] = "unrelated";
   const int64_t start = zn::now_ns();
   std::vector<double> samples = zn::steadily(
+      kEvery,
       [&] {
         const wyx_rc_t rc = unrelated_->send_message({sizeof text, text}, WYX_1_PHASE, 0);
         controller_->dispatch(WYX_NON_BLOCKING);

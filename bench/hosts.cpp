@@ -2,6 +2,9 @@
 
 #include <unistd.h>
 
+#include <algorithm>
+#include <cstdio>
+
 #include "bench/waits.h"
 
 namespace zn {
@@ -15,6 +18,17 @@ Hosts::Hosts(std::string script, int count, std::string delivery)
   for (int host = 1; host <= count; host++) await_serving(host);
 }
 
+void Hosts::print_logs(int count) {
+  constexpr std::size_t kTail = 1500;  // bytes
+  for (int host = 1; host <= count; host++) {
+    for (const std::string& file : {log(host), "/run/cluster/corosync." + std::to_string(host) + ".log"}) {
+      const std::string text = content_of(file);
+      std::fprintf(stderr, "%s:\n%s\n", file.c_str(),
+                   text.substr(text.size() - std::min(text.size(), kTail)).c_str());
+    }
+  }
+}
+
 void Hosts::start_daemon(int host) {
   forget_log(host);
   const std::vector<std::string> command{script_,         "on",           std::to_string(host), program("gsd"),
@@ -24,11 +38,7 @@ void Hosts::start_daemon(int host) {
 }
 
 void Hosts::await_serving(int host) const {
-  try {
-    await("gsd serves", [&] { return content_of(log(host)).find("serving, was") != std::string::npos; });
-  } catch (const Failure& failure) {
-    throw Failure{failure.text + ": " + content_of(log(host))};
-  }
+  await("gsd serves", [&] { return content_of(log(host)).find("serving, was") != std::string::npos; });
 }
 
 void Hosts::end_daemon(int host, int signal) {

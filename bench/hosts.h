@@ -19,6 +19,9 @@ class Hosts {
   /// Of what the processes of all hosts share.
   static std::string board() { return "/dev/shm/board"; }
 
+  /// What daemons and Corosyncs have logged last, to standard error.
+  static void print_logs(int count);
+
   pid_t daemon(int host) const { return daemons_[static_cast<size_t>(host)]->pid(); }
   void start_daemon(int host);
   void await_serving(int host) const;

@@ -122,8 +122,8 @@ class Replication {
     Process self;
     bool safe = true;  // false: events are applied as they are ordered
     Duration member_timeout{5'000};
-    std::size_t piece = 128 * 1024;  // bytes
-    std::uint64_t limits = 0;        // of the engine, in one number
+    std::size_t piece = 32 * 1024;  // bytes of a state that is sent: what others send waits behind those under way
+    std::uint64_t limits = 0;       // of the engine, in one number
     Rule without = Rule::kNone;
   };
   /// `random`: 64 bits that nobody has had before. `clock`: milliseconds since 1970.
@@ -165,7 +165,7 @@ class Replication {
 
  private:
   enum class State { kOut, kWaiting, kExchange, kRunning };
-  static constexpr std::size_t kPiecesUnderWay = 4;
+  static constexpr std::size_t kPiecesUnderWay = 2;
   static constexpr Duration kRepeat{200};        // of confirmations, by the order
   static constexpr Duration kBetweenRanks{250};  // until the next one asks for an eviction
   static constexpr Duration kFirstPause{250};    // before it joins again
