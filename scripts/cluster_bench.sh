@@ -1,12 +1,13 @@
 #!/bin/bash
 # cluster_bench.sh BUILD_FOLDER [--nodes=N,...] [--delivery=HOW,...] [--table] [--quick] [--benchmark_out=FILE.json]
 # measures groups over several hosts of this machine, a cluster of scripts/cluster.sh for each number of nodes (3) and
-# delivery (safe,agreed); --table: all of it as one table in the end. JSON in FILE.N.HOW.json, one for each cluster.
+# delivery (safe,agreed); --table: all of it as one table in the end. JSON for each cluster: BUILD_FOLDER/bench or FILE,
+# as in cluster.3.safe.json.
 # Where there can be no such cluster it says why and ends with status 0.
 . "$(dirname "$0")/common.sh"
-bin=$1/bin/bench/cluster
+bin=$1/bin/bench/cluster out=$1/bench/cluster.json
 shift
-nodes=3 deliveries=safe,agreed table= out= more=()
+nodes=3 deliveries=safe,agreed table= more=()
 for word; do
   case $word in
   --nodes=*) nodes=${word#*=};;
@@ -26,9 +27,7 @@ export TOKEN=${TOKEN:-1000} WAIT=${WAIT:-60}
 cluster=$PWD/scripts/cluster.sh
 "$cluster" run 1 true </dev/null || { echo "skipped: no hosts can be made here, see above"; exit 0; }
 
-scratch=$(mktemp -d)
-trap 'rm -rf "$scratch"' EXIT
-out=${out:-$scratch/cluster.json}
+mkdir -p "$(dirname "$out")"
 
 # The last figure without indentation names those under it. A cell is the figures of all deliveries.
 print_table() {
