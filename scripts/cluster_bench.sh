@@ -23,7 +23,7 @@ for program in corosync ip unshare; do
   echo "skipped: there is no $program; scripts/dependencies.sh cluster installs it"
   exit 0
 done
-export TOKEN=${TOKEN:-1000} WAIT=${WAIT:-60}
+export TOKEN=${TOKEN:-2000} WAIT=${WAIT:-60}
 cluster=$PWD/scripts/cluster.sh
 "$cluster" run 1 true </dev/null || { echo "skipped: no hosts can be made here, see above"; exit 0; }
 
@@ -33,16 +33,20 @@ mkdir -p "$(dirname "$out")"
 print_table() {
   awk -v nodes="$nodes" -v deliveries="$deliveries" -v out="${out%.json}" '
     function figure(line) { match(line, /"name": "[^"]*"/); return substr(line, RSTART + 9, RLENGTH - 10) }
-    function field(line, name) { match(line, "\"" name "\": \"?[^,\"}]*"); return substr(line, RSTART + length(name) + 4, RLENGTH - length(name) - 4) }
-    function read(file, column,    line, name, key) {
+    function field(line, name) {
+      match(line, "\"" name "\": \"?[^,\"}]*")
+      return substr(line, RSTART + length(name) + 4, RLENGTH - length(name) - 4)
+    }
+    function read(file, column,    line, name, key, value) {
       while ((getline line <file) > 0) {
         if (line !~ /"name"/) continue
         name = figure(line)
         if (name !~ /^ /) top = name
         key = top "|" name
-        if (!(key in unit)) { row[++rows] = key; text[key] = name; }
+        if (!(key in unit)) { row[++rows] = key; text[key] = name }
         unit[key] = field(line, "unit"); sub(/^"/, "", unit[key])
-        cell[key, column] = sprintf("%.3g", field(line, "measured"))
+        value = field(line, "measured")
+        cell[key, column] = sprintf(value < 100 ? "%.3g" : "%.0f", value)
       }
     }
     BEGIN {

@@ -122,7 +122,7 @@ class Replication {
     Process self;
     bool safe = true;  // false: events are applied as they are ordered
     Duration member_timeout{5'000};
-    std::size_t piece = 32 * 1024;  // bytes of a state that is sent: what others send waits behind those under way
+    std::size_t piece = 16 * 1024;  // bytes of a state that is sent: what others send waits behind those under way
     std::uint64_t limits = 0;       // of the engine, in one number
     Rule without = Rule::kNone;
   };
