@@ -10,12 +10,17 @@
 
 int main(int argc, char** argv) {
   const std::string role = zn::option(argc, argv, "role");
-  if (role == "raw") {
+  if (role == "raw" && argc == 4) {
     zn::Board board(argv[2]);
     return board.ok() ? zn::run_raw_cpg(board, std::atoi(argv[3])) : 2;
   }
   if (!role.empty()) return zn::run_role(role, argc - 2, argv + 2);
 
+  const std::string script = zn::option(argc, argv, "script");
+  if (script.empty()) {
+    std::fprintf(stderr, "cluster: needs hosts around it: start scripts/cluster_bench.sh\n");
+    return 2;
+  }
   zn::catch_interrupts();
   zn::print_host();
   const zn::ClusterSettings settings =
@@ -26,7 +31,7 @@ int main(int argc, char** argv) {
               nodes, delivery.c_str(), settings.rounds, settings.samples, settings.messages,
               settings.daemon_deaths);
   try {
-    zn::ClusterScene scene(zn::option(argc, argv, "script"), nodes, delivery);
+    zn::ClusterScene scene(script, nodes, delivery);
     zn::Figures figures;
     zn::many_groups(scene, settings, &figures);
     zn::agreement(scene, settings, &figures);

@@ -45,7 +45,7 @@ print_table() {
         key = top "|" name
         if (!(key in unit)) { row[++rows] = key; text[key] = name }
         unit[key] = field(line, "unit"); sub(/^"/, "", unit[key])
-        value = field(line, "measured")
+        value = field(line, "measured") + 0
         cell[key, column] = sprintf(value < 100 ? "%.3g" : "%.0f", value)
       }
     }
