@@ -515,13 +515,13 @@ struct wyx_site_spec_t {
 
 struct wyx_node_info_t {
   int32_t node_number;
-  uint32_t node_epoch;
-  uint64_t node_id;
+  uint32_t node_epoch;  ///< another one each time that the node comes
+  uint64_t node_id;     ///< the same as its number
 };
 
 struct wyx_node_list_t {
   unsigned int gs_count;
-  wyx_node_info_t* gs_nodes;
+  wyx_node_info_t* gs_nodes;  ///< gs_count of them, ascending by number
 };
 
 struct wyx_subcluster_dissolution_info_t {
@@ -713,10 +713,10 @@ struct wyx_site_event_t {
 };
 
 struct wyx_quorum_change_t {
-  uint64_t notification_sequence;
+  uint64_t notification_sequence;  ///< 0: it is not to be answered
   wyx_quorum_state_t old_quorum_val;
   wyx_quorum_state_t new_quorum_val;
-  uint64_t gs_event_seqnum;
+  uint64_t gs_event_seqnum;  ///< of the nodes' last change before the session had quorum
 };
 
 struct wyx_subcluster_event_t {
@@ -729,11 +729,14 @@ struct wyx_subcluster_event_t {
   uint64_t gs_event_seqnum;
 };
 
+/// Answers a quorum notification: what wyx_internal_send_domain_msg_to_gsd is given with WYX_PRIV_MSG_OPQUORUM.
+struct wyx_quorum_resp_t {
+  uint64_t notification_sequence;  ///< of the notification
+  void* reserved_field;
+};
+
 struct wyx_quorum_resp_err_t {
-  struct {
-    uint64_t notification_sequence;
-    void* reserved_field;
-  } quorum_resp;
+  wyx_quorum_resp_t quorum_resp;
   wyx_rc_t error_code;
 };
 
@@ -779,6 +782,7 @@ typedef void wyx_merge_cb_t(const wyx_merge_notification_t*);
 typedef void wyx_subscription_cb_t(const wyx_subscription_notification_t*);
 typedef void wyx_delayed_error_cb_t(const wyx_delayed_error_notification_t*);
 typedef void wyx_query_cb_t(const wyx_query_notification_t*);
+typedef void wyx_domain_control_cb_t(const wyx_domain_control_notification_t*);
 typedef wyx_callback_rc_t wyx_responsiveness_cb_t(const wyx_responsiveness_notification_t*);
 
 // ---------------------------------------------------------------------------------------------------------

@@ -7,11 +7,18 @@ namespace {
 
 using namespace test_support;
 
+void on_domain_control(const wyx_domain_control_notification_t* n) {
+  if (n->domain_event_type != WYX_DOMAIN_NODE_CONFIG) return;
+  for (const wyx_node_list_t* list : {n->info.nodes.current, n->info.nodes.added, n->info.nodes.removed})
+    for (unsigned i = 0; i < list->gs_count; ++i)
+      if (list->gs_nodes[i].node_number < 0) abort();
+}
+
 class Run {
  public:
   Run(const std::uint8_t* data, std::size_t size) : in_(data, size) {
     Recorder::get().reset();
-    setup();
+    setup(on_domain_control);
   }
   ~Run() {
     daemon_.answer_request();
@@ -51,7 +58,7 @@ class Run {
         daemon_.answer_request();
         if (in_.byte() < 128) wyx_quit();
         daemon_.begin();
-        setup();
+        setup(on_domain_control);
         return;
       case 5:
       case 6:

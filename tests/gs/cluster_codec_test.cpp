@@ -42,10 +42,13 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
   const RingId ring{1, 1};
   const std::vector<Process> most(kMaxNodes, Process{1, 1}), over(kMaxNodes + 1, Process{1, 1});
   const std::string address(kMaxAddress, 'a');
-  const Message at_limit[] = {Begin{{}, ring, most, {{1, kMaxVotes}}, 0, 0}, Word{{}, 1, 1, {}, address, address},
-                              Piece{{}, 0, 1, std::vector<std::byte>(kMaxPiece)},
-                              Confirmed{{}, 1, std::vector<Node>(kMaxNodes, 1)},
-                              ordered(TimerExpiredEvent{{std::string(kMaxGroupName, 'g'), 1, 1}})};
+  const Message at_limit[] = {
+      Begin{{}, ring, most, {{1, kMaxVotes}}, 0, 0},
+      Word{{}, 1, 1, {}, address, address},
+      Piece{{}, 0, 1, std::vector<std::byte>(kMaxPiece)},
+      Confirmed{{}, 1, std::vector<Node>(kMaxNodes, 1)},
+      ordered(TimerExpiredEvent{{std::string(kMaxGroupName, 'g'), 1, 1}}),
+      ordered(AdaptersEvent{1, Adapters(kMaxAdapters, {std::string(kMaxAdapterName, 'a'), {}})})};
   for (const Message& message : at_limit) {
     std::string error;
     EXPECT_TRUE(decode(encode(message), &error)) << "kind " << message.index() << ": " << error;
@@ -63,6 +66,8 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
                              Confirmed{{}, 1, std::vector<Node>(kMaxNodes + 1, 1)},
                              Ordered{},
                              ordered(NumbersEvent{1}),
+                             ordered(AdaptersEvent{1, Adapters(kMaxAdapters + 1, {"a", {}})}),
+                             ordered(AdaptersEvent{1, {{std::string(kMaxAdapterName + 1, 'a'), {}}}}),
                              ordered(TimerExpiredEvent{{std::string(kMaxGroupName + 1, 'g'), 1, 1}}),
                              ordered(RequestEvent{{1, 1}, no_vote, true, 0})};
   for (const Message& message : refused) EXPECT_TRUE(encode(message).empty()) << "number " << &message - refused;

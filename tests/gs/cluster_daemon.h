@@ -55,6 +55,8 @@ struct World {
   };
   std::unordered_map<const Event*, Named> events;  // all that were ever sent
   Seen seen;
+  std::map<Node, Adapters> adapters;  // that each has published last
+  std::uint64_t last_adapter = 0;
   std::uint64_t last_life = 0;
   std::uint32_t last_pid = 0;
 };
@@ -155,6 +157,13 @@ class Daemon : public Order, public Replica, public Host {
     return std::ranges::any_of(clients_, [](const auto& c) { return c.second.pending > 0; });
   }
   History::Place place() const { return place_; }
+  /// Of every host that takes part, as its daemon is now.
+  bool knows_all_adapters() const {
+    return std::ranges::all_of(engine_->hosts(), [this](const auto& host) {
+      const auto last = world_.adapters.find(host.first);
+      return last != world_.adapters.end() && host.second.adapters == last->second;
+    });
+  }
   bool knows(SessionId id) const {
     for (const Token token : {0, 1})
       if (engine_->precheck(id, GoodbyeRequest{token}) == WYX_OK) return true;
@@ -238,7 +247,7 @@ class Daemon : public Order, public Replica, public Host {
     world_.history.applied(self_.node, place_, beside());
     world_.tell(self_.node, "serves");
     domain_ = domain;
-    serving_ = true;
+    if (!std::exchange(serving_, true)) publish_adapters();
     continued_ = false;
     world_.history.serves(self_.node, ring_, place_, beside());
   }
@@ -271,6 +280,10 @@ class Daemon : public Order, public Replica, public Host {
   }
   void take(const Received& received) { replication_.received(received.from, *received.message); }
 
+  void publish_adapters() {
+    world_.adapters[self_.node] = {{"eth" + std::to_string(++world_.last_adapter), {}}};
+    replication_.submit(AdaptersEvent{self_.node, world_.adapters[self_.node]});
+  }
   Request make(Random& random) {
     const Token token = random.below(2);
     const ProtocolTerms terms{WYX_N_PHASE, 5};

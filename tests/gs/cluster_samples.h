@@ -13,6 +13,7 @@ inline auto fields(const HostCameEvent& e) { return std::tie(e.node); }
 inline auto fields(const TimerExpiredEvent& e) { return std::tie(e.timer); }
 inline auto fields(const ResponsivenessEvent& e) { return std::tie(e.session, e.responding); }
 inline auto fields(const ContinueEvent&) { return std::tie(); }
+inline auto fields(const AdaptersEvent& e) { return std::tie(e.node, e.adapters); }
 inline auto fields(const NumbersEvent& e) { return std::tie(e.above); }
 
 namespace cluster {
@@ -48,7 +49,8 @@ inline std::vector<Message> messages() {
                                HostCameEvent{kNode},
                                TimerExpiredEvent{{"a group", 0xfedcba9876543210, 3}},
                                ResponsivenessEvent{session, true},
-                               ContinueEvent{}};
+                               ContinueEvent{},
+                               AdaptersEvent{kNode, wire::samples::adapters()}};
   for (Request& request : wire::samples::requests()) events.push_back(RequestEvent{session, request, true, 1000});
   for (Event& event : events)
     all.emplace_back(Ordered{kLife, 12, std::make_shared<const Event>(std::move(event))});

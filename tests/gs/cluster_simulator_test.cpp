@@ -145,6 +145,7 @@ class Cluster {
     for (Node node = 1; node <= hosts() && error().empty(); ++node) {
       const Daemon& daemon = *daemons_[node];
       if (daemon.place() != daemons_[1]->place()) world_.history.error("states differ: after all is mended");
+      if (!daemon.knows_all_adapters()) world_.history.error("adapters missing: or not those of now");
       if (daemon.missing()) world_.history.error("session missing: a subscription that was told is not there");
       for (const SessionId& id : world_.over)
         if (daemon.knows(id)) world_.history.error("ghost: a session that is over is still there");

@@ -104,14 +104,14 @@ struct MemoryDaemon {
 /// A session with both channels, and what a well-behaved client does with them.
 class MemoryClient {
  public:
-  explicit MemoryClient(MemoryDaemon& daemon, std::uint32_t uid = 1000)
+  explicit MemoryClient(MemoryDaemon& daemon, std::uint32_t uid = 1000, std::uint32_t socket_control = 0)
       : daemon_(daemon), request(daemon.open(uid)) {
-    daemon_.say(request, wire::Hello{wire::kProtocolVersion, 0, 0, "client"});
+    daemon_.say(request, wire::Hello{wire::kProtocolVersion, 0, socket_control, "client"});
     welcome = std::get<wire::Welcome>(daemon_.transport.take(request).at(0));
     event = daemon_.open(uid);
     daemon_.say(event, wire::Attach{welcome.session_number, welcome.cookie});
-    if (std::get<wire::Answer>(daemon_.transport.take(event).at(0)).rc != WYX_OK)
-      throw std::runtime_error("attach");
+    greeting = daemon_.transport.take(event);
+    if (std::get<wire::Answer>(greeting.at(0)).rc != WYX_OK) throw std::runtime_error("attach");
   }
 
   wyx_rc_t ask(const wire::ClientMessage& message) {
@@ -142,6 +142,7 @@ class MemoryClient {
   ConnectionId request = 0;
   ConnectionId event = 0;
   wire::Welcome welcome;
+  std::vector<wire::ServerMessage> greeting;  // the answer to Attach, and what came with it
 };
 
 }  // namespace gs::daemon

@@ -6,6 +6,7 @@
 #include "common/access.h"
 #include "gs/daemon_memory.h"
 #include "gs/engine_text.h"
+#include "gs/wire_samples.h"
 #include "tests/support/allocations.h"
 
 namespace gs::daemon {
@@ -85,8 +86,9 @@ TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
   ASSERT_EQ(bystander.join(1, 1), WYX_OK);
   const wire::ClientMessage hello = wire::Hello{}, attach = wire::Attach{}, pong = wire::PingAnswer{},
                             quit = wire::Quit{}, node = wire::QueryNode{}, settings = wire::SetResponsiveness{},
-                            call = wire::Call{GoodbyeRequest{1}};
-  for (const auto& message : {call, settings, pong, quit, attach}) {
+                            call = wire::Call{GoodbyeRequest{1}}, quorum = wire::QuorumAnswer{1},
+                            adapters = wire::QueryAdapters{};
+  for (const auto& message : {call, settings, pong, quit, attach, quorum}) {
     const ConnectionId id = daemon_.open();
     daemon_.say(id, message);
     EXPECT_TRUE(daemon_.closed(id)) << "first, kind " << message.index();
@@ -96,7 +98,7 @@ TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
     daemon_.say(client.request, message);
     EXPECT_TRUE(client.closed()) << "request channel, kind " << message.index();
   }
-  for (const auto& message : {hello, attach, quit, node, call, settings}) {
+  for (const auto& message : {hello, attach, quit, node, call, settings, quorum, adapters}) {
     MemoryClient client(daemon_);
     daemon_.say(client.event, message);
     EXPECT_TRUE(client.closed()) << "event channel, kind " << message.index();
@@ -107,6 +109,46 @@ TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
   EXPECT_TRUE(daemon_.logged("closed: out of order"));
   EXPECT_FALSE(bystander.closed());
   EXPECT_EQ(daemon_.layer.sessions(), 1u);
+}
+
+TEST_F(DaemonSession, HostsThatComeAndGo_AreToldInOrderToWhoAsked_AndTheirAdaptersAreKnown) {
+  MemoryClient listener(daemon_, 1000, WYX_ENABLE_DOMAIN_EVENT),
+      quorum(daemon_, 1000, WYX_ENABLE_OPQUORUM_CALLBACK);
+  EXPECT_EQ(listener.greeting.size(), 3u);
+  EXPECT_EQ(quorum.greeting.size(), 2u);
+  ASSERT_EQ(listener.join(1, 1), WYX_OK);
+  RequestEvent join{{0, 1}, JoinRequest{1, {}, 1, "p"}};
+  std::get<JoinRequest>(join.request).attributes.group_name = "group";
+  listener.events();
+  daemon_.ordering.submit(HostCameEvent{0});
+  daemon_.ordering.submit(AdaptersEvent{0, wire::samples::adapters()});
+  daemon_.ordering.submit(join);
+  const auto ask = [&](const wire::QueryAdapters& query) {
+    daemon_.say(quorum.request, query);
+    return std::get<wire::NodeAdapters>(daemon_.transport.take(quorum.request).at(0));
+  };
+  const Adapters known = wire::samples::adapters();
+  EXPECT_EQ(ask({0, {}}).adapters, known);
+  EXPECT_EQ(ask({7, known[1].address}).adapters, Adapters{known[1]});
+  const ConnectionId stranger = daemon_.open();
+  daemon_.say(stranger, wire::QueryNode{});
+  EXPECT_EQ(std::get<wire::NodeInfo>(daemon_.transport.take(stranger).at(0)).domain_master_node, 0u);
+
+  daemon_.ordering.submit(HostGoneEvent{0});
+  EXPECT_EQ(ask({0, {}}).adapters, Adapters());
+  EXPECT_EQ(ask({0, known[1].address}).adapters, Adapters());
+  std::string told;
+  for (const auto& message : listener.events()) {
+    const auto* news = std::get_if<wire::DomainControl>(&message);
+    if (news == nullptr)
+      told += "group ";
+    else if (const auto* nodes = std::get_if<NodesNotification>(news->what.get()))
+      told += "nodes:" + std::to_string(nodes->current.size()) + " ";
+    else
+      told += "master:" + std::to_string(std::get<MasterNotification>(*news->what).master.number) + " ";
+  }
+  EXPECT_EQ(told, "nodes:2 master:0 group nodes:1 master:1 group ") << "the failure comes behind its reason";
+  EXPECT_TRUE(quorum.events().empty());
 }
 
 TEST_F(DaemonSession, TextWithControlCharacters_CannotForgeLogLines) {

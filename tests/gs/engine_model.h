@@ -68,6 +68,7 @@ class Model {
       if (gone_.contains(d.to.session)) error(d.to, "is gone and is sent " + text(*d.what));
       std::visit([&](const auto& n) { receive(d.to, n); }, *d.what);
     }
+    follow_domain(outcome.domain, engine);
     follow_timers(outcome);
     if (refused_) error(refused_to_, "never got the delayed error of a request answered WYX_OK");
     check_groups(engine);
@@ -172,6 +173,33 @@ class Model {
       if (session.node == event.node) lose(session, event.leave_code);
   }
   void before(const HostCameEvent& event, const Outcome&) { gone_hosts_.erase(event.node); }
+  void before(const AdaptersEvent& event, const Outcome&) { adapters_[event.node] = event.adapters; }
+
+  /// Who begins to listen now and who has always listened believe the same, and only changes are told.
+  void follow_domain(const std::vector<DomainNotification>& told, const Engine& engine) {
+    std::map<std::uint32_t, std::uint32_t> nodes;
+    for (const DomainNotification& news : told) {
+      const auto* changed = std::get_if<NodesNotification>(&news);
+      if (changed == nullptr) {
+        const std::uint32_t master = std::get<MasterNotification>(news).master.number;
+        if (master == std::exchange(master_, master)) errors_ += "a master that was one before\n";
+        continue;
+      }
+      for (const DomainNode& node : changed->removed) nodes_.erase(node.number);
+      for (const DomainNode& node : changed->added)
+        if (!nodes_.emplace(node.number, node.epoch).second) errors_ += "a node that comes twice\n";
+      for (const DomainNode& node : changed->current) nodes.emplace(node.number, node.epoch);
+      if (nodes_ != nodes) errors_ += "nodes that are not what those before and the change make\n";
+    }
+    nodes.clear();
+    for (const DomainNode& node : engine.domain().nodes) nodes.emplace(node.number, node.epoch);
+    if (nodes_ != nodes) errors_ += "nodes that nobody was told of\n";
+    if (nodes.empty()) master_ = 0;
+    if (!nodes.empty() && master_ != nodes.begin()->first) errors_ += "a master that nobody was told of\n";
+    std::erase_if(adapters_, [&](const auto& of) { return !nodes.contains(of.first); });
+    for (const auto& [node, host] : engine.hosts())
+      if (host.adapters != adapters_[node]) errors_ += "adapters that are not those of the node\n";
+  }
   void before(const ResponsivenessEvent& event, const Outcome&) {
     const std::uint32_t summary = event.responding ? WYX_RESPONSIVENESS_RESPONSE : WYX_RESPONSIVENESS_NO_RESPONSE;
     for (const auto& [endpoint, about] : providers_) {
@@ -522,6 +550,9 @@ class Model {
   std::map<std::string, GroupModel> groups_;
   std::set<SessionId> gone_;
   std::set<std::uint32_t> gone_hosts_;
+  std::map<std::uint32_t, std::uint32_t> nodes_;  // with their epochs
+  std::uint32_t master_ = 0;
+  std::map<std::uint32_t, Adapters> adapters_;
   std::optional<DelayedErrorNotification> refused_;  // must come in this step, to refused_to_
   Endpoint refused_to_;
   bool busy_ = false;  // work is left for a ContinueEvent

@@ -40,6 +40,12 @@ class Episode {
   static constexpr int kNodes = 3;
   static constexpr std::size_t kSessions = 9;
 
+  void change_adapters() {
+    Adapters adapters(static_cast<std::size_t>(random_.below(3)));
+    for (Adapter& adapter : adapters) adapter = {"eth" + std::to_string(random_.below(9)), {9, 1}};
+    apply(AdaptersEvent{static_cast<std::uint32_t>(1 + random_.below(kNodes)), adapters});
+  }
+
   void step() {
     if (replicas_[0].busy() && random_.chance(50)) return apply(ContinueEvent{});
     const int dice = random_.below(1000);
@@ -49,7 +55,8 @@ class Episode {
     if (dice < 910) return arrive();
     if (dice < 945) return lose_session();
     if (dice < 950) return lose_host();
-    if (dice < 980) return expire();
+    if (dice < 975) return expire();
+    if (dice < 980) return change_adapters();
     apply(ResponsivenessEvent{some_session(), random_.chance(50)});
   }
 

@@ -26,9 +26,13 @@ inline auto fields(const SubscriptionNotification& n) {
 inline auto fields(const DelayedErrorNotification& n) {
   return std::tie(n.protocol, n.rc, n.failing_request, n.group_attributes);
 }
+inline auto fields(const NodesNotification& n) { return std::tie(n.current, n.added, n.removed); }
+inline auto fields(const MasterNotification& n) { return std::tie(n.master, n.size); }
+inline auto fields(const QuorumNotification& n) { return std::tie(n.sequence, n.before, n.now, n.seqnum); }
+inline auto fields(const QuorumErrorNotification& n) { return std::tie(n.sequence, n.rc); }
 inline auto fields(const Delivery& d) { return std::tie(d.to, d.what); }
 inline auto fields(const TimerRequest& t) { return std::tie(t.id, t.seconds); }
-inline auto fields(const Outcome& o) { return std::tie(o.rc, o.deliveries, o.timers); }
+inline auto fields(const Outcome& o) { return std::tie(o.rc, o.deliveries, o.timers, o.domain); }
 
 namespace wire {
 
@@ -49,6 +53,10 @@ inline auto fields(const Quit&) { return std::tie(); }
 inline auto fields(const Farewell&) { return std::tie(); }
 inline auto fields(const Fanout& m) { return std::tie(m.tokens); }
 inline auto fields(const FanoutEnd&) { return std::tie(); }
+inline auto fields(const QuorumAnswer& m) { return std::tie(m.sequence); }
+inline auto fields(const QueryAdapters& m) { return std::tie(m.node, m.address); }
+inline auto fields(const DomainControl& m) { return std::tie(m.what); }
+inline auto fields(const NodeAdapters& m) { return std::tie(m.node, m.adapters); }
 
 }  // namespace wire
 

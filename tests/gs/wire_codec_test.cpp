@@ -136,6 +136,19 @@ TEST(WireCodec, NotificationThatCannotBe_IsMalformed_OneOverTheLimitNotEncoded) 
   for (std::size_t i = 0; i < bad.size(); ++i)
     EXPECT_NE(problem_of_built(ServerMessage(Notify{-1, std::make_shared<const Notification>(bad[i])})), "") << i;
   EXPECT_NE(problem_of_built(ServerMessage(Welcome{0x8000, 1, 1})), "");
+  const DomainNotification bad_news[] = {
+      NodesNotification{{{2, 1}, {1, 2}}, {}, {}},
+      NodesNotification{{{0x8000, 1}}, {}, {}},
+      NodesNotification{DomainNodes(kMaxHosts + 1), {}, {}},
+      MasterNotification{{1, 1}, 0},
+      QuorumNotification{1, static_cast<wyx_quorum_state_t>(3), WYX_QUORUM_STATE_HAS, 1},
+      QuorumErrorNotification{1, WYX_OK}};
+  for (const auto& news : bad_news)
+    EXPECT_NE(problem_of_built(ServerMessage(DomainControl{std::make_shared<const DomainNotification>(news)})),
+              "");
+  for (const Adapters& bad_ones : {Adapters(kMaxAdapters + 1, samples::adapters()[0]), Adapters{{"", {}}},
+                                   Adapters{{"sixteen-letters-", {}}}, Adapters{{std::string("a\0b", 3), {}}}})
+    EXPECT_NE(problem_of_built(ServerMessage(NodeAdapters{1, bad_ones})), "");
 
   for (const auto& tokens : {std::vector<Token>{1}, std::vector<Token>{1, -1}, std::vector<Token>(kMaxFanout + 1)})
     EXPECT_NE(problem_of_built(ServerMessage(Fanout{tokens})), "") << tokens.size();

@@ -39,13 +39,21 @@ inline std::vector<Request> requests() {
           UnsubscribeRequest{12}};
 }
 
+inline Adapters adapters() {
+  return {{"eth0", {0x20, 1, 0xd, 0xb8, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 7}},
+          {"fifteen-letters", {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0xff, 0xff, 192, 0, 2, 9}}};
+}
+
 inline std::vector<ClientMessage> client_messages() {
   std::vector<ClientMessage> messages = {Hello{kProtocolVersion, 0x03020600, 0x1001, "program"},
                                          Attach{77, 0x8877665544332211},
                                          SetResponsiveness{WYX_PING_RESPONSIVENESS, 30, 20},
                                          QueryNode{},
                                          PingAnswer{5, true},
-                                         Quit{}};
+                                         Quit{},
+                                         QuorumAnswer{0x8877665544332211},
+                                         QueryAdapters{6, {}},
+                                         QueryAdapters{0, adapters()[0].address}};
   for (Request& request : requests()) messages.push_back(Call{std::move(request)});
   return messages;
 }
@@ -119,7 +127,13 @@ inline std::vector<ServerMessage> server_messages() {
                                          Ping{6},
                                          Farewell{},
                                          Fanout{{0, 7, 2'000'000'000}},
-                                         FanoutEnd{}};
+                                         FanoutEnd{},
+                                         NodeAdapters{4, adapters()}};
+  const DomainNotification news[] = {
+      NodesNotification{{{1, 10}, {32767, 11}}, {{1, 10}}, {{2, 9}, {3, 8}}}, MasterNotification{{1, 10}, 2},
+      QuorumNotification{1, WYX_QUORUM_STATE_HAS, WYX_QUORUM_STATE_NONE, 1ull << 40},
+      QuorumErrorNotification{2, WYX_BAD_QUORUM_MSG_SEQNUM}};
+  for (const auto& n : news) messages.push_back(DomainControl{std::make_shared<const DomainNotification>(n)});
   Token token = 0;
   for (Notification& n : notifications()) {
     messages.push_back(Notify{token++, std::make_shared<const Notification>(std::move(n))});

@@ -18,10 +18,10 @@ struct SetupResult {
   wyx_descriptor_t descriptor = -1;
 };
 
-inline SetupResult setup() {
+inline SetupResult setup(wyx_domain_control_cb_t* on_domain_control = nullptr) {
   SetupResult result;
-  result.rc =
-      wyx_setup(28, 7, &result.descriptor, WYX_SOCKET_NO_SIGNAL, nullptr, "", on_ping, on_delayed_error, on_query);
+  result.rc = wyx_setup(28, 8, &result.descriptor, WYX_SOCKET_NO_SIGNAL, nullptr, "", on_ping, on_delayed_error,
+                        on_query, on_domain_control);
   return result;
 }
 

@@ -32,10 +32,13 @@ std::unique_ptr<Transport> open_transport(const SetupOptions& options, wyx_rc_t*
     *rc = WYX_BAD_PARAMETER;
     return nullptr;
   }
-  if (address->embedded) return EmbeddedTransport::open(rc);
+  // Nobody would hand out what is not asked for.
+  auto socket_control = static_cast<std::uint32_t>(options.socket_control);
+  if (options.routines.domain_control == nullptr) socket_control &= ~kDomainControlBits;
+  if (address->embedded) return EmbeddedTransport::open(socket_control, rc);
   wire::Hello hello;
   hello.api_version = options.api_version;
-  hello.socket_control = static_cast<std::uint32_t>(options.socket_control);
+  hello.socket_control = socket_control;
   hello.program = program_invocation_short_name;
   return SocketTransport::open(address->path, hello, *limit, rc);
 }
@@ -95,6 +98,14 @@ wyx_rc_t query_node(wire::NodeInfo* info) {
   if (!address->embedded) return SocketTransport::query_node_of(address->path, info);
   *info = {EmbeddedTransport::kNodeNumber, EmbeddedTransport::kNodeNumber};
   return WYX_OK;
+}
+
+wyx_rc_t query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found) {
+  const auto session = current_session();
+  if (session && !session->gone()) return session->query_adapters(query, found);
+  const auto address = daemon_address();
+  if (!address) return WYX_BAD_PARAMETER;
+  return address->embedded ? WYX_CONNECT_FAILED : SocketTransport::query_adapters_of(address->path, query, found);
 }
 
 }  // namespace gs::client

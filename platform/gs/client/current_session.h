@@ -25,7 +25,8 @@ struct SetupOptions {
 wyx_rc_t open_session(const SetupOptions& options, wyx_descriptor_t* descriptor);
 wyx_rc_t quit_session();
 
-/// Asks with the open session, or without one.
+// Ask with the open session, or without one.
 wyx_rc_t query_node(wire::NodeInfo* info);
+wyx_rc_t query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found);
 
 }  // namespace gs::client

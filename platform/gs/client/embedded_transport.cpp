@@ -33,9 +33,12 @@ timespec to_timespec(std::chrono::steady_clock::time_point when) {
 
 }  // namespace
 
-std::unique_ptr<EmbeddedTransport> EmbeddedTransport::open(wyx_rc_t* rc) {
+std::unique_ptr<EmbeddedTransport> EmbeddedTransport::open(std::uint32_t socket_control, wyx_rc_t* rc) {
   std::unique_ptr<EmbeddedTransport> transport(new EmbeddedTransport);
-  if (transport->ready()) return transport;
+  if (transport->ready()) {
+    transport->greet(socket_control);
+    return transport;
+  }
   const int error = errno;
   record_failure("embedded", error, std::string("no descriptors for the session: ") + strerrordesc_np(error));
   *rc = WYX_SOCK_CREATE_FAILED;
@@ -50,6 +53,19 @@ EmbeddedTransport::EmbeddedTransport()
 bool EmbeddedTransport::ready() const {
   return epoll_fd_.get() >= 0 && event_fd_.get() >= 0 && timer_fd_.get() >= 0 &&
          watch(epoll_fd_.get(), event_fd_.get()) && watch(epoll_fd_.get(), timer_fd_.get());
+}
+
+void EmbeddedTransport::greet(std::uint32_t socket_control) {
+  MutexLock lock(mutex_);
+  engine_.apply(HostCameEvent{kNodeNumber});
+  domain_ = DomainListener(socket_control);
+  for (DomainNotification& news : domain_.greeting(engine_.domain())) tell_of_domain(std::move(news));
+  show_queue();
+}
+
+void EmbeddedTransport::tell_of_domain(DomainNotification news) {
+  auto what = std::make_shared<const DomainNotification>(std::move(news));
+  queue_.push_back({Incoming::Kind::kDomain, -1, nullptr, 0, std::move(what)});
 }
 
 wyx_rc_t EmbeddedTransport::call(Request request) {
@@ -82,6 +98,22 @@ wyx_rc_t EmbeddedTransport::set_responsiveness(const wire::SetResponsiveness& se
 wyx_rc_t EmbeddedTransport::query_node(wire::NodeInfo* info) {
   *info = {kNodeNumber, kNodeNumber};
   return WYX_OK;
+}
+
+/// Of other nodes, which there are none of.
+wyx_rc_t EmbeddedTransport::query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found) {
+  *found = {query.node, {}};
+  return WYX_OK;
+}
+
+wyx_rc_t EmbeddedTransport::answer_quorum(std::uint64_t sequence) {
+  MutexLock lock(mutex_);
+  if (gone_) return WYX_NO_INIT;
+  const wyx_rc_t rc = domain_.answered(sequence);
+  const DomainNotification refusal = QuorumErrorNotification{sequence, rc};
+  if (rc != WYX_OK && domain_.hears(refusal)) tell_of_domain(refusal);
+  show_queue();
+  return rc;
 }
 
 Incoming EmbeddedTransport::take() {

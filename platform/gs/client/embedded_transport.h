@@ -9,6 +9,7 @@
 
 #include "client/fork.h"
 #include "client/transport.h"
+#include "engine/domain_listener.h"
 #include "engine/engine.h"
 
 namespace gs::client {
@@ -17,13 +18,15 @@ class EmbeddedTransport : public Transport {
  public:
   static constexpr std::uint32_t kNodeNumber = 1;
 
-  /// Null: `rc` says why.
-  static std::unique_ptr<EmbeddedTransport> open(wyx_rc_t* rc);
+  /// `socket_control`: what the session is told of its domain, which is this process. Null: `rc` says why.
+  static std::unique_ptr<EmbeddedTransport> open(std::uint32_t socket_control, wyx_rc_t* rc);
 
   std::uint32_t node_number() const override { return kNodeNumber; }
   wyx_rc_t call(Request request) override;
   wyx_rc_t set_responsiveness(const wire::SetResponsiveness& settings) override;
   wyx_rc_t query_node(wire::NodeInfo* info) override;
+  wyx_rc_t query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found) override;
+  wyx_rc_t answer_quorum(std::uint64_t sequence) override;
   Incoming take() override;
   void answer_ping(std::uint64_t number, bool ok) override;
   void wait() override;
@@ -41,6 +44,8 @@ class EmbeddedTransport : public Transport {
 
   EmbeddedTransport();
   bool ready() const;
+  void greet(std::uint32_t socket_control);
+  void tell_of_domain(DomainNotification news) GS_REQUIRES(mutex_);
   wyx_rc_t apply(const Event& event) GS_REQUIRES(mutex_);
   wyx_rc_t apply_one(const Event& event) GS_REQUIRES(mutex_);
   void run_due_timers() GS_REQUIRES(mutex_);
@@ -55,6 +60,7 @@ class EmbeddedTransport : public Transport {
 
   Mutex mutex_;
   Engine engine_ GS_GUARDED_BY(mutex_);
+  DomainListener domain_ GS_GUARDED_BY(mutex_);
   std::deque<Incoming> queue_ GS_GUARDED_BY(mutex_);
   std::vector<Timer> timers_ GS_GUARDED_BY(mutex_);
   Clock::time_point armed_ GS_GUARDED_BY(mutex_) = Clock::time_point::max();  // what timer_fd_ is set to; max: off

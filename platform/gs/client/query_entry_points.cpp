@@ -34,7 +34,8 @@ int node_number_or_none() {
   return query_node(&node) == WYX_OK ? static_cast<int>(node.node_number) : WYX_node_number;
 }
 
-wyx_rc_t fill(wyx_adapter_info* info, const std::optional<Adapter>& adapter, int node_number, int provider_id) {
+wyx_rc_t fill(wyx_adapter_info* info, const std::optional<AdapterRecord>& adapter, int node_number,
+              int provider_id) {
   if (!adapter) return WYX_ADAPTER_INFO_NOT_FOUND;
   *info = {};
   info->ip_addr = adapter->address;
@@ -47,8 +48,18 @@ wyx_rc_t fill(wyx_adapter_info* info, const std::optional<Adapter>& adapter, int
   return WYX_OK;
 }
 
-bool is_here(const Session& session, const wyx_provider_t& provider) {
-  return provider._gs_provider_info._gs_node_number == static_cast<short>(session.node_number());
+/// Of a provider's host; none where it is no member of the domain.
+wyx_rc_t find_adapters(Session& session, const wyx_provider_t& provider, std::vector<AdapterRecord>* found) {
+  const short node = provider._gs_provider_info._gs_node_number;
+  if (node == static_cast<short>(session.node_number())) {
+    *found = adapters();
+    return WYX_OK;
+  }
+  if (node < 0) return WYX_OK;
+  wire::NodeAdapters there;
+  const wyx_rc_t rc = session.query_adapters({static_cast<std::uint32_t>(node), {}}, &there);
+  *found = records_of(there.adapters);
+  return rc;
 }
 
 }  // namespace
@@ -153,7 +164,12 @@ wyx_rc_t wyx_get_adapter_info_by_addr(const wyx_ip_addr* address, wyx_adapter_in
   return entry([&] {
     if (info == nullptr) return WYX_NULL_ADAPTER_INFO;
     if (address == nullptr || !is_interface_address(*address)) return WYX_BAD_INPUT_IP_FORMAT;
-    return fill(info, adapter_with(adapters(), *address), node_number_or_none(), kNoProvider);
+    if (const auto here = adapter_with(adapters(), *address)) {
+      return fill(info, here, node_number_or_none(), kNoProvider);
+    }
+    wire::NodeAdapters there;
+    if (query_adapters({0, address_of(*address)}, &there) != WYX_OK) return WYX_ADAPTER_INFO_NOT_FOUND;
+    return fill(info, main_adapter(records_of(there.adapters)), static_cast<int>(there.node), kNoProvider);
   });
 }
 
@@ -161,18 +177,21 @@ wyx_rc_t wyx_get_adapter_info_by_id(wyx_token_t token, const wyx_provider_t* pro
   return client_entry(token, Client::Kind::kProvider, [&](Session& session) {
     if (info == nullptr) return WYX_NULL_ADAPTER_INFO;
     if (provider == nullptr) return WYX_BAD_PARAMETER;
-    if (!is_here(session, *provider)) return WYX_ADAPTER_INFO_NOT_FOUND;
-    const int node_number = static_cast<int>(session.node_number());
-    return fill(info, main_adapter(adapters()), node_number, provider->gs_provider_id);
+    std::vector<AdapterRecord> all;
+    const wyx_rc_t rc = find_adapters(session, *provider, &all);
+    if (rc != WYX_OK) return rc;
+    const int node_number = provider->_gs_provider_info._gs_node_number;
+    return fill(info, main_adapter(all), node_number, provider->gs_provider_id);
   });
 }
 
 wyx_rc_t wyx_get_ipaddr_by_id(wyx_token_t token, const wyx_provider_t* provider, wyx_ip_addr* address) {
   return client_entry(token, Client::Kind::kProvider, [&](Session& session) {
     if (provider == nullptr || address == nullptr) return WYX_BAD_PARAMETER;
-    if (!is_here(session, *provider)) return WYX_NO_IPV4_ADDRESS_FOR_THE_ID;
-    auto all = adapters();
-    std::erase_if(all, [](const Adapter& adapter) { return !adapter.ipv4; });
+    std::vector<AdapterRecord> all;
+    const wyx_rc_t rc = find_adapters(session, *provider, &all);
+    if (rc != WYX_OK) return rc;
+    std::erase_if(all, [](const AdapterRecord& adapter) { return !adapter.ipv4; });
     const auto adapter = main_adapter(all);
     if (!adapter) return WYX_NO_IPV4_ADDRESS_FOR_THE_ID;
     *address = adapter->address;
@@ -187,6 +206,13 @@ wyx_rc_t wyx_migrate_to_pell_prep() { return WYX_NOT_SUPPORTED; }
 wyx_rc_t wyx_migrate_to_pell_commit() { return WYX_NOT_SUPPORTED; }
 wyx_rc_t wyx_migrate_to_pell_abort() { return WYX_NOT_SUPPORTED; }
 wyx_rc_t wyx_migrate_vote(wyx_migration_vote_t) { return WYX_NOT_SUPPORTED; }
-wyx_rc_t wyx_internal_send_domain_msg_to_gsd(wyx_priv_channel_msg_type_t, void*, std::uint64_t) {
-  return WYX_NOT_SUPPORTED;
+
+wyx_rc_t wyx_internal_send_domain_msg_to_gsd(wyx_priv_channel_msg_type_t type, void* data, std::uint64_t length) {
+  if (type != WYX_PRIV_MSG_OPQUORUM) return WYX_NOT_SUPPORTED;
+  return session_entry([&](Session& session) {
+    wyx_quorum_resp_t answer;
+    if (data == nullptr || length != sizeof answer) return WYX_BAD_PARAMETER;
+    std::memcpy(&answer, data, sizeof answer);
+    return session.answer_quorum(answer.notification_sequence);
+  });
 }

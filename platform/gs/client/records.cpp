@@ -77,6 +77,36 @@ const wyx_responsiveness_notification_t* Records::ping(const wyx_responsiveness_
   return &ping_;
 }
 
+const wyx_domain_control_notification_t* Records::domain(const DomainNotification& n) {
+  domain_ = {};
+  domain_.notification_type = WYX_DOMAIN_NOTIFICATION;
+  std::visit([this](const auto& what) { set(what); }, n);
+  return &domain_;
+}
+
+void Records::set(const NodesNotification& n) {
+  domain_.domain_event_type = WYX_DOMAIN_NODE_CONFIG;
+  domain_.info.nodes = {fill(current_nodes_, n.current), fill(added_nodes_, n.added),
+                        fill(removed_nodes_, n.removed)};
+}
+
+void Records::set(const MasterNotification& n) {
+  domain_.domain_event_type = WYX_DOMAIN_MASTER_NODE;
+  domain_.info.domain_master_info = {n.master.number, n.master.epoch, n.size};
+}
+
+void Records::set(const QuorumNotification& n) {
+  domain_.domain_event_type = WYX_OPQUORUM_INFO;
+  domain_.info.quorum_val = {n.sequence, n.before, n.now, n.seqnum};
+}
+
+void Records::set(const QuorumErrorNotification& n) {
+  domain_.domain_event_type = WYX_DOMAINCB_RESP_ERR_INFO;
+  auto& error = domain_.info.domaincb_resp_err;
+  error.domain_event_type = WYX_OPQUORUM_INFO;
+  error.err_info.quorum_resp_err = {{n.sequence, nullptr}, n.rc};
+}
+
 wyx_proposal_t* Records::proposal(const Proposal& p) {
   if (built_ == &p) return &proposal_;
   built_ = source_ ? &p : nullptr;
@@ -194,6 +224,14 @@ wyx_membership_t* Records::fill(ProviderArray& storage, const Membership& member
 
 wyx_membership_t* Records::fill(ProviderArray& storage, const SharedMembership& members) {
   return members ? fill(storage, *members) : nullptr;
+}
+
+wyx_node_list_t* Records::fill(NodeArray& storage, const DomainNodes& nodes) {
+  storage.nodes.clear();
+  for (const DomainNode& node : nodes)
+    storage.nodes.push_back({static_cast<std::int32_t>(node.number), node.epoch, node.number});
+  storage.record = {static_cast<unsigned>(nodes.size()), storage.nodes.data()};
+  return &storage.record;
 }
 
 wyx_state_value_t* Records::fill(wyx_state_value_t& record, const SharedBytes& bytes) {

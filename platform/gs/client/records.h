@@ -28,6 +28,7 @@ class Records {
   const wyx_delayed_error_notification_t* delayed_error(Token token, const DelayedErrorNotification& n,
                                                         const Client& client);
   const wyx_responsiveness_notification_t* ping(const wyx_responsiveness_t& settings);
+  const wyx_domain_control_notification_t* domain(const DomainNotification& n);
 
  private:
   struct ProviderArray {
@@ -42,12 +43,22 @@ class Records {
     wyx_vote_results_t record;
   };
 
+  struct NodeArray {
+    std::vector<wyx_node_info_t> nodes;
+    wyx_node_list_t record;
+  };
+
+  void set(const NodesNotification& n);
+  void set(const MasterNotification& n);
+  void set(const QuorumNotification& n);
+  void set(const QuorumErrorNotification& n);
   wyx_proposal_t* proposal(const Proposal& p);
   wyx_leave_code_entry_t* leave_codes(const SharedLeaveCodes& codes);
   wyx_proposal_info_t* failing_request(const Request& request, const Client& client);
 
   static wyx_membership_t* fill(ProviderArray& storage, const Membership& members);
   static wyx_membership_t* fill(ProviderArray& storage, const SharedMembership& members);
+  static wyx_node_list_t* fill(NodeArray& storage, const DomainNodes& nodes);
   static wyx_state_value_t* fill(wyx_state_value_t& record, const SharedBytes& bytes);
   static wyx_group_attributes_t* fill(wyx_group_attributes_t& record, const GroupAttributes& attributes);
   static wyx_vote_results_t* fill(VoteResults& storage, const SharedVoteResults& votes);
@@ -62,11 +73,15 @@ class Records {
   wyx_subscription_notification_t subscription_;
   wyx_delayed_error_notification_t delayed_error_;
   wyx_responsiveness_notification_t ping_;
+  wyx_domain_control_notification_t domain_;
 
   wyx_proposal_t proposal_;
   wyx_proposal_info_t failing_request_;
   ProviderArray current_;
   ProviderArray changing_;
+  NodeArray current_nodes_;
+  NodeArray added_nodes_;
+  NodeArray removed_nodes_;
   std::vector<wyx_leave_code_entry_t> leave_codes_;
   wyx_leave_info_t leave_info_;
   wyx_expel_info_t expel_info_;

@@ -1,6 +1,7 @@
 // Session and requests.
 
 #include <climits>
+#include <cstdarg>
 #include <cstring>
 
 #include "client/arguments.h"
@@ -53,7 +54,14 @@ using namespace gs::client;
 wyx_rc_t wyx_setup(int version, int count, wyx_descriptor_t* descriptor, wyx_socket_ctrl_t socket_control,
                    const wyx_responsiveness_t* responsiveness, const char* deactivate_path,
                    wyx_responsiveness_cb_t* responsiveness_routine, wyx_delayed_error_cb_t* delayed_error_routine,
-                   wyx_query_cb_t*, ...) {
+                   wyx_query_cb_t* query_routine, ...) {
+  wyx_domain_control_cb_t* domain_control_routine = nullptr;
+  if (count == kArgumentsWithDomainControl) {
+    va_list rest;
+    va_start(rest, query_routine);
+    domain_control_routine = va_arg(rest, wyx_domain_control_cb_t*);
+    va_end(rest);
+  }
   return entry([&] {
     if (version < 1 || descriptor == nullptr) return WYX_BAD_PARAMETER;
     if (count != kArgumentsWithoutDomainControl && count != kArgumentsWithDomainControl) return WYX_BAD_PARAMETER;
@@ -62,7 +70,7 @@ wyx_rc_t wyx_setup(int version, int count, wyx_descriptor_t* descriptor, wyx_soc
     options.api_version = static_cast<std::uint32_t>(version);
     options.socket_control = socket_control;
     if (responsiveness != nullptr) options.responsiveness = *responsiveness;
-    options.routines = {responsiveness_routine, delayed_error_routine};
+    options.routines = {responsiveness_routine, delayed_error_routine, domain_control_routine};
     return open_session(options, descriptor);
   });
 }

@@ -170,6 +170,8 @@ Session::Step Session::deliver_next() {
     }
     case Incoming::Kind::kPing:
       return answer_ping(incoming.ping);
+    case Incoming::Kind::kDomain:
+      return deliver(*incoming.domain);
     case Incoming::Kind::kGone:
       break;
   }
@@ -220,6 +222,13 @@ Session::Step Session::deliver(Token token, const Client& client, const DelayedE
   return Step::kDelivered;
 }
 
+Session::Step Session::deliver(const DomainNotification& news) {
+  if (routines_.domain_control == nullptr) return Step::kDropped;
+  if (const auto* quorum = std::get_if<QuorumNotification>(&news)) quorum_ = *quorum;
+  routines_.domain_control(records_[level_].domain(news));
+  return Step::kDelivered;
+}
+
 /// A client without a routine for it answers by dispatching at all.
 Session::Step Session::answer_ping(std::uint64_t number) {
   if (routines_.responsiveness == nullptr) {
@@ -236,8 +245,12 @@ Session::Step Session::answer_ping(std::uint64_t number) {
   return Step::kDelivered;
 }
 
-/// Tells the next client that group services are gone; with the last one the descriptor falls silent.
+/// Without group services there is no quorum to rely on, whatever has become of them: told first, and never by a
+/// daemon, whose word might not come. Then tells the next client that group services are gone; with the last one
+/// the descriptor falls silent.
 Session::Step Session::tell_of_the_end() {
+  if (quorum_ && quorum_->now != WYX_QUORUM_STATE_NONE)
+    return deliver(QuorumNotification{0, quorum_->now, WYX_QUORUM_STATE_NONE, quorum_->seqnum});
   const auto next = registry_.take_oldest();
   if (registry_.drained() && !ended_.exchange(true)) transport_->silence();
   if (!next) return Step::kNothing;

@@ -17,6 +17,7 @@ namespace gs::client {
 struct SessionRoutines {
   wyx_responsiveness_cb_t* responsiveness = nullptr;
   wyx_delayed_error_cb_t* delayed_error = nullptr;
+  wyx_domain_control_cb_t* domain_control = nullptr;
 };
 
 /// Any thread may call any function, also from inside a callback. No lock is held while a callback runs.
@@ -39,6 +40,10 @@ class Session {
   /// Group services have gone or the session was quit.
   bool gone() { return transport_->gone(); }
   wyx_rc_t query_node(wire::NodeInfo* info) { return transport_->query_node(info); }
+  wyx_rc_t query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found) {
+    return transport_->query_adapters(query, found);
+  }
+  wyx_rc_t answer_quorum(std::uint64_t sequence) { return transport_->answer_quorum(sequence); }
 
   /// WYX_OK: `token` is a live client of this kind. WYX_BAD_MEMBER_TOKEN: it is not. WYX_NO_INIT: it is not, and
   /// group services are gone.
@@ -73,6 +78,7 @@ class Session {
   Step deliver(Token token, const Client& client, const AnnouncementNotification& n);
   Step deliver(Token token, const Client& client, const SubscriptionNotification& n);
   Step deliver(Token token, const Client& client, const DelayedErrorNotification& n);
+  Step deliver(const DomainNotification& news);
   Step answer_ping(std::uint64_t number);
   Step tell_of_the_end();
 
@@ -98,6 +104,7 @@ class Session {
   std::size_t level_ = 0;
   std::shared_ptr<Session> previous_;  // until its clients have been told
   bool gone_seen_ = false;
+  std::optional<QuorumNotification> quorum_;  // as it was told last
 };
 
 template <typename T>

@@ -49,6 +49,17 @@ std::optional<T> handshake(const char* step, Channel& channel, const wire::Clien
   return std::nullopt;
 }
 
+/// Asks without a session.
+template <typename T>
+wyx_rc_t query(const std::string& path, const wire::ClientMessage& question, T* found) {
+  wyx_rc_t rc = WYX_OK;
+  const auto channel = Channel::connect(path, &rc);
+  if (!channel) return rc;
+  auto answer = handshake<T>("query", *channel, question, &rc);
+  if (answer) *found = std::move(*answer);
+  return rc;
+}
+
 /// SIGIO for each arrival, to this process.
 void raise_signals(int fd) {
   fcntl(fd, F_SETOWN, getpid());
@@ -75,12 +86,12 @@ std::unique_ptr<SocketTransport> SocketTransport::open(const std::string& path, 
 }
 
 wyx_rc_t SocketTransport::query_node_of(const std::string& path, wire::NodeInfo* info) {
-  wyx_rc_t rc = WYX_OK;
-  const auto channel = Channel::connect(path, &rc);
-  if (!channel) return rc;
-  const auto answer = handshake<wire::NodeInfo>("query", *channel, wire::QueryNode{}, &rc);
-  if (answer) *info = *answer;
-  return rc;
+  return query(path, wire::QueryNode{}, info);
+}
+
+wyx_rc_t SocketTransport::query_adapters_of(const std::string& path, const wire::QueryAdapters& wanted,
+                                            wire::NodeAdapters* found) {
+  return query(path, wanted, found);
 }
 
 SocketTransport::SocketTransport(std::unique_ptr<Channel> requests, std::unique_ptr<Channel> events,
@@ -120,6 +131,16 @@ wyx_rc_t SocketTransport::set_responsiveness(const wire::SetResponsiveness& sett
 }
 
 wyx_rc_t SocketTransport::query_node(wire::NodeInfo* info) { return exchange(wire::QueryNode{}, info); }
+
+wyx_rc_t SocketTransport::query_adapters(const wire::QueryAdapters& wanted, wire::NodeAdapters* found) {
+  return exchange(wanted, found);
+}
+
+wyx_rc_t SocketTransport::answer_quorum(std::uint64_t sequence) {
+  wire::Answer answer;
+  const wyx_rc_t rc = exchange(wire::QuorumAnswer{sequence}, &answer);
+  return rc == WYX_OK ? answer.rc : rc;
+}
 
 Incoming SocketTransport::take() {
   for (;;) {
@@ -163,6 +184,9 @@ Incoming SocketTransport::accept(wire::ServerMessage&& message) {
   }
   if (const auto* ping = std::get_if<wire::Ping>(&message)) {
     return {Incoming::Kind::kPing, -1, nullptr, ping->number};
+  }
+  if (auto* news = std::get_if<wire::DomainControl>(&message)) {
+    return Incoming{Incoming::Kind::kDomain, -1, nullptr, 0, std::move(news->what)};
   }
   if (!std::holds_alternative<wire::Farewell>(message)) return malformed();
   lose("farewell", ECONNRESET, "the daemon stops");

@@ -17,8 +17,10 @@ class SocketTransport : public Transport {
   /// counts as gone. Null: `rc` says why.
   static std::unique_ptr<SocketTransport> open(const std::string& path, const wire::Hello& hello,
                                                int request_limit, wyx_rc_t* rc);
-  /// Asks the daemon without a session.
+  // Ask the daemon without a session.
   static wyx_rc_t query_node_of(const std::string& path, wire::NodeInfo* info);
+  static wyx_rc_t query_adapters_of(const std::string& path, const wire::QueryAdapters& query,
+                                    wire::NodeAdapters* found);
 
   SocketTransport(std::unique_ptr<Channel> requests, std::unique_ptr<Channel> events, std::uint32_t node_number);
 
@@ -26,6 +28,8 @@ class SocketTransport : public Transport {
   wyx_rc_t call(Request request) override;
   wyx_rc_t set_responsiveness(const wire::SetResponsiveness& settings) override;
   wyx_rc_t query_node(wire::NodeInfo* info) override;
+  wyx_rc_t query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found) override;
+  wyx_rc_t answer_quorum(std::uint64_t sequence) override;
   Incoming take() override;
   void answer_ping(std::uint64_t number, bool ok) override;
   void wait() override;

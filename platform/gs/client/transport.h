@@ -15,12 +15,14 @@ struct Incoming {
     kNothing,       // not now
     kNotification,  // `token`, `what`
     kPing,          // `ping`: to be answered with answer_ping
+    kDomain,        // `domain`
     kGone           // group services are gone, and nothing follows
   };
   Kind kind = Kind::kNothing;
   Token token = -1;
   std::shared_ptr<const Notification> what;
   std::uint64_t ping = 0;
+  std::shared_ptr<const DomainNotification> domain = nullptr;
 };
 
 /// Any thread may call any function, but `take` and `silence` one thread at a time. Once group services are gone
@@ -39,6 +41,8 @@ class Transport {
   virtual wyx_rc_t call(Request request) = 0;
   virtual wyx_rc_t set_responsiveness(const wire::SetResponsiveness& settings) = 0;
   virtual wyx_rc_t query_node(wire::NodeInfo* info) = 0;
+  virtual wyx_rc_t query_adapters(const wire::QueryAdapters& query, wire::NodeAdapters* found) = 0;
+  virtual wyx_rc_t answer_quorum(std::uint64_t sequence) = 0;
 
   virtual Incoming take() = 0;
   virtual void answer_ping(std::uint64_t number, bool ok) = 0;

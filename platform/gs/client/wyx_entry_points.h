@@ -15,7 +15,7 @@
 //
 // A session ends when the daemon dies, says what makes no sense or leaves a request unanswered for
 // GSD_REQUEST_LIMIT seconds (see wyx_api.h): requests under way and to come answer WYX_NO_INIT, what had arrived
-// before is still handed out, then every provider gets the announcement WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY and
+// before is still handed out, then who is told of quorum is told that there is none, every provider gets the announcement WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY and
 // every subscriber WYX_SUBSCRIPTION_GS_HAS_DIED, in the order of their tokens. The descriptor stays valid, and is
 // no longer readable, until wyx_quit or the next wyx_setup.
 //
@@ -33,11 +33,13 @@
 /// Opens the session. GSD_ENDPOINT in the environment chooses the daemon: "unix:/path" of its socket, "embedded:"
 /// for group services inside this process, with no daemon and for this process alone; without it the default path.
 /// `version` is the base API's version that the caller was built for, at least 1. `count` is the number of
-/// arguments after it: 7, or 8 with a domain-control routine at the end, which is not read, since there are no
-/// domain events.
+/// arguments after it: 7, or 8 with a domain-control routine (wyx_domain_control_cb_t) at the end.
 /// `*descriptor` is then readable exactly when wyx_dispatch has something to hand out (half a message may show for
 /// a moment); it stays the library's. `socket_control`: WYX_SOCKET_SIGNAL raises SIGIO for each arrival from a
-/// daemon; the other flags change nothing. `responsiveness` as for wyx_change_responsiveness; null: none.
+/// daemon; with a domain-control routine WYX_ENABLE_DOMAIN_EVENT has it told of the domain's nodes and master,
+/// WYX_ENABLE_OPQUORUM_CALLBACK of quorum, and WYX_ENABLE_OPQUORUM_ACK_REQUIRED beside that one makes these
+/// notifications ask for an answer: how it is, once, then each change; docs/group-services.md says what is in them.
+/// The other flags change nothing. `responsiveness` as for wyx_change_responsiveness; null: none.
 /// `deactivate_path` is accepted and not used. A routine that is null gets nothing; there are no query
 /// notifications.
 /// WYX_EXISTS: there is a session. Connecting and each step of the greeting wait ten seconds for
@@ -84,8 +86,8 @@ WYX_ENTRY wyx_rc_t wyx_vote(wyx_token_t provider, wyx_vote_value_t vote, const w
 WYX_ENTRY wyx_rc_t wyx_subscribe(wyx_token_t* token, const wyx_proposal_info_t* request);
 WYX_ENTRY wyx_rc_t wyx_unsubscribe(wyx_token_t subscriber);
 
-// Queries. They need no session; the first two then ask the daemon over a connection of their own, and answer
-// WYX_CONNECT_FAILED when there is none.
+// Queries. They need no session; the first two, and that of an address that is not this host's, then ask the daemon
+// over a connection of their own. The first two answer WYX_CONNECT_FAILED when there is none.
 WYX_ENTRY wyx_rc_t wyx_get_node_number(int* node_number);
 WYX_ENTRY wyx_rc_t wyx_get_domain_master_node_number(int* node_number);
 WYX_ENTRY wyx_rc_t wyx_get_limits(wyx_limits* limits);
@@ -101,14 +103,14 @@ WYX_ENTRY wyx_rc_t wyx_get_ffdc_id(char* buffer);
 /// live as long as the process. WYX_NULL_ADAPTER_INFO: `info` is null. WYX_ADAPTER_INFO_NOT_FOUND: no such
 /// interface.
 WYX_ENTRY wyx_rc_t wyx_get_adapter_info(wyx_adapter_info* info);
-/// The adapter with this address (IPv4: a filler of zeros, or IPv6-mapped). WYX_BAD_INPUT_IP_FORMAT: null, or no
-/// address that an interface can have.
+/// The adapter with this address (IPv4: a filler of zeros, or IPv6-mapped), of this host or of another one of the
+/// domain. WYX_BAD_INPUT_IP_FORMAT: null, or no address that an interface can have.
 WYX_ENTRY wyx_rc_t wyx_get_adapter_info_by_addr(const wyx_ip_addr* address, wyx_adapter_info* info);
-/// The adapter of a provider's host; `token` is any provider of this session. Only this host's adapters are known:
-/// WYX_ADAPTER_INFO_NOT_FOUND for a provider of another.
+/// The adapter of a provider's host, chosen as this host's, but never a loopback of another; `token` is any
+/// provider of this session. WYX_ADAPTER_INFO_NOT_FOUND: the host is not in the domain, or none of it is known.
 WYX_ENTRY wyx_rc_t wyx_get_adapter_info_by_id(wyx_token_t token, const wyx_provider_t* provider,
                                               wyx_adapter_info* info);
-/// The IPv4 address of the same. WYX_NO_IPV4_ADDRESS_FOR_THE_ID: none, or a provider of another host.
+/// The IPv4 address of the same. WYX_NO_IPV4_ADDRESS_FOR_THE_ID: none is known.
 WYX_ENTRY wyx_rc_t wyx_get_ipaddr_by_id(wyx_token_t token, const wyx_provider_t* provider, wyx_ip_addr* address);
 
 // Not supported: each answers WYX_NOT_SUPPORTED, whatever it is given.
@@ -119,6 +121,12 @@ WYX_ENTRY wyx_rc_t wyx_migrate_to_pell_prep();
 WYX_ENTRY wyx_rc_t wyx_migrate_to_pell_commit();
 WYX_ENTRY wyx_rc_t wyx_migrate_to_pell_abort();
 WYX_ENTRY wyx_rc_t wyx_migrate_vote(wyx_migration_vote_t vote);
+
+/// With WYX_PRIV_MSG_OPQUORUM: answers the quorum notification whose sequence is in `data`, a wyx_quorum_resp_t of
+/// `length` bytes. Refused: WYX_BAD_QUORUM_MSG_SEQNUM, another one waits for its answer; WYX_UNEXPECTED_QUORUM_RESP,
+/// none does; WYX_NOT_REGISTERED_FOR_SYNC_QUORUM, the session has not asked for such. A session that is told of
+/// quorum gets the refusal also as WYX_DOMAINCB_RESP_ERR_INFO. Nothing waits for an answer. Other messages:
+/// WYX_NOT_SUPPORTED.
 WYX_ENTRY wyx_rc_t wyx_internal_send_domain_msg_to_gsd(wyx_priv_channel_msg_type_t type, void* data,
                                                        uint64_t length);
 

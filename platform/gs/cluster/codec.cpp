@@ -59,6 +59,12 @@ std::string problem(const TimerExpiredEvent& e) {
 }
 std::string problem(const ResponsivenessEvent& e) { return problem(e.session); }
 std::string problem(const ContinueEvent&) { return {}; }
+std::string problem(const AdaptersEvent& e) {
+  if (!is_node(e.node)) return kNoNode;
+  if (e.adapters.size() > kMaxAdapters) return "more adapters than there may be";
+  const auto fits = [](const Adapter& adapter) { return is_adapter_name(adapter.name); };
+  return std::ranges::all_of(e.adapters, fits) ? "" : "a name that no adapter has";
+}
 std::string problem(const NumbersEvent&) { return "an event that follows from an exchange, and is not sent"; }
 
 // ------------------------------------------------------------------------------------------------ messages

@@ -12,7 +12,7 @@
 
 namespace gs::cluster {
 
-inline constexpr std::size_t kMaxNodes = 512;           // in any list
+inline constexpr std::size_t kMaxNodes = kMaxHosts;     // in any list
 inline constexpr std::size_t kMaxVotes = 1 << 22;       // of a host, so that the sum of all is a number of 32 bits
 inline constexpr std::size_t kMaxPiece = 512 * 1024;    // bytes
 inline constexpr std::size_t kMaxAddress = 256;         // bytes; also of a key

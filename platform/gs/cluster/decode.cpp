@@ -86,6 +86,12 @@ class Reader {
     return RequestEvent{value(e.session()), std::move(*request), e.answered(), e.user()};
   }
 
+  std::optional<Event> adapters_event(const fb::HasAdapters& e) {
+    auto adapters = wire::detail::read_adapters(*e.adapters(), message_size_, error_);
+    if (!adapters) return std::nullopt;
+    return AdaptersEvent{e.node(), std::move(*adapters)};
+  }
+
   const std::size_t message_size_;
   std::string* const error_;
 };
@@ -109,6 +115,8 @@ std::optional<Event> Reader::event(const fb::Ordered& m) {
                                  m.event_as_Responsiveness()->responding()};
     case fb::Event::Continue:
       return ContinueEvent{};
+    case fb::Event::HasAdapters:
+      return adapters_event(*m.event_as_HasAdapters());
     case fb::Event::NONE:
       break;
   }

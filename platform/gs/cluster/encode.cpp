@@ -56,6 +56,10 @@ EventBody body(Builder& b, const ResponsivenessEvent& e) {
   return {fb::Event::Responsiveness, fb::CreateResponsiveness(b, &session, e.responding).Union()};
 }
 EventBody body(Builder& b, const ContinueEvent&) { return {fb::Event::Continue, fb::CreateContinue(b).Union()}; }
+EventBody body(Builder& b, const AdaptersEvent& e) {
+  const auto adapters = wire::detail::put_adapters(b, e.adapters);
+  return {fb::Event::HasAdapters, fb::CreateHasAdapters(b, e.node, adapters).Union()};
+}
 EventBody body(Builder&, const NumbersEvent&) { return {fb::Event::NONE, 0}; }  // problem_with has refused it
 
 // ------------------------------------------------------------------------------------------------ messages

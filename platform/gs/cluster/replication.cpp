@@ -2,16 +2,19 @@
 
 #include <algorithm>
 #include <iterator>
+#include <ranges>
 #include <utility>
 
 namespace gs::cluster {
 namespace {
 
-/// A daemon speaks for its own clients, and of hosts nobody speaks: they come and go by the decisions.
+/// A daemon speaks for its own clients and adapters, and of hosts nobody speaks: they come and go by the
+/// decisions.
 bool may_order(Node from, const Event& event) {
   if (const auto* request = std::get_if<RequestEvent>(&event)) return request->session.node == from;
   if (const auto* gone = std::get_if<SessionGoneEvent>(&event)) return gone->session.node == from;
   if (const auto* ping = std::get_if<ResponsivenessEvent>(&event)) return ping->session.node == from;
+  if (const auto* adapters = std::get_if<AdaptersEvent>(&event)) return adapters->node == from;
   return std::holds_alternative<TimerExpiredEvent>(event) || std::holds_alternative<ContinueEvent>(event);
 }
 
@@ -327,7 +330,8 @@ void Replication::apply_confirmed() {
   }
 }
 
-/// Who is there is what the engine knows: whose life does not go on has failed, whatever came before.
+/// Who is there is what the engine knows: whose life does not go on has failed, whatever came before. The lowest
+/// goes last, so that none becomes the master that goes as well.
 void Replication::apply(const Decision& decision) {
   const Lives before = std::exchange(own_.hosts, decision.holders);
   const auto apply = [this](const Event& event) {
@@ -336,7 +340,7 @@ void Replication::apply(const Decision& decision) {
   const auto goes_on = [&](const auto& host) { return has(decision.holders, host.first, host.second); };
   const bool somebody_gone = before.empty() || !std::ranges::all_of(before, goes_on);
   if (somebody_gone && keeps(Rule::kNumbersGoOn)) apply(NumbersEvent{decision.numbers});
-  for (const auto& host : before) {
+  for (const auto& host : before | std::views::reverse) {
     if (goes_on(host) || (!keeps(Rule::kHostsAreState) && !decision.left.contains(host.first))) continue;
     const auto code = decision.left.find(host.first);
     apply(HostGoneEvent{host.first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});

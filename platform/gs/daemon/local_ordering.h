@@ -13,12 +13,12 @@ class LocalOrdering : public Ordering {
 
   void start(Replica& replica) override {
     replica_ = &replica;
-    replica_->serve(domain_);
+    serve();
   }
   void fail(const std::string& why) override {
     waiting_.clear();  // of clients that are no more
     replica_->reset(why);
-    replica_->serve(domain_);
+    serve();
   }
   bool will_serve() const override { return true; }
 
@@ -36,6 +36,11 @@ class LocalOrdering : public Ordering {
   }
 
  private:
+  void serve() {
+    replica_->apply(HostCameEvent{domain_.self});
+    replica_->serve(domain_);
+  }
+
   /// Also over when the replica throws.
   struct Turn {
     bool& delivering;

@@ -12,6 +12,7 @@
 #include <stdexcept>
 #include <system_error>
 
+#include "common/interfaces.h"
 #include "common/random_number.h"
 #include "daemon/corosync_ordering.h"
 #include "daemon/local_ordering.h"
@@ -69,6 +70,16 @@ std::size_t descriptors_for_clients() {
 ClientLimits limits_of(const Options& options) {
   return {options.max_sessions,      options.user_sessions,    options.root_sessions,
           descriptors_for_clients(), options.user_queue_bound, options.total_queue_bound};
+}
+
+/// Those that other hosts can reach this one by.
+Adapters adapters_of_host() {
+  Adapters found;
+  for (auto& one : platform::interfaces()) {
+    if (found.size() == kMaxAdapters) break;
+    if (!one.loopback && is_adapter_name(one.name)) found.push_back({std::move(one.name), one.address});
+  }
+  return found;
 }
 
 /// The default path's directory is the daemon's own.
@@ -149,7 +160,7 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
                  .limits = limits_of(options),
                  .engine = options.engine},
                 {*this, *ordering_, now, random_number, log_, [this] { add(continue_.get(), &kAtOnce); },
-                 [] { malloc_trim(0); }}),
+                 [] { malloc_trim(0); }, options.corosync ? adapters_of_host : nullptr}),
       packet_(wire::kMaxPacket + 1) {
   if (!base_) throw std::bad_alloc();
   memory_reserve::hold();

@@ -151,7 +151,7 @@ void SessionLayer::on_message(ConnectionId id, Connection& connection, wire::Cli
 void SessionLayer::on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message) {
   if (const auto* hello = std::get_if<wire::Hello>(&message)) return on_hello(id, connection, *hello);
   if (const auto* attach = std::get_if<wire::Attach>(&message)) return on_attach(id, connection, *attach);
-  if (std::holds_alternative<wire::QueryNode>(message)) return on_query_node(id);
+  if (on_query(id, message)) return;
   end(id, End::kFault, "out of order: neither Hello nor Attach came first");
 }
 
@@ -160,7 +160,10 @@ void SessionLayer::on_request_channel(ConnectionId id, Connection& connection, w
   if (const auto* wanted = std::get_if<wire::SetResponsiveness>(&message)) {
     return answer(id, find_session(connection.session)->pinger.set(*wanted));
   }
-  if (std::holds_alternative<wire::QueryNode>(message)) return on_query_node(id);
+  if (const auto* answer = std::get_if<wire::QuorumAnswer>(&message)) {
+    return on_quorum_answer(id, connection, *answer);
+  }
+  if (on_query(id, message)) return;
   if (!std::holds_alternative<wire::Quit>(message)) {
     return end(id, End::kFault, "out of order: a message not for the request channel");
   }
@@ -206,6 +209,7 @@ void SessionLayer::begin_session(ConnectionId id, Connection& connection, const 
   connection.session = number;
   session.request = id;
   session.cookie = env_.random();
+  session.domain = DomainListener(hello.socket_control);
   session.program = printable(hello.program);
   session.program.resize(platform::utf8_length(std::string_view(session.program).substr(0, kProgramName)));
   session.attach_limit = timers_.arm(env_.now() + settings_.handshake_limit, [this, number] {
@@ -228,7 +232,10 @@ void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire
   find(session->request)->share.settle();
   session->event = id;
   log_about(connection.peer.uid, spdlog::level::info, describe(connection) + ": connected");
-  answer(id, WYX_OK);
+  const auto greeting = session->domain.greeting(engine_->domain());
+  answer(id, WYX_OK);  // may end the session
+  for (const DomainNotification& news : greeting)
+    tell_of_domain(attach.session_number, packets_of(news), true);
 }
 
 void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& call) {
@@ -242,9 +249,46 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& 
       RequestEvent{id_of(connection.session), std::move(call.request), false, connection.peer.uid});
 }
 
+/// A refusal is also told where quorum is told: who answers need not be who looks at the result.
+void SessionLayer::on_quorum_answer(ConnectionId id, const Connection& connection,
+                                    const wire::QuorumAnswer& quorum_answer) {
+  const std::uint64_t number = connection.session;
+  Session* session = find_session(number);
+  if (session->event == 0) return end(id, End::kFault, "out of order: an answer before its event channel");
+  const wyx_rc_t rc = session->domain.answered(quorum_answer.sequence);
+  const DomainNotification refusal = QuorumErrorNotification{quorum_answer.sequence, rc};
+  if (rc != WYX_OK && session->domain.hears(refusal)) tell_of_domain(number, packets_of(refusal), true);
+  answer(id, rc);
+}
+
+/// False: it is none.
+bool SessionLayer::on_query(ConnectionId id, const wire::ClientMessage& message) {
+  const auto* adapters = std::get_if<wire::QueryAdapters>(&message);
+  if (adapters == nullptr && !std::holds_alternative<wire::QueryNode>(message)) return false;
+  if (!serving_)
+    answer(id, WYX_CONNECT_FAILED);
+  else if (adapters != nullptr)
+    on_query_adapters(id, *adapters);
+  else
+    on_query_node(id);
+  return true;
+}
+
 void SessionLayer::on_query_node(ConnectionId id) {
-  if (!serving_) return answer(id, WYX_CONNECT_FAILED);
-  send(id, wire::NodeInfo{domain_.self, domain_.nodes.front()});
+  send(id, wire::NodeInfo{domain_.self, engine_->hosts().begin()->first});
+}
+
+void SessionLayer::on_query_adapters(ConnectionId id, const wire::QueryAdapters& query) {
+  const auto& hosts = engine_->hosts();
+  if (!query.address) {
+    const auto host = hosts.find(query.node);
+    return send(id, wire::NodeAdapters{query.node, host == hosts.end() ? Adapters() : host->second.adapters});
+  }
+  for (const auto& [node, host] : hosts) {
+    const auto found = std::ranges::find(host.adapters, *query.address, &Adapter::address);
+    if (found != host.adapters.end()) return send(id, wire::NodeAdapters{node, {*found}});
+  }
+  send(id, wire::NodeAdapters{});
 }
 
 // ----------------------------------------------------------------------------------------------------- pingers
@@ -296,6 +340,7 @@ void SessionLayer::deliver(const Event& event, const Outcome& outcome) {
   const auto* request = std::get_if<RequestEvent>(&event);
   const SessionId asker = request != nullptr ? request->session : SessionId{};
   sent_at_once_ = 0;
+  for (const DomainNotification& news : outcome.domain) tell_of_domain(news);
   if (request != nullptr) {
     deliver_to(outcome.deliveries, [&](const Delivery& d) { return d.to.session == asker; });
     if (!request->answered) answer_request(asker, outcome.rc);
@@ -323,6 +368,29 @@ std::shared_ptr<Outgoing> SessionLayer::outgoing_of(const std::shared_ptr<const 
   return last_outgoing_;
 }
 
+void SessionLayer::tell_of_domain(const DomainNotification& news) {
+  std::vector<std::uint64_t> listeners;
+  for (const auto& [number, session] : sessions_)
+    if (session.event != 0 && session.domain.hears(news)) listeners.push_back(number);
+  if (listeners.empty()) return;
+  const wire::Encoded packets = packets_of(news);
+  for (const std::uint64_t number : listeners) {
+    const bool at_once = sent_at_once_ < kEventShare;
+    if (at_once) sent_at_once_ += packets.size();
+    tell_of_domain(number, packets, at_once);
+  }
+}
+
+void SessionLayer::tell_of_domain(std::uint64_t number, const wire::Encoded& news, bool at_once) {
+  const Session* session = find_session(number);
+  if (session == nullptr) return;
+  try {
+    put(session->event, {news}, at_once);
+  } catch (const std::exception& error) {
+    end_session(number, End::kFault, std::string("it could not be told of the domain: ") + error.what());
+  }
+}
+
 /// To clear a table costs what it once held: after a large outcome a new one.
 void SessionLayer::forget_outgoing() {
   last_outgoing_.reset();
@@ -343,7 +411,17 @@ void SessionLayer::serve(const Domain& domain) {
   last_session_ = std::max(last_session_, domain.sessions_above);
   for (const TimerRequest& timer : engine_->running_phases()) arm(timer);
   continue_later();
+  if (env_.adapters) look_at_adapters_ = timers_.arm(env_.now(), [this] { publish_adapters(); });
   answer_hellos();
+}
+
+/// Whenever they are other ones than the others know.
+void SessionLayer::publish_adapters() {
+  look_at_adapters_ = timers_.arm(env_.now() + kBetweenAdapterLooks, [this] { publish_adapters(); });
+  Adapters now = env_.adapters();
+  if (published_ == now) return;
+  env_.ordering.submit(AdaptersEvent{domain_.self, now});
+  published_ = std::move(now);
 }
 
 bool SessionLayer::restore(const std::vector<std::byte>& snapshot, std::string* error) {
@@ -364,6 +442,8 @@ void SessionLayer::reset(const std::string& why) {
 
 void SessionLayer::forget_sessions() {
   serving_ = false;
+  timers_.cancel(look_at_adapters_);
+  published_.reset();
   while (!sessions_.empty()) {
     const ConnectionId request = sessions_.begin()->second.request, event = sessions_.begin()->second.event;
     timers_.cancel(sessions_.begin()->second.attach_limit);

@@ -6,12 +6,13 @@
 //
 // A connection's life, as state x message -> what happens; any other message closes the connection as malformed:
 //
-//   state     Hello              Attach             Call        SetResp.    QueryNode  PingAnswer  Quit
-//   fresh     Welcome->request   Answer->event      close       close       NodeInfo   close       close
-//   request   close              close              Answer (1)  Answer      NodeInfo   close       Answer, end
+//   state     Hello              Attach             Call (2)    SetResp.    Query (3)  PingAnswer  Quit
+//   fresh     Welcome->request   Answer->event      close       close       answer     close       close
+//   request   close              close              Answer (1)  Answer      answer     close       Answer, end
 //   event     close              close              close       close       close      noted       close
 //
 //   (1) once the session's event channel is attached; before that: close.
+//   (2) or QuorumAnswer. (3) QueryNode: NodeInfo. QueryAdapters: NodeAdapters.
 //
 // A Hello waits while the ordering does not serve but will; where there is no hope of that it is refused.
 //
@@ -40,6 +41,7 @@
 #include "daemon/pinger.h"
 #include "daemon/timers.h"
 #include "daemon/transport.h"
+#include "engine/domain_listener.h"
 #include "engine/engine.h"
 #include "wire/codec.h"
 
@@ -64,6 +66,8 @@ class SessionLayer : private PingSink, private Replica {
     std::shared_ptr<spdlog::logger> log;
     std::function<void()> continue_soon;          // asks for one call of continue_work, after what else is ready
     std::function<void()> return_memory = [] {};  // that was freed, to the system
+    std::function<Adapters()> adapters =
+        nullptr;  // of this host, as they are now; null: the others are told of none
   };
 
   SessionLayer(const Settings& settings, Environment environment);
@@ -145,6 +149,7 @@ class SessionLayer : private PingSink, private Replica {
     std::uint64_t cookie = 0;
     std::string program;
     bool answer_due = false;  // of a Call that is being ordered
+    DomainListener domain;
     Timers::Id attach_limit;
     SessionShare share;
     Pinger pinger;
@@ -164,6 +169,7 @@ class SessionLayer : private PingSink, private Replica {
   static constexpr Duration kBetweenPhaseLooks{10'000};
   static constexpr std::size_t kNamedVoters = 8;
   static constexpr Duration kBetweenRanks{50};
+  static constexpr Duration kBetweenAdapterLooks{30'000};
   static constexpr std::size_t kProgramName = 64;                   // bytes of it that the log shows
   static constexpr std::size_t kFlushShare = 64 * 1024;             // bytes to one client before others are served
   static constexpr std::size_t kEventShare = 128 * 1024;            // bytes of one event that are sent at once
@@ -185,7 +191,10 @@ class SessionLayer : private PingSink, private Replica {
   void answer_hellos();
   void on_attach(ConnectionId id, Connection& connection, const wire::Attach& attach);
   void on_call(ConnectionId id, Connection& connection, wire::Call& call);
+  void on_quorum_answer(ConnectionId id, const Connection& connection, const wire::QuorumAnswer& answer);
+  bool on_query(ConnectionId id, const wire::ClientMessage& message);
   void on_query_node(ConnectionId id);
+  void on_query_adapters(ConnectionId id, const wire::QueryAdapters& query);
 
   // Of the pingers.
   void send_ping(std::uint64_t session, std::uint64_t ping) override;
@@ -208,6 +217,11 @@ class SessionLayer : private PingSink, private Replica {
   void deliver_to(const std::vector<Delivery>& deliveries, Wanted wanted);
   void deliver_run();
   std::shared_ptr<Outgoing> outgoing_of(const std::shared_ptr<const Notification>& what);
+  void tell_of_domain(const DomainNotification& news);
+  void tell_of_domain(std::uint64_t session, const wire::Encoded& news, bool at_once);
+  static wire::Encoded packets_of(const DomainNotification& news) {
+    return wire::encode(wire::DomainControl{std::make_shared<const DomainNotification>(news)});
+  }
   void forget_outgoing();
   void deliver_to_session(std::span<const Delivery* const> to, const std::shared_ptr<Outgoing>& what);
   void continue_later();
@@ -216,6 +230,7 @@ class SessionLayer : private PingSink, private Replica {
   void drop_stale_timers();
   bool drop_if_stale(PhaseTimers::iterator& at);
   PhaseTimers::iterator after(const std::string& group);
+  void publish_adapters();
   void look_at_phases();
   void look_at_phases_later();
   void warn_of_missing_votes(const std::string& group, Duration waited);
@@ -261,8 +276,10 @@ class SessionLayer : private PingSink, private Replica {
   std::unordered_map<std::uint64_t, Session> sessions_;
   PhaseTimers phase_timers_;  // those of ended phases included
   Timers::Id look_at_phases_;
-  std::string looked_at_;  // the group that was looked at last, empty: all were
-  std::string swept_;      // the same, for its timer to be dropped
+  Timers::Id look_at_adapters_;
+  std::optional<Adapters> published_;  // by this host in this life; nothing: none yet
+  std::string looked_at_;              // the group that was looked at last, empty: all were
+  std::string swept_;                  // the same, for its timer to be dropped
   // Of the outcome being delivered.
   std::unordered_map<const Notification*, std::shared_ptr<Outgoing>> outgoing_;
   std::shared_ptr<Outgoing> last_outgoing_;

@@ -68,6 +68,7 @@ struct Engine::State : EngineState {
   void apply(const ResponsivenessEvent& event, Outcome& out);
   void apply(const ContinueEvent& event, Outcome& out);
   void apply(const NumbersEvent& event, Outcome& out);
+  void apply(const AdaptersEvent& event, Outcome& out);
 
   void lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out);
   void settle(Groups::iterator group, Outcome& out);
@@ -78,7 +79,7 @@ struct Engine::State : EngineState {
 // ------------------------------------------------------------------------------------------------------ checks
 
 wyx_rc_t Engine::State::check(const Payer& from, const Request& request) const {
-  if (gone_hosts.contains(from.session.node)) return WYX_NO_INIT;
+  if (hosts.is_gone(from.session.node)) return WYX_NO_INIT;
   return std::visit([&](const auto& r) { return check(from, r); }, request);
 }
 
@@ -185,7 +186,7 @@ void Engine::State::apply(const RequestEvent& event, Outcome& out) {
     std::visit([&](const auto& r) { perform(from, r, out); }, event.request);
     return;
   }
-  if (!event.answered || gone_hosts.contains(event.session.node)) return;
+  if (!event.answered || hosts.is_gone(event.session.node)) return;
   const Token token = std::visit([](const auto& r) { return r.token; }, event.request);
   std::shared_ptr<const GroupAttributes> reason;
   const auto* join = std::get_if<JoinRequest>(&event.request);
@@ -260,12 +261,16 @@ void Engine::State::apply(const SessionGoneEvent& event, Outcome& out) {
 }
 
 void Engine::State::apply(const HostGoneEvent& event, Outcome& out) {
-  gone_hosts.insert(event.node);
+  hosts.go(event.node, numbers_above, out.domain);
   const auto code = event.leave_code != 0 ? event.leave_code : std::uint32_t{WYX_HOST_FAILURE};
   lose_clients({event.node, 0}, {event.node, std::numeric_limits<std::uint64_t>::max()}, code, out);
 }
 
-void Engine::State::apply(const HostCameEvent& event, Outcome&) { gone_hosts.erase(event.node); }
+void Engine::State::apply(const HostCameEvent& event, Outcome& out) {
+  hosts.come(event.node, numbers_above, out.domain);
+}
+
+void Engine::State::apply(const AdaptersEvent& event, Outcome&) { hosts.set_adapters(event); }
 
 void Engine::State::apply(const TimerExpiredEvent& event, Outcome& out) {
   auto it = groups.find(event.timer.group);
@@ -368,6 +373,10 @@ std::vector<TimerRequest> Engine::running_phases() const {
   return timers;
 }
 
+DomainView Engine::domain() const { return state_->hosts.view(); }
+
+const std::map<std::uint32_t, DomainHost>& Engine::hosts() const { return state_->hosts.here(); }
+
 std::size_t Engine::kept_bytes() const { return state_->ledger.total(); }
 
 MissingVotes Engine::missing_votes(const std::string& name, std::size_t at_most) const {
@@ -406,7 +415,7 @@ std::uint64_t Engine::digest() const {
   Digest digest;
   digest.add(state_->last_protocol);
   digest.add(state_->numbers_above);
-  for (std::uint32_t node : state_->gone_hosts) digest.add(node);
+  state_->hosts.add_to(digest);
   digest.add(state_->ledger.total());
   for (const std::string& name : state_->line) digest.add(name);
   for (const auto& [session, clients] : state_->clients.sessions()) {

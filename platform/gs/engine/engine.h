@@ -13,10 +13,12 @@
 #pragma once
 
 #include <cstddef>
+#include <map>
 #include <memory>
 #include <string>
 #include <vector>
 
+#include "engine/hosts.h"
 #include "engine/limits.h"
 #include "engine/types.h"
 
@@ -44,6 +46,10 @@ class Engine {
 
   /// A timer for each phase that runs, as an engine that has been restored is asked to arm.
   std::vector<TimerRequest> running_phases() const;
+
+  /// The hosts that have come and not gone.
+  DomainView domain() const;
+  const std::map<std::uint32_t, DomainHost>& hosts() const;
 
   /// Bytes of what is kept for sessions (see ledger.h).
   std::size_t kept_bytes() const;

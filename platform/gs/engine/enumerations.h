@@ -30,6 +30,10 @@ constexpr bool known(wyx_notification_type_t*, int value) {
   return value >= WYX_N_PHASE_NOTIFICATION && value <= WYX_REJECTED_NOTIFICATION;
 }
 
+constexpr bool known(wyx_quorum_state_t*, int value) {
+  return value >= WYX_QUORUM_STATE_HAS && value <= WYX_QUORUM_STATE_NONE;
+}
+
 /// A node's number is that of its providers' ids.
 inline constexpr std::uint32_t kMaxNodeNumber = INT16_MAX;
 

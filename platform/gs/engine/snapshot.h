@@ -14,7 +14,7 @@
 namespace gs {
 
 /// The FlatBuffer's identifier; the digits are the version.
-inline constexpr char kSnapshotId[] = "GE01";
+inline constexpr char kSnapshotId[] = "GE02";
 
 /// Nothing: there is more than a FlatBuffer can hold.
 std::vector<std::byte> write_snapshot(const EngineState& state);

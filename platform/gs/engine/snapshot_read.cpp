@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <cstring>
 
 #include "engine/snapshot.h"
@@ -24,7 +25,7 @@ bool SnapshotInput::attributes(const fb::Attributes* from, const std::string& gr
 
 bool enter_client(SnapshotInput& in, EngineState& state, const Endpoint& who, Client client) {
   if (!in.require(who.token >= 0, "a token below 0") ||
-      !in.require(!state.gone_hosts.contains(who.session.node), "a client of a host that is gone") ||
+      !in.require(!state.hosts.is_gone(who.session.node), "a client of a host that is gone") ||
       !in.require(state.clients.find(who) == nullptr, "a token that is in use already") ||
       !in.require(state.clients.of(who.session).size() < kMaxSessionClients, "a session with too many clients"))
     return false;
@@ -39,11 +40,35 @@ bool same_limits(const fb::Limits& a, const Limits& b) {
          a.total_bytes() == b.total_bytes && a.max_phase_time() == b.max_phase_time;
 }
 
-bool read_gone_hosts(SnapshotInput& in, const fb::Snapshot& from, EngineState& into) {
+bool read_adapters(SnapshotInput& in, const fb::Host& from, Adapters& into) {
+  if (!in.require(from.adapters()->size() <= kMaxAdapters, "a host with too many adapters")) return false;
+  for (const fb::Adapter* adapter : *from.adapters()) {
+    Adapter& read = into.emplace_back();
+    if (!in.take_table() || !in.name(adapter->name(), kMaxAdapterName, read.name) ||
+        !in.require(is_adapter_name(read.name), "a name that no adapter has") ||
+        !in.require(adapter->address()->size() == read.address.size(), "an address that is none"))
+      return false;
+    std::copy(adapter->address()->begin(), adapter->address()->end(), read.address.begin());
+  }
+  return true;
+}
+
+bool read_hosts(SnapshotInput& in, const fb::Snapshot& from, EngineState& into) {
+  std::set<std::uint32_t> gone;
   for (const std::uint32_t node : *from.gone_hosts()) {
     if (!in.take(sizeof node)) return false;
-    if (!into.gone_hosts.insert(node).second) return in.fail("a host that is gone twice");
+    if (!gone.insert(node).second) return in.fail("a host that is gone twice");
   }
+  HostTable::Hosts here;
+  for (const fb::Host* host : *from.hosts()) {
+    if (!in.take_table() || !in.require(here.size() < kMaxHosts, "more hosts than there may be") ||
+        !in.require(!gone.contains(host->node()), "a host that is here and gone"))
+      return false;
+    const auto [entry, is_new] = here.try_emplace(host->node(), DomainHost{host->epoch(), {}});
+    if (!in.require(is_new, "a host that is here twice") || !read_adapters(in, *host, entry->second.adapters))
+      return false;
+  }
+  into.hosts = HostTable(std::move(here), std::move(gone), from.hosts_seqnum());
   return true;
 }
 
@@ -156,7 +181,7 @@ bool read_snapshot(const std::vector<std::byte>& snapshot, EngineState& into, st
     return in.fail("made under other limits: set the same on all hosts");
   into.last_protocol = from->last_protocol();
   into.numbers_above = from->numbers_above();
-  return read_gone_hosts(in, *from, into) && read_groups(in, *from, into) && read_line(in, *from, into) &&
+  return read_hosts(in, *from, into) && read_groups(in, *from, into) && read_line(in, *from, into) &&
          read_subscriptions(in, *from, into) &&
          in.require(into.ledger.within_limits(), "more than its limits allow to be kept");
 }

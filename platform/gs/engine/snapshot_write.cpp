@@ -56,6 +56,17 @@ Offset<fb::Subscriptions> put(Builder& b, const std::string& group, const Subscr
   return fb::CreateSubscriptions(b, name, offsets);
 }
 
+Offset<fb::Host> put(Builder& b, std::uint32_t node, const DomainHost& host) {
+  Offsets<fb::Adapter> adapters;
+  for (const Adapter& adapter : host.adapters) {
+    const auto name = b.CreateString(adapter.name);
+    const auto address = b.CreateVector(adapter.address.data(), adapter.address.size());
+    adapters.push_back(fb::CreateAdapter(b, name, address));
+  }
+  const auto offsets = b.CreateVector(adapters);
+  return fb::CreateHost(b, node, host.epoch, offsets);
+}
+
 }  // namespace
 
 /// One group. Indices are given out in an order that follows from the state alone.
@@ -197,11 +208,14 @@ std::vector<std::byte> write_snapshot(const EngineState& state) {
   const auto group_offsets = b.CreateVector(groups);
   const auto line_offset = b.CreateVector(line);
   const auto subscription_offsets = b.CreateVector(subscriptions);
-  const auto gone_hosts =
-      b.CreateVector(std::vector<std::uint32_t>(state.gone_hosts.begin(), state.gone_hosts.end()));
+  const auto& gone = state.hosts.gone();
+  const auto gone_hosts = b.CreateVector(std::vector<std::uint32_t>(gone.begin(), gone.end()));
+  Offsets<fb::Host> hosts;
+  for (const auto& [node, host] : state.hosts.here()) hosts.push_back(put(b, node, host));
+  const auto host_offsets = b.CreateVector(hosts);
   b.Finish(fb::CreateSnapshot(b, limits, group_offsets, line_offset, subscription_offsets,
-                              state.subscribers.last_subscription(), gone_hosts, state.last_protocol,
-                              state.numbers_above),
+                              state.subscribers.last_subscription(), gone_hosts, host_offsets,
+                              state.hosts.seqnum(), state.last_protocol, state.numbers_above),
            kSnapshotId);
   const auto* bytes = reinterpret_cast<const std::byte*>(b.GetBufferPointer());
   return {bytes, bytes + b.GetSize()};

@@ -3,11 +3,11 @@
 
 #include <deque>
 #include <map>
-#include <set>
 #include <string>
 
 #include "engine/clients.h"
 #include "engine/group.h"
+#include "engine/hosts.h"
 #include "engine/ledger.h"
 #include "engine/subscribers.h"
 
@@ -24,7 +24,7 @@ struct EngineState {
   std::deque<std::string> line;  // the unfinished groups, in the order in which they are gone on with
   SubscriberTable subscribers;
   ClientTable clients;
-  std::set<std::uint32_t> gone_hosts;
+  HostTable hosts;
   std::uint64_t last_protocol = 0;
   std::uint64_t numbers_above = 0;  // every event of a group is numbered above it
 };

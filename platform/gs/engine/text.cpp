@@ -191,6 +191,11 @@ std::string body(const ResponsivenessEvent& e) {
   return name_of(e.session) + (e.responding ? ": responds" : ": does not respond");
 }
 std::string body(const ContinueEvent&) { return "unfinished work goes on"; }
+std::string body(const AdaptersEvent& e) {
+  std::string all = "node " + std::to_string(e.node) + ": adapters";
+  for (const Adapter& adapter : e.adapters) all += " " + printable(adapter.name);
+  return all;
+}
 std::string body(const NumbersEvent& e) { return "numbers go on above " + std::to_string(e.above); }
 
 }  // namespace

@@ -5,6 +5,7 @@
 // hundreds of endpoints without a copy.
 #pragma once
 
+#include <array>
 #include <compare>
 #include <cstdint>
 #include <memory>
@@ -26,6 +27,9 @@ inline constexpr std::size_t kMaxExpelList = 4096;             // providers
 inline constexpr std::size_t kMaxSessionClients = 4096;        // providers and subscribers of one session
 inline constexpr std::size_t kMaxSubscribers = 65'536;         // of one group
 inline constexpr std::size_t kMaxBatch = 512;                  // joins or leaves in one protocol
+inline constexpr std::size_t kMaxHosts = 512;
+inline constexpr std::size_t kMaxAdapters = 64;                // of one host, those that stand first
+inline constexpr std::size_t kMaxAdapterName = 15;             // bytes
 inline constexpr std::size_t kMaxCollected = 4 * 1024 * 1024;  // bytes, of all values in one event's vote results
 
 /// Chosen by the client, unique among the live tokens of its session, never negative.
@@ -70,6 +74,19 @@ struct GroupAttributes {
   std::string source_group_name;
   bool operator==(const GroupAttributes&) const = default;
 };
+
+/// One address of a host's network interface.
+struct Adapter {
+  /// IPv6, or an IPv4 address as IPv6 has it.
+  using Address = std::array<std::uint8_t, 16>;
+  std::string name;
+  Address address{};
+  bool operator==(const Adapter&) const = default;
+};
+using Adapters = std::vector<Adapter>;
+inline bool is_adapter_name(const std::string& name) {
+  return !name.empty() && name.size() <= kMaxAdapterName && name.find('\0') == std::string::npos;
+}
 
 // -------------------------------------------------------------------------------------------------- requests
 
@@ -171,6 +188,12 @@ struct HostCameEvent {
   std::uint32_t node = 0;
 };
 
+/// What a host has from now on, so that clients of the others can ask for it.
+struct AdaptersEvent {
+  std::uint32_t node = 0;
+  Adapters adapters;  // at most kMaxAdapters
+};
+
 /// Names one phase of one protocol of one group; an expiry of a phase that is over is ignored.
 struct TimerId {
   std::string group;
@@ -196,7 +219,7 @@ struct NumbersEvent {
 };
 
 using Event = std::variant<RequestEvent, SessionGoneEvent, HostGoneEvent, HostCameEvent, TimerExpiredEvent,
-                           ResponsivenessEvent, ContinueEvent, NumbersEvent>;
+                           ResponsivenessEvent, ContinueEvent, NumbersEvent, AdaptersEvent>;
 
 // --------------------------------------------------------------------------------------------- notifications
 
@@ -280,6 +303,49 @@ struct Delivery {
   std::shared_ptr<const Notification> what;
 };
 
+// ------------------------------------------------------------------------------- notifications of the domain
+
+/// A host that takes part. `epoch`: another one each time that it comes.
+struct DomainNode {
+  std::uint32_t number = 0;
+  std::uint32_t epoch = 0;
+  bool operator==(const DomainNode&) const = default;
+};
+using DomainNodes = std::vector<DomainNode>;  // ascending
+
+/// The hosts are other ones than before.
+struct NodesNotification {
+  DomainNodes current;
+  DomainNodes added;
+  DomainNodes removed;
+};
+/// The master, the host with the lowest number, is another one than before.
+struct MasterNotification {
+  DomainNode master;
+  std::uint32_t size = 0;  // hosts
+};
+struct QuorumNotification {
+  std::uint64_t sequence = 0;  // 0: it is not to be answered
+  wyx_quorum_state_t before = WYX_QUORUM_STATE_PENDING;
+  wyx_quorum_state_t now = WYX_QUORUM_STATE_HAS;
+  std::uint64_t seqnum = 0;  // of the hosts' last change when there was quorum
+};
+/// What the client has answered to a quorum notification is refused.
+struct QuorumErrorNotification {
+  std::uint64_t sequence = 0;  // that it named
+  wyx_rc_t rc = WYX_OK;
+};
+
+/// Goes to sessions that have asked for it, not to a provider or subscriber.
+using DomainNotification =
+    std::variant<NodesNotification, MasterNotification, QuorumNotification, QuorumErrorNotification>;
+
+/// The hosts as they are.
+struct DomainView {
+  DomainNodes nodes;
+  std::uint64_t seqnum = 0;  // of the last change
+};
+
 /// A phase has opened: asks that TimerExpiredEvent{id} be ordered after `seconds`.
 struct TimerRequest {
   TimerId id;
@@ -305,6 +371,7 @@ struct Outcome {
   wyx_rc_t rc = WYX_OK;
   std::vector<Delivery> deliveries;  // in the order in which each endpoint must see them
   std::vector<TimerRequest> timers;
+  std::vector<DomainNotification> domain;  // for each session that has asked for them, before its deliveries
 };
 
 }  // namespace gs

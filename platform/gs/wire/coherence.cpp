@@ -1,5 +1,7 @@
 #include "wire/coherence.h"
 
+#include <algorithm>
+
 #include "engine/protocols.h"
 
 namespace gs::wire::detail {
@@ -54,7 +56,27 @@ const char* contradiction_in(const DelayedErrorNotification& n) {
   return nullptr;
 }
 
+bool ascend(const DomainNodes& nodes) {
+  const auto not_before = [](const DomainNode& a, const DomainNode& b) { return a.number >= b.number; };
+  return nodes.size() <= kMaxHosts && std::ranges::adjacent_find(nodes, not_before) == nodes.end();
+}
+
+const char* contradiction_in(const NodesNotification& n) {
+  return ascend(n.current) && ascend(n.added) && ascend(n.removed) ? nullptr : "nodes that do not ascend";
+}
+const char* contradiction_in(const MasterNotification& n) {
+  return n.size == 0 || n.size > kMaxHosts ? "a master of too few or too many nodes" : nullptr;
+}
+const char* contradiction_in(const QuorumNotification&) { return nullptr; }
+const char* contradiction_in(const QuorumErrorNotification& n) {
+  return n.rc == WYX_OK ? "an error that is none" : nullptr;
+}
+
 }  // namespace
+
+const char* contradiction_in(const DomainNotification& notification) {
+  return std::visit([](const auto& n) { return contradiction_in(n); }, notification);
+}
 
 const char* contradiction_in(const Notification& notification) {
   return std::visit([](const auto& n) { return contradiction_in(n); }, notification);

@@ -7,5 +7,6 @@ namespace gs::wire::detail {
 
 /// What contradicts itself in a notification whose numbers are all values of their enumerations; null: nothing.
 const char* contradiction_in(const Notification& notification);
+const char* contradiction_in(const DomainNotification& notification);
 
 }  // namespace gs::wire::detail

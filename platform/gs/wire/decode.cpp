@@ -259,6 +259,66 @@ class Reader {
     return nullptr;
   }
 
+  // --------------------------------------------------------------------------- of the domain, of its adapters
+
+  DomainNode value(const fb::DomainNode* node) { return {node_number(node->number()), node->epoch()}; }
+  DomainNodes nodes(const flatbuffers::Vector<const fb::DomainNode*>* from) {
+    DomainNodes result;
+    if (!take(from->size() * sizeof(fb::DomainNode))) return result;
+    for (const fb::DomainNode* node : *from) result.push_back(value(node));
+    return result;
+  }
+
+  DomainNotification value(const fb::Nodes* n) {
+    return NodesNotification{nodes(n->current()), nodes(n->added()), nodes(n->removed())};
+  }
+  DomainNotification value(const fb::Master* n) { return MasterNotification{value(n->node()), n->size()}; }
+  DomainNotification value(const fb::Quorum* n) {
+    return QuorumNotification{n->sequence(), enumeration<wyx_quorum_state_t>(n->before()),
+                              enumeration<wyx_quorum_state_t>(n->now()), n->seqnum()};
+  }
+  DomainNotification value(const fb::QuorumError* n) {
+    return QuorumErrorNotification{n->sequence(), enumeration<wyx_rc_t>(n->rc())};
+  }
+
+  DomainNotification domain_notification(const fb::DomainControl& m) {
+    switch (m.what_type()) {
+      case fb::DomainNotification::Nodes:
+        return value(m.what_as_Nodes());
+      case fb::DomainNotification::Master:
+        return value(m.what_as_Master());
+      case fb::DomainNotification::Quorum:
+        return value(m.what_as_Quorum());
+      case fb::DomainNotification::QuorumError:
+        return value(m.what_as_QuorumError());
+      case fb::DomainNotification::NONE:
+        break;
+    }
+    fail("a notification of an unknown kind");
+    return {};
+  }
+
+  Adapter::Address address(const FbBytes* from) {
+    Adapter::Address result{};
+    if (from->size() == result.size())
+      std::copy(from->begin(), from->end(), result.begin());
+    else
+      fail("an address that is none");
+    return result;
+  }
+  Adapters adapters(const FbAdapters& from) {
+    Adapters result;
+    if (from.size() > kMaxAdapters) {
+      fail("more adapters than there may be");
+      return result;
+    }
+    for (const fb::Adapter* adapter : from) {
+      result.push_back({name(adapter->name()), address(adapter->address())});
+      if (!is_adapter_name(result.back().name)) fail("a name that no adapter has");
+    }
+    return result;
+  }
+
   // ---------------------------------------------------------------------------------------------- messages
 
   std::vector<Token> tokens(const flatbuffers::Vector<Token>& values) {
@@ -300,6 +360,14 @@ ClientMessage Reader::client_message(const fb::ClientMessage& m) {
       return PingAnswer{m.body_as_PingAnswer()->number(), m.body_as_PingAnswer()->ok()};
     case fb::ClientBody::Quit:
       return Quit{};
+    case fb::ClientBody::QuorumAnswer:
+      return QuorumAnswer{m.body_as_QuorumAnswer()->sequence()};
+    case fb::ClientBody::QueryAdapters: {
+      const auto* query = m.body_as_QueryAdapters();
+      QueryAdapters result{node_number(query->node()), {}};
+      if (query->address() != nullptr) result.address = address(query->address());
+      return result;
+    }
     case fb::ClientBody::NONE:
       break;
   }
@@ -333,6 +401,14 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
       return Fanout{tokens(*m.body_as_Fanout()->tokens())};
     case fb::ServerBody::FanoutEnd:
       return FanoutEnd{};
+    case fb::ServerBody::DomainControl: {
+      auto what = std::make_shared<const DomainNotification>(domain_notification(*m.body_as_DomainControl()));
+      if (const char* why = contradiction_in(*what); why != nullptr) fail(why);
+      return DomainControl{std::move(what)};
+    }
+    case fb::ServerBody::NodeAdapters:
+      return NodeAdapters{node_number(m.body_as_NodeAdapters()->node()),
+                          adapters(*m.body_as_NodeAdapters()->adapters())};
     case fb::ServerBody::NONE:
       break;
   }
@@ -374,6 +450,12 @@ std::optional<Request> read_request(fb::Request kind, const void* table, std::si
   Reader reader(message_size);
   return unless_wrong(
       reader, [&] { return reader.request(kind, table); }, error);
+}
+
+std::optional<Adapters> read_adapters(const FbAdapters& from, std::size_t message_size, std::string* error) {
+  Reader reader(message_size);
+  Adapters adapters = reader.adapters(from);
+  return unless_wrong(reader, std::move(adapters), error);
 }
 
 }  // namespace gs::wire::detail

@@ -14,6 +14,7 @@ using ProvidersOffset = Offset<flatbuffers::Vector<const fb::ProviderId*>>;
 
 fb::ProviderId pack(const ProviderId& id) { return {id.instance, id.node}; }
 fb::LeaveCode pack(const LeaveCode& code) { return {code.voluntary_or_failure, code.voluntary_code}; }
+fb::DomainNode pack(const DomainNode& node) { return {node.number, node.epoch}; }
 fb::Terms pack(const ProtocolTerms& terms) { return {terms.num_phases, terms.time_limit}; }
 
 BytesOffset put(Builder& b, const Bytes& bytes) {
@@ -129,6 +130,13 @@ ClientBody body(Builder& b, const PingAnswer& m) {
   return {fb::ClientBody::PingAnswer, fb::CreatePingAnswer(b, m.number, m.ok).Union()};
 }
 ClientBody body(Builder& b, const Quit&) { return {fb::ClientBody::Quit, fb::CreateQuit(b).Union()}; }
+ClientBody body(Builder& b, const QuorumAnswer& m) {
+  return {fb::ClientBody::QuorumAnswer, fb::CreateQuorumAnswer(b, m.sequence).Union()};
+}
+ClientBody body(Builder& b, const QueryAdapters& m) {
+  const auto address = m.address ? b.CreateVector(m.address->data(), m.address->size()) : BytesOffset();
+  return {fb::ClientBody::QueryAdapters, fb::CreateQueryAdapters(b, m.node, address).Union()};
+}
 
 // ------------------------------------------------------------------------------------------- notifications
 
@@ -195,6 +203,27 @@ NotificationBody body(Builder& b, const DelayedErrorNotification& n) {
           fb::CreateDelayedError(b, n.protocol, n.rc, request.kind, request.value, attributes).Union()};
 }
 
+// ----------------------------------------------------------------------------- notifications of the domain
+
+using DomainBody = Body<fb::DomainNotification>;
+
+DomainBody body(Builder& b, const NodesNotification& n) {
+  const auto current = put_structs<fb::DomainNode>(b, n.current);
+  const auto added = put_structs<fb::DomainNode>(b, n.added);
+  const auto removed = put_structs<fb::DomainNode>(b, n.removed);
+  return {fb::DomainNotification::Nodes, fb::CreateNodes(b, current, added, removed).Union()};
+}
+DomainBody body(Builder& b, const MasterNotification& n) {
+  const auto master = pack(n.master);
+  return {fb::DomainNotification::Master, fb::CreateMaster(b, &master, n.size).Union()};
+}
+DomainBody body(Builder& b, const QuorumNotification& n) {
+  return {fb::DomainNotification::Quorum, fb::CreateQuorum(b, n.sequence, n.before, n.now, n.seqnum).Union()};
+}
+DomainBody body(Builder& b, const QuorumErrorNotification& n) {
+  return {fb::DomainNotification::QuorumError, fb::CreateQuorumError(b, n.sequence, n.rc).Union()};
+}
+
 // ---------------------------------------------------------------------------------------- server messages
 
 using ServerBody = Body<fb::ServerBody>;
@@ -221,6 +250,14 @@ ServerBody body(Builder& b, const Fanout& m) {
 ServerBody body(Builder& b, const FanoutEnd&) {
   return {fb::ServerBody::FanoutEnd, fb::CreateFanoutEnd(b).Union()};
 }
+ServerBody body(Builder& b, const DomainControl& m) {
+  const auto what = std::visit([&b](const auto& n) { return body(b, n); }, *m.what);
+  return {fb::ServerBody::DomainControl, fb::CreateDomainControl(b, what.kind, what.value).Union()};
+}
+ServerBody body(Builder& b, const NodeAdapters& m) {
+  const auto adapters = put_adapters(b, m.adapters);
+  return {fb::ServerBody::NodeAdapters, fb::CreateNodeAdapters(b, m.node, adapters).Union()};
+}
 
 }  // namespace
 
@@ -236,6 +273,17 @@ void build(flatbuffers::FlatBufferBuilder& builder, const ServerMessage& message
 
 Body<fb::Request> put_request(flatbuffers::FlatBufferBuilder& builder, const Request& request) {
   return body(builder, request);
+}
+
+flatbuffers::Offset<FbAdapters> put_adapters(flatbuffers::FlatBufferBuilder& builder, const Adapters& adapters) {
+  std::vector<Offset<fb::Adapter>> offsets;
+  offsets.reserve(adapters.size());
+  for (const Adapter& adapter : adapters) {
+    const auto name = builder.CreateString(adapter.name);
+    const auto address = builder.CreateVector(adapter.address.data(), adapter.address.size());
+    offsets.push_back(fb::CreateAdapter(builder, name, address));
+  }
+  return builder.CreateVector(offsets);
 }
 
 }  // namespace gs::wire::detail

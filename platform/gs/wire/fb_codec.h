@@ -11,7 +11,8 @@
 
 namespace gs::wire::fb {
 enum class Request : std::uint8_t;
-}
+struct Adapter;
+}  // namespace gs::wire::fb
 
 namespace gs::wire::detail {
 
@@ -42,6 +43,12 @@ Body<fb::Request> put_request(flatbuffers::FlatBufferBuilder& builder, const Req
 /// `table` is the union's member, of the type that `kind` says, verified, in a message of `message_size` bytes.
 std::optional<Request> read_request(fb::Request kind, const void* table, std::size_t message_size,
                                     std::string* error);
+
+using FbAdapters = flatbuffers::Vector<flatbuffers::Offset<fb::Adapter>>;
+
+/// The same for adapters, at most kMaxAdapters of them.
+flatbuffers::Offset<FbAdapters> put_adapters(flatbuffers::FlatBufferBuilder& builder, const Adapters& adapters);
+std::optional<Adapters> read_adapters(const FbAdapters& from, std::size_t message_size, std::string* error);
 
 /// The root table of `payload` once it is verified; null: it is not one.
 template <typename Table>

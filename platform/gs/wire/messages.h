@@ -8,7 +8,7 @@
 
 namespace gs::wire {
 
-inline constexpr std::uint16_t kProtocolVersion = 2;
+inline constexpr std::uint16_t kProtocolVersion = 3;
 inline constexpr std::size_t kMaxFanout = kMaxSessionClients;  // tokens
 
 // ---------------------------------------------------------------------------------------- client to daemon
@@ -41,10 +41,20 @@ struct PingAnswer {
   std::uint64_t number = 0;
   bool ok = false;
 };
+/// Answers a quorum notification that is to be answered; its Answer says whether it was expected.
+struct QuorumAnswer {
+  std::uint64_t sequence = 0;  // of the notification
+};
+/// Asks for NodeAdapters; allowed without Hello.
+struct QueryAdapters {
+  std::uint32_t node = 0;
+  std::optional<Adapter::Address> address;  // the one adapter that has it, on whatever node
+};
 /// The session ends in good order: the daemon fails its providers as for a death but logs no error.
 struct Quit {};
 
-using ClientMessage = std::variant<Hello, Attach, Call, SetResponsiveness, QueryNode, PingAnswer, Quit>;
+using ClientMessage =
+    std::variant<Hello, Attach, Call, SetResponsiveness, QueryNode, PingAnswer, Quit, QuorumAnswer, QueryAdapters>;
 
 // ---------------------------------------------------------------------------------------- daemon to client
 
@@ -54,7 +64,7 @@ struct Welcome {
   std::uint64_t session_number = 0;
   std::uint64_t cookie = 0;
 };
-/// Answers Attach, Call, SetResponsiveness and Quit, and a Hello that is refused.
+/// Answers Attach, Call, SetResponsiveness, QuorumAnswer and Quit, and a Hello that is refused.
 struct Answer {
   wyx_rc_t rc = WYX_OK;
 };
@@ -62,9 +72,18 @@ struct NodeInfo {
   std::uint32_t node_number = 0;
   std::uint32_t domain_master_node = 0;
 };
+/// Of `node`; empty: none are known that were asked for.
+struct NodeAdapters {
+  std::uint32_t node = 0;
+  Adapters adapters;
+};
 struct Notify {
   Token token = -1;  // -1: those of the Fanout before it
   std::shared_ptr<const Notification> what;
+};
+/// To the session itself.
+struct DomainControl {
+  std::shared_ptr<const DomainNotification> what;
 };
 struct Ping {
   std::uint64_t number = 0;
@@ -79,6 +98,7 @@ struct Fanout {
 /// A reader leaves it unread until all tokens have their notification, so that its descriptor stays readable.
 struct FanoutEnd {};
 
-using ServerMessage = std::variant<Welcome, Answer, NodeInfo, Notify, Ping, Farewell, Fanout, FanoutEnd>;
+using ServerMessage = std::variant<Welcome, Answer, NodeInfo, Notify, Ping, Farewell, Fanout, FanoutEnd,
+                                   DomainControl, NodeAdapters>;
 
 }  // namespace gs::wire
