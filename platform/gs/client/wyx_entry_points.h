@@ -15,9 +15,10 @@
 //
 // A session ends when the daemon dies, says what makes no sense or leaves a request unanswered for
 // GSD_REQUEST_LIMIT seconds (see wyx_api.h): requests under way and to come answer WYX_NO_INIT, what had arrived
-// before is still handed out, then who is told of quorum is told that there is none, every provider gets the announcement WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY and
-// every subscriber WYX_SUBSCRIPTION_GS_HAS_DIED, in the order of their tokens. The descriptor stays valid, and is
-// no longer readable, until wyx_quit or the next wyx_setup.
+// before is still handed out, then who was told of quorum is told that there is none, every provider gets the
+// announcement WYX_GROUP_SERVICES_HAS_DIED_HORRIBLY and every subscriber WYX_SUBSCRIPTION_GS_HAS_DIED, in the
+// order of their tokens. The descriptor stays valid, and is no longer readable, until wyx_quit or the next
+// wyx_setup.
 //
 // A session belongs to the process that opened it; what that means to the child of a fork: wyx_api.h. Descriptors
 // are closed on exec.
@@ -38,7 +39,7 @@
 /// a moment); it stays the library's. `socket_control`: WYX_SOCKET_SIGNAL raises SIGIO for each arrival from a
 /// daemon; with a domain-control routine WYX_ENABLE_DOMAIN_EVENT has it told of the domain's nodes and master,
 /// WYX_ENABLE_OPQUORUM_CALLBACK of quorum, and WYX_ENABLE_OPQUORUM_ACK_REQUIRED beside that one makes these
-/// notifications ask for an answer: how it is, once, then each change; docs/group-services.md says what is in them.
+/// notifications ask for an answer: how it is, once, then each change; what is in them: docs/group-services.md.
 /// The other flags change nothing. `responsiveness` as for wyx_change_responsiveness; null: none.
 /// `deactivate_path` is accepted and not used. A routine that is null gets nothing; there are no query
 /// notifications.
@@ -86,8 +87,8 @@ WYX_ENTRY wyx_rc_t wyx_vote(wyx_token_t provider, wyx_vote_value_t vote, const w
 WYX_ENTRY wyx_rc_t wyx_subscribe(wyx_token_t* token, const wyx_proposal_info_t* request);
 WYX_ENTRY wyx_rc_t wyx_unsubscribe(wyx_token_t subscriber);
 
-// Queries. They need no session; the first two, and that of an address that is not this host's, then ask the daemon
-// over a connection of their own. The first two answer WYX_CONNECT_FAILED when there is none.
+// Queries. They need no session; the first two, and that of an address that is not this host's, then ask the
+// daemon over a connection of their own. The first two answer WYX_CONNECT_FAILED when there is none.
 WYX_ENTRY wyx_rc_t wyx_get_node_number(int* node_number);
 WYX_ENTRY wyx_rc_t wyx_get_domain_master_node_number(int* node_number);
 WYX_ENTRY wyx_rc_t wyx_get_limits(wyx_limits* limits);
@@ -123,10 +124,10 @@ WYX_ENTRY wyx_rc_t wyx_migrate_to_pell_abort();
 WYX_ENTRY wyx_rc_t wyx_migrate_vote(wyx_migration_vote_t vote);
 
 /// With WYX_PRIV_MSG_OPQUORUM: answers the quorum notification whose sequence is in `data`, a wyx_quorum_resp_t of
-/// `length` bytes. Refused: WYX_BAD_QUORUM_MSG_SEQNUM, another one waits for its answer; WYX_UNEXPECTED_QUORUM_RESP,
-/// none does; WYX_NOT_REGISTERED_FOR_SYNC_QUORUM, the session has not asked for such. A session that is told of
-/// quorum gets the refusal also as WYX_DOMAINCB_RESP_ERR_INFO. Nothing waits for an answer. Other messages:
-/// WYX_NOT_SUPPORTED.
+/// `length` bytes. Refused: WYX_BAD_QUORUM_MSG_SEQNUM, another one waits for its answer;
+/// WYX_UNEXPECTED_QUORUM_RESP, none does; WYX_NOT_REGISTERED_FOR_SYNC_QUORUM, the session has not asked for such.
+/// A session that is told of quorum gets the refusal also as WYX_DOMAINCB_RESP_ERR_INFO. Nothing waits for an
+/// answer. Other messages: WYX_NOT_SUPPORTED.
 WYX_ENTRY wyx_rc_t wyx_internal_send_domain_msg_to_gsd(wyx_priv_channel_msg_type_t type, void* data,
                                                        uint64_t length);
 

@@ -234,8 +234,7 @@ void SessionLayer::on_attach(ConnectionId id, Connection& connection, const wire
   log_about(connection.peer.uid, spdlog::level::info, describe(connection) + ": connected");
   const auto greeting = session->domain.greeting(engine_->domain());
   answer(id, WYX_OK);  // may end the session
-  for (const DomainNotification& news : greeting)
-    tell_of_domain(attach.session_number, packets_of(news), true);
+  for (const DomainNotification& news : greeting) tell_of_domain(attach.session_number, packets_of(news), true);
 }
 
 void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& call) {
