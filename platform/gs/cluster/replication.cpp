@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <iterator>
-#include <ranges>
 #include <utility>
 
 namespace gs::cluster {
@@ -340,10 +339,11 @@ void Replication::apply(const Decision& decision) {
   const auto goes_on = [&](const auto& host) { return has(decision.holders, host.first, host.second); };
   const bool somebody_gone = before.empty() || !std::ranges::all_of(before, goes_on);
   if (somebody_gone && keeps(Rule::kNumbersGoOn)) apply(NumbersEvent{decision.numbers});
-  for (const auto& host : before | std::views::reverse) {
-    if (goes_on(host) || (!keeps(Rule::kHostsAreState) && !decision.left.contains(host.first))) continue;
-    const auto code = decision.left.find(host.first);
-    apply(HostGoneEvent{host.first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
+  for (auto host = before.rbegin(); host != before.rend(); ++host) {
+    if (goes_on(*host) || (!keeps(Rule::kHostsAreState) && !decision.left.contains(host->first))) continue;
+    const auto code = decision.left.find(host->first);
+    apply(
+        HostGoneEvent{host->first, code == decision.left.end() ? std::uint32_t{WYX_HOST_FAILURE} : code->second});
   }
   for (const auto& [node, life] : decision.holders) {
     if (!has(before, node, life)) apply(HostCameEvent{node});
