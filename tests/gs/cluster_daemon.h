@@ -20,6 +20,7 @@ struct Plan {
   Rule without = Rule::kNone;
   std::size_t piece = 64;
   Limits limits;
+  bool adapters = false;  // are published: an event more may mend what else would be found
 };
 
 struct Datagram {
@@ -144,6 +145,8 @@ class Daemon : public Order, public Replica, public Host {
   }
   /// What a daemon has to order itself; mostly the first one does.
   void work(Random& random, bool calm) {
+    const bool publishes = world_.plan.adapters && (calm ? !published_ : random.chance(5));
+    if (replication_.serves() && publishes) publish_adapters();
     if (!replication_.serves() || (domain_.rank > 0 && (calm || random.chance(80)))) return;
     if (!calm && !world_.timers.empty() && random.chance(30))
       return replication_.submit(TimerExpiredEvent{random.one_of(world_.timers)});
@@ -159,7 +162,7 @@ class Daemon : public Order, public Replica, public Host {
   History::Place place() const { return place_; }
   /// Of every host that takes part, as its daemon is now.
   bool knows_all_adapters() const {
-    return std::ranges::all_of(engine_->hosts(), [this](const auto& host) {
+    return !world_.plan.adapters || std::ranges::all_of(engine_->hosts(), [this](const auto& host) {
       const auto last = world_.adapters.find(host.first);
       return last != world_.adapters.end() && host.second.adapters == last->second;
     });
@@ -247,7 +250,7 @@ class Daemon : public Order, public Replica, public Host {
     world_.history.applied(self_.node, place_, beside());
     world_.tell(self_.node, "serves");
     domain_ = domain;
-    if (!std::exchange(serving_, true)) publish_adapters();
+    serving_ = true;
     continued_ = false;
     world_.history.serves(self_.node, ring_, place_, beside());
   }
@@ -282,6 +285,7 @@ class Daemon : public Order, public Replica, public Host {
 
   void publish_adapters() {
     world_.adapters[self_.node] = {{"eth" + std::to_string(++world_.last_adapter), {}}};
+    published_ = true;
     replication_.submit(AdaptersEvent{self_.node, world_.adapters[self_.node]});
   }
   Request make(Random& random) {
@@ -310,7 +314,7 @@ class Daemon : public Order, public Replica, public Host {
   void end_clients() {
     for (const auto& [id, client] : clients_) world_.over.insert(id);
     clients_.clear();
-    serving_ = false;
+    serving_ = published_ = false;
     world_.history.serves_no_more(self_.node);
   }
   void lose_state() {
@@ -363,6 +367,7 @@ class Daemon : public Order, public Replica, public Host {
   std::map<SessionId, Client> clients_;
   std::uint64_t last_session_ = 0;
   bool serving_ = false;
+  bool published_ = false;  // its adapters, in this life
   bool continued_ = false;  // a ContinueEvent is under way
   bool has_given_up_ = false;
 };

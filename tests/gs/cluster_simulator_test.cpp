@@ -15,7 +15,7 @@ namespace {
 using gs::test::number_from;
 
 constexpr std::uint64_t kSteps = ZN_ADDRESS_SANITIZER || ZN_THREAD_SANITIZER ? 40'000 : 400'000;
-constexpr std::uint64_t kRuleSteps = 1'000'000;  // to find that a rule is left out
+constexpr std::uint64_t kRuleSteps = 4'000'000;  // to find that a rule is left out
 constexpr std::size_t kEpisode = 3'000;          // steps
 
 enum class What {
@@ -300,6 +300,7 @@ Plan plan_of(std::uint64_t seed, bool safe, Rule without) {
   plan.without = without;
   plan.piece = random.chance(50) ? 64 : 1024;
   if (random.chance(50)) plan.limits.slice = 1;
+  plan.adapters = random.chance(20);
   return plan;
 }
 
