@@ -454,8 +454,8 @@ std::optional<Request> read_request(fb::Request kind, const void* table, std::si
 
 std::optional<Adapters> read_adapters(const FbAdapters& from, std::size_t message_size, std::string* error) {
   Reader reader(message_size);
-  Adapters adapters = reader.adapters(from);
-  return unless_wrong(reader, std::move(adapters), error);
+  return unless_wrong(
+      reader, [&] { return reader.adapters(from); }, error);
 }
 
 }  // namespace gs::wire::detail
