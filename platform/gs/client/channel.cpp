@@ -88,7 +88,7 @@ Channel::Got Channel::send_packet(std::span<std::byte> header, std::span<const s
 }
 
 Channel::Got Channel::send(const wire::ClientMessage& message) {
-  const wire::Encoded encoded = wire::encode(message);
+  const wire::Encoded encoded = wire::encode_for_now(message);
   return encoded ? send(encoded, deadline()) : Got::kEnd;
 }
 
@@ -103,7 +103,7 @@ Channel::Got Channel::send(const wire::Encoded& message, Clock::time_point until
 }
 
 Channel::Got Channel::ask(const wire::ClientMessage& question, wire::ServerMessage* answer) {
-  const wire::Encoded encoded = wire::encode(question);
+  const wire::Encoded encoded = wire::encode_for_now(question);
   if (!encoded) return Got::kEnd;
   const auto until = deadline();
   const Got sent = send(encoded, until);

@@ -317,16 +317,13 @@ void SessionLayer::too_slow(std::uint64_t session) {
 // ------------------------------------------------------------------------------------------------ ordered side
 
 void SessionLayer::apply(const Event& event) {
-  Outcome outcome;
+  const char* failed = "finished: ";
   try {
-    outcome = engine_->apply(event);
-  } catch (const std::exception& error) {
-    return env_.ordering.fail(std::string("an event could not be finished: ") + error.what());
-  }
-  try {
+    const Outcome outcome = engine_->apply(event);
+    failed = "told: ";
     deliver(event, outcome);
   } catch (const std::exception& error) {
-    return env_.ordering.fail(std::string("an event could not be told: ") + error.what());
+    return env_.ordering.fail(std::string("an event could not be ") + failed + error.what());
   }
   enforce_bounds();
   note_freed();

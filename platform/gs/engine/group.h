@@ -165,8 +165,9 @@ class Group {
   void end_phase(Surroundings& env);
   void collect(const Value& value, std::uint32_t flag, Value& into);
   void cast_default(Member& voter, std::uint32_t cause);
-  void approve(std::uint32_t summary, Surroundings& env);
-  void reject(std::uint32_t summary, Surroundings& env);
+  // The run is over: it is not the group's any more.
+  void approve(const Run& run, std::uint32_t summary, Surroundings& env);
+  void reject(const Run& run, std::uint32_t summary, Surroundings& env);
   static void end(const Run& run, const std::vector<MemberPtr>& audience);
   void change_membership(const Run& run);
   void dismiss(const Run& run, Surroundings& env);

@@ -48,9 +48,9 @@ void Group::start(Run&& run, Surroundings& env) {
     run.terms.time_limit = longest;
   run.number = ++env.last_protocol;
   run.collect = attributes_->batch_control & WYX_COLLECT_ALL_RESULT;
-  run_ = std::move(run);
+  if (run.terms.num_phases == WYX_1_PHASE) return approve(run, WYX_EXPLICIT_APPROVE, env);
   for (const MemberPtr& m : members_) m->ballot = {};
-  if (run_->terms.num_phases == WYX_1_PHASE) return approve(WYX_EXPLICIT_APPROVE, env);
+  run_ = std::move(run);
   open_phase(env);
 }
 
@@ -147,32 +147,30 @@ std::vector<MissingVoter> Group::missing_voters(std::size_t at_most) const {
 }
 
 void Group::end_phase(Surroundings& env) {
-  Run& run = *run_;
   bool any_continue = false;
   std::uint32_t rejects = 0;
-  for (const MemberPtr& m : run.voters) {
+  for (const MemberPtr& m : run_->voters) {
     any_continue |= m->ballot.vote == WYX_VOTE_CONTINUE;
     if (m->ballot.vote == WYX_VOTE_REJECT) rejects |= m->ballot.summary;
   }
-  switch (phase_end(rejects != 0, any_continue, run.traits->preventable)) {
-    case PhaseEnd::kNextPhase:
-      ++run.phase;
-      return open_phase(env);
-    case PhaseEnd::kReject:
-      return reject(rejects, env);
-    case PhaseEnd::kApproveRejected:
-      run.proposed_state = {};
-      return approve(rejects, env);
-    case PhaseEnd::kApprove:
-      return approve(run.defaults != 0 ? run.defaults : std::uint32_t{WYX_EXPLICIT_APPROVE}, env);
+  const PhaseEnd how = phase_end(rejects != 0, any_continue, run_->traits->preventable);
+  if (how == PhaseEnd::kNextPhase) {
+    ++run_->phase;
+    return open_phase(env);
   }
+  Run run = std::move(*run_);
+  run_.reset();
+  if (how == PhaseEnd::kReject) return reject(run, rejects, env);
+  if (how == PhaseEnd::kApproveRejected) {
+    run.proposed_state = {};
+    return approve(run, rejects, env);
+  }
+  approve(run, run.defaults != 0 ? run.defaults : std::uint32_t{WYX_EXPLICIT_APPROVE}, env);
 }
 
 // ----------------------------------------------------------------------------------------------------- outcome
 
-void Group::approve(std::uint32_t summary, Surroundings& env) {
-  Run run = std::move(*run_);
-  run_.reset();
+void Group::approve(const Run& run, std::uint32_t summary, Surroundings& env) {
   const bool was_born = born();
   std::vector<MemberPtr> all;  // where the members change
   if (!run.changing.empty())
@@ -192,9 +190,7 @@ void Group::approve(std::uint32_t summary, Surroundings& env) {
   if (!born()) forget_values();
 }
 
-void Group::reject(std::uint32_t summary, Surroundings& env) {
-  Run run = std::move(*run_);
-  run_.reset();
+void Group::reject(const Run& run, std::uint32_t summary, Surroundings& env) {
   const bool joins = run.traits->changing_role == ChangingRole::kVote;
   const std::vector<MemberPtr> audience = joins ? joined(members_, run.changing) : members_;
   ProtocolNotification note = compose(run, WYX_REJECTED_NOTIFICATION, summary);

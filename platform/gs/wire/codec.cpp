@@ -172,12 +172,26 @@ std::span<const std::byte> Encoded::packet_for(std::size_t index, Token token,
   return {payload_.get() + start, size};
 }
 
-Encoded encode(const ClientMessage& message) {
+Encoded Encoded::view(const std::uint8_t* payload, std::size_t length, std::size_t limit) {
+  Encoded packets;
+  if (length > limit) return packets;
+  packets.payload_ = {packets.payload_, reinterpret_cast<const std::byte*>(payload)};  // of nobody's
+  packets.length_ = length;
+  return packets;
+}
+
+Encoded encode_for_now(const ClientMessage& message) {
   const auto* call = std::get_if<Call>(&message);
-  if (call != nullptr && problem_with(call->request) != nullptr) return {nullptr, 1, 0};
+  if (call != nullptr && problem_with(call->request) != nullptr) return {};
   auto& builder = thread_builder.fresh();
   detail::build(builder, message);
-  return {builder.GetBufferPointer(), builder.GetSize(), kMaxClientMessage};
+  return Encoded::view(builder.GetBufferPointer(), builder.GetSize(), kMaxClientMessage);
+}
+
+Encoded encode(const ClientMessage& message) {
+  const Encoded packets = encode_for_now(message);
+  if (!packets) return packets;
+  return {reinterpret_cast<const std::uint8_t*>(packets.payload_.get()), packets.length_, kMaxClientMessage};
 }
 
 Encoded encode(const ServerMessage& message) {

@@ -52,8 +52,10 @@ class Encoded {
 
  private:
   friend Encoded encode(const ClientMessage&);
+  friend Encoded encode_for_now(const ClientMessage&);
   friend Encoded encode(const ServerMessage&);
   Encoded(const std::uint8_t* payload, std::size_t length, std::size_t limit);
+  static Encoded view(const std::uint8_t* payload, std::size_t length, std::size_t limit);
 
   std::shared_ptr<const std::byte[]> payload_;
   std::size_t length_ = 0;  // bytes of the payload
@@ -78,6 +80,8 @@ class Encoded::Weak {
 };
 
 Encoded encode(const ClientMessage& message);
+/// The same without a copy: lives until this thread encodes again.
+Encoded encode_for_now(const ClientMessage& message);
 /// A Notify is encoded without its token: give that to packet_for.
 Encoded encode(const ServerMessage& message);
 

@@ -50,9 +50,11 @@ using FbAdapters = flatbuffers::Vector<flatbuffers::Offset<fb::Adapter>>;
 flatbuffers::Offset<FbAdapters> put_adapters(flatbuffers::FlatBufferBuilder& builder, const Adapters& adapters);
 std::optional<Adapters> read_adapters(const FbAdapters& from, std::size_t message_size, std::string* error);
 
-/// The root table of `payload` once it is verified; null: it is not one.
+/// The root table of `payload` once it is verified; null: it is not one. Flat, since it is many small functions
+/// that every message goes through.
 template <typename Table>
-const Table* verified_root(std::span<const std::byte> payload, const char* id, std::string* error) {
+[[gnu::flatten]] const Table* verified_root(std::span<const std::byte> payload, const char* id,
+                                            std::string* error) {
   constexpr flatbuffers::uoffset_t kMaxDepth = 16;  // of tables in tables; the schemas need six
   const auto* data = reinterpret_cast<const std::uint8_t*>(payload.data());
   flatbuffers::Verifier verifier(data, payload.size(), kMaxDepth);
