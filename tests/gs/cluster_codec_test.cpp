@@ -66,6 +66,7 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
                              Confirmed{{}, 1, std::vector<Node>(kMaxNodes + 1, 1)},
                              Ordered{},
                              ordered(NumbersEvent{1}),
+                             ordered(HostGoneEvent{1}),
                              ordered(AdaptersEvent{1, Adapters(kMaxAdapters + 1, {"a", {}})}),
                              ordered(AdaptersEvent{1, {{std::string(kMaxAdapterName + 1, 'a'), {}}}}),
                              ordered(TimerExpiredEvent{{std::string(kMaxGroupName + 1, 'g'), 1, 1}}),

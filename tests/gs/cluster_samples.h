@@ -44,12 +44,8 @@ inline std::vector<Message> messages() {
       Piece{kBegin, 2, 3, std::vector<std::byte>(1000, std::byte{0x80})},
       Confirmed{kBegin, 0x100000002, {1, kNode}},
       Evict{ring, {{kNode, 1}, {32767, 2}}}};
-  std::vector<Event> events = {SessionGoneEvent{session},
-                               HostGoneEvent{kNode, WYX_HOST_LEAVE_DUE_TO_FORCE_DOWN},
-                               HostCameEvent{kNode},
-                               TimerExpiredEvent{{"a group", 0xfedcba9876543210, 3}},
-                               ResponsivenessEvent{session, true},
-                               ContinueEvent{},
+  std::vector<Event> events = {SessionGoneEvent{session}, TimerExpiredEvent{{"a group", 0xfedcba9876543210, 3}},
+                               ResponsivenessEvent{session, true}, ContinueEvent{},
                                AdaptersEvent{kNode, wire::samples::adapters()}};
   for (Request& request : wire::samples::requests()) events.push_back(RequestEvent{session, request, true, 1000});
   for (Event& event : events)

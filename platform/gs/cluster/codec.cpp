@@ -14,6 +14,7 @@ bool has_nul(const std::string& text) { return text.find('\0') != std::string::n
 constexpr char kNoNode[] = "a number that no node has";
 constexpr char kTooManyNodes[] = "more nodes than there may be";
 constexpr char kNoLeaveCode[] = "a leave code that does not exist";
+constexpr char kNotSent[] = "an event that follows from an exchange, and is not sent";
 
 std::string problem(const RingId& ring) { return is_node(ring.node) ? "" : kNoNode; }
 
@@ -48,11 +49,6 @@ std::string problem(const RequestEvent& e) {
   return wrong == nullptr ? std::string() : wrong;
 }
 std::string problem(const SessionGoneEvent& e) { return problem(e.session); }
-std::string problem(const HostGoneEvent& e) {
-  if (!is_node(e.node)) return kNoNode;
-  return is_leave_code(e.leave_code) ? "" : kNoLeaveCode;
-}
-std::string problem(const HostCameEvent& e) { return is_node(e.node) ? "" : kNoNode; }
 std::string problem(const TimerExpiredEvent& e) {
   const std::string& group = e.timer.group;
   return group.size() > kMaxGroupName || has_nul(group) ? "a name that no group has" : "";
@@ -65,7 +61,9 @@ std::string problem(const AdaptersEvent& e) {
   const auto fits = [](const Adapter& adapter) { return is_adapter_name(adapter.name); };
   return std::ranges::all_of(e.adapters, fits) ? "" : "a name that no adapter has";
 }
-std::string problem(const NumbersEvent&) { return "an event that follows from an exchange, and is not sent"; }
+std::string problem(const HostGoneEvent&) { return kNotSent; }
+std::string problem(const HostCameEvent&) { return kNotSent; }
+std::string problem(const NumbersEvent&) { return kNotSent; }
 
 // ------------------------------------------------------------------------------------------------ messages
 

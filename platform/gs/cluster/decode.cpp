@@ -102,10 +102,6 @@ std::optional<Event> Reader::event(const fb::Ordered& m) {
       return request_event(*m.event_as_Asked());
     case fb::Event::SessionGone:
       return SessionGoneEvent{value(m.event_as_SessionGone()->session())};
-    case fb::Event::HostGone:
-      return HostGoneEvent{m.event_as_HostGone()->node(), m.event_as_HostGone()->leave_code()};
-    case fb::Event::HostCame:
-      return HostCameEvent{m.event_as_HostCame()->node()};
     case fb::Event::TimerExpired: {
       const auto* expired = m.event_as_TimerExpired();
       return TimerExpiredEvent{{expired->group()->str(), expired->protocol(), expired->phase()}};

@@ -41,12 +41,6 @@ EventBody body(Builder& b, const SessionGoneEvent& e) {
   const auto session = pack(e.session);
   return {fb::Event::SessionGone, fb::CreateSessionGone(b, &session).Union()};
 }
-EventBody body(Builder& b, const HostGoneEvent& e) {
-  return {fb::Event::HostGone, fb::CreateHostGone(b, e.node, e.leave_code).Union()};
-}
-EventBody body(Builder& b, const HostCameEvent& e) {
-  return {fb::Event::HostCame, fb::CreateHostCame(b, e.node).Union()};
-}
 EventBody body(Builder& b, const TimerExpiredEvent& e) {
   const auto group = b.CreateString(e.timer.group);
   return {fb::Event::TimerExpired, fb::CreateTimerExpired(b, group, e.timer.protocol, e.timer.phase).Union()};
@@ -60,7 +54,11 @@ EventBody body(Builder& b, const AdaptersEvent& e) {
   const auto adapters = wire::detail::put_adapters(b, e.adapters);
   return {fb::Event::HasAdapters, fb::CreateHasAdapters(b, e.node, adapters).Union()};
 }
-EventBody body(Builder&, const NumbersEvent&) { return {fb::Event::NONE, 0}; }  // problem_with has refused it
+
+// Refused by problem_with.
+EventBody body(Builder&, const HostGoneEvent&) { return {}; }
+EventBody body(Builder&, const HostCameEvent&) { return {}; }
+EventBody body(Builder&, const NumbersEvent&) { return {}; }
 
 // ------------------------------------------------------------------------------------------------ messages
 

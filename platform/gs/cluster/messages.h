@@ -74,7 +74,7 @@ struct Word {
   std::optional<History> history;        // none: there is no state
   std::string address;                   // for datagrams
   std::string key;                       // that the sender's datagrams are authenticated with
-  std::uint64_t limits = 0;              // of its engine, in one number: replicas must have the same
+  std::uint64_t limits = 0;              // and delivery, in one number: all must have the same
   std::map<Node, std::uint32_t> left{};  // leave codes of hosts that have gone since it last took part
 };
 

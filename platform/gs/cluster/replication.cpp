@@ -249,8 +249,8 @@ bool Replication::fits(const Decision& decision) const {
   }
   if (word.limits == settings_.limits) return true;
   host_.give_up(holder +
-                " has another state-bound, session-state-bound, user-state-bound or max-phase-time: "
-                "set the same on all hosts");
+                " has another delivery, state-bound, session-state-bound, user-state-bound or "
+                "max-phase-time: set the same on all hosts");
   return false;
 }
 
@@ -293,8 +293,9 @@ void Replication::settle() {
   if (state_ != State::kRunning) return;
   apply_confirmed();
   if (state_ != State::kRunning || told_ == current().received) return;
+  const bool awaited = settings_.safe || told_ == 0;  // else only the decision is
   told_ = current().received;
-  order_.confirm({exchange_->begin().id, told_, {}});
+  if (awaited) order_.confirm({exchange_->begin().id, told_, {}});
 }
 
 void Replication::confirmed(Node from, const Confirmed& confirmed) {

@@ -22,9 +22,10 @@ std::uint64_t milliseconds_since_1970() {
   return static_cast<std::uint64_t>(std::chrono::duration_cast<std::chrono::milliseconds>(since).count());
 }
 
-std::uint64_t digest_of(const Limits& limits) {
+std::uint64_t digest_of(const CorosyncOrdering::Settings& settings) {
   Digest digest;
-  digest.add(limits);
+  digest.add(settings.engine);
+  digest.add(settings.safe);
   return digest.value();
 }
 
@@ -104,7 +105,7 @@ void CorosyncOrdering::connected(const Process& self, const std::string& host_ad
   const Replication::Settings settings{.self = self,
                                        .safe = settings_.safe,
                                        .member_timeout = settings_.member_timeout,
-                                       .limits = digest_of(settings_.engine)};
+                                       .limits = digest_of(settings_)};
   Order& order = *this;  // named, since only here they are known to be
   Host& host = *this;
   replication_.emplace(settings, order, *replica_, host, random_number, milliseconds_since_1970);
