@@ -60,7 +60,7 @@ int fail(const char* problem, int status, bool daemon) {
   fprintf(stderr, "gsd: %s\n", problem);
   if (!daemon) return status;
   openlog("gsd", LOG_PID, LOG_DAEMON);
-  syslog(LOG_ERR, "not started: %s", problem);
+  syslog(LOG_ERR, "%s", problem);
   return status;
 }
 
