@@ -32,22 +32,6 @@ ClusterScene::Processes ClusterScene::members(int first, int last, const std::st
   return members;
 }
 
-int64_t ClusterScene::await_counts(int first, int last, uint64_t target) {
-  int64_t latest = 0;
-  for (int i = first; i <= last; i++) {
-    await("everybody is told", [&] { return slot(i).count.load(std::memory_order_acquire) >= target; });
-    latest = std::max(latest, slot(i).time.load());
-  }
-  return latest;
-}
-
-void ClusterScene::check(int first, int last) {
-  for (int i = first; i <= last; i++) {
-    if (slot(i).errors != 0) throw Failure{"slot " + std::to_string(i) + ": wrong sequence or contents"};
-    if (slot(i).digest != slot(first).digest) throw Failure{"members do not agree on what they saw"};
-  }
-}
-
 int ClusterScene::raw_slot(int host) { return 100 + host; }
 
 void ClusterScene::start_raw(int host) {

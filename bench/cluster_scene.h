@@ -47,13 +47,14 @@ class ClusterScene {
   /// Members in slots first to last, the one of slot `first` + i on host i + 1 as far as there are hosts, each in
   /// the group before the next one.
   Processes members(int first, int last, const std::string& group);
-  /// Dispatches, when there is something to, until the condition holds.
   template <class Condition>
-  void until(Condition condition);
-  /// Until all these slots have counted so far; the time of the latest.
-  int64_t await_counts(int first, int last, uint64_t target);
-  /// What was seen was right, and the same everywhere.
-  void check(int first, int last);
+  void until(Condition condition) {
+    dispatch_until(controller_, condition);
+  }
+  int64_t await_counts(int first, int last, uint64_t target) {
+    return zn::await_counts(board_, first, last - first + 1, target);
+  }
+  void check(int first, int last) { zn::check(board_, first, last - first + 1); }
 
   Process& raw(int host) { return *raw_[static_cast<size_t>(host)]; }
   static int raw_slot(int host);
@@ -69,15 +70,6 @@ class ClusterScene {
   Processes raw_;  // by host; there is no host 0
   zelt_gscl_V1::GSController controller_;
 };
-
-template <class Condition>
-void ClusterScene::until(Condition condition) {
-  const auto deadline = Clock::now() + kWaitLimit;
-  while (!condition()) {
-    wait_readable({controller_.getGSDescriptor()}, deadline);
-    if (controller_.dispatch(WYX_NON_BLOCKING) != WYX_OK) throw Failure{"dispatch failed"};
-  }
-}
 
 inline double microseconds(int64_t from, int64_t to) { return static_cast<double>(to - from) / 1e3; }
 inline double milliseconds(int64_t from, int64_t to) { return static_cast<double>(to - from) / 1e6; }

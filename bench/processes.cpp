@@ -18,17 +18,16 @@
 
 #include "bench/figures.h"
 #include "bench/process_roles.h"
+#include "bench/waits.h"
 
 namespace {
 
 using zelt_gscl_V1::GSController;
 using zn::BenchMember;
-using zn::Clock;
 using zn::Failure;
 using zn::Process;
 
-constexpr auto kLimit = std::chrono::seconds(60);  // a bound on a hang, not on what is measured
-constexpr int kSpread = 200;                       // subscribers, receivers and idle clients
+constexpr int kSpread = 200;  // subscribers, receivers and idle clients
 // Slots of the board.
 constexpr int kProposer = 0, kTalker = 10, kVictim = 20, kFirstOfMany = 100;
 
@@ -82,12 +81,14 @@ class Benchmark {
                                  const std::vector<std::string>& arguments);
   Children start_many(const zn::PrivateDaemon& daemon, const std::string& role, int first, int count,
                       const std::string& last_argument);
-  /// Dispatches for the proposer, when it has something to do, until the condition holds.
   template <class Condition>
-  void until(Condition condition);
-  /// Sleeps, so as to disturb nobody, until all slots have counted so far; the time of the latest.
-  int64_t await_counts(int first, int count, uint64_t target);
-  void check(int first, int count);
+  void until(Condition condition) {
+    zn::dispatch_until(*controller_, condition);
+  }
+  int64_t await_counts(int first, int count, uint64_t target) {
+    return zn::await_counts(board_, first, count, target);
+  }
+  void check(int first, int count) { zn::check(board_, first, count); }
 
   void latencies(bool one_core);
   void add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& bare);
@@ -125,35 +126,6 @@ Benchmark::Children Benchmark::start_many(const zn::PrivateDaemon& daemon, const
     children.push_back(start(daemon, role, {daemon_.folder() + "/board", std::to_string(i), last}));
   }
   return children;
-}
-
-template <class Condition>
-void Benchmark::until(Condition condition) {
-  const auto deadline = Clock::now() + kLimit;
-  while (!condition()) {
-    zn::wait_readable({controller_->getGSDescriptor()}, deadline);
-    if (controller_->dispatch(WYX_NON_BLOCKING) != WYX_OK) throw Failure{"dispatch failed"};
-  }
-}
-
-int64_t Benchmark::await_counts(int first, int count, uint64_t target) {
-  const auto deadline = Clock::now() + kLimit;
-  int64_t latest = 0;
-  for (int i = first; i < first + count; i++) {
-    while (board_[i].count.load(std::memory_order_acquire) < target) {
-      if (Clock::now() > deadline) throw Failure{"not everybody was told"};
-      ::usleep(200);
-    }
-    latest = std::max(latest, board_[i].time.load());
-  }
-  return latest;
-}
-
-void Benchmark::check(int first, int count) {
-  for (int i = first; i < first + count; i++) {
-    if (board_[i].errors != 0) throw Failure{"slot " + std::to_string(i) + ": wrong sequence or contents"};
-    if (board_[i].digest != board_[first].digest) throw Failure{"members do not agree on what they saw"};
-  }
 }
 
 Benchmark::Benchmark(const Settings& settings) : settings_(settings) {
@@ -256,11 +228,8 @@ void Benchmark::idle_memory() {
   zn::PrivateDaemon fresh;
   const double before = zn::resident_kib(fresh.pid());
   Children idle = start_many(fresh, "idle", kFirstOfMany, settings_.spread, "");
-  const auto deadline = Clock::now() + kLimit;
-  for (int i = kFirstOfMany; i < kFirstOfMany + settings_.spread; i++) {
-    while (board_[i].ready == 0 && Clock::now() < deadline) ::usleep(200);
-    if (board_[i].ready == 0) throw Failure{"an idle client did not connect"};
-  }
+  for (int i = kFirstOfMany; i < kFirstOfMany + settings_.spread; i++)
+    zn::await("an idle client has connected", [&] { return board_[i].ready != 0; });
   const double clients = zn::resident_kib(fresh.pid()) - before;
   figures_.add("memory of the daemon for an idle client", clients / settings_.spread, "KiB", 64);
   figures_.add("  " + std::to_string(settings_.spread) + " of them, over the daemon without clients",

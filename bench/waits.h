@@ -4,12 +4,14 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <string>
 #include <vector>
 
 #include "bench/board.h"
 #include "examples/processes.h"
+#include "gscl/gscl.h"
 
 namespace zn {
 
@@ -22,6 +24,34 @@ void await(const std::string& what, Condition condition) {
   while (!condition()) {
     if (Clock::now() > deadline) throw Failure{"waited in vain: " + what};
     ::usleep(200);
+  }
+}
+
+/// Dispatches, when there is something to, until the condition holds.
+template <class Condition>
+void dispatch_until(zelt_gscl_V1::GSController& controller, Condition condition) {
+  const auto deadline = Clock::now() + kWaitLimit;
+  while (!condition()) {
+    wait_readable({controller.getGSDescriptor()}, deadline);
+    if (controller.dispatch(WYX_NON_BLOCKING) != WYX_OK) throw Failure{"dispatch failed"};
+  }
+}
+
+/// Until so many slots have counted so far; the time of the latest.
+inline int64_t await_counts(Board& board, int first, int count, uint64_t target) {
+  int64_t latest = 0;
+  for (int i = first; i < first + count; i++) {
+    await("everybody is told", [&] { return board[i].count.load(std::memory_order_acquire) >= target; });
+    latest = std::max(latest, board[i].time.load());
+  }
+  return latest;
+}
+
+/// What was seen was right, and the same everywhere.
+inline void check(Board& board, int first, int count) {
+  for (int i = first; i < first + count; i++) {
+    if (board[i].errors != 0) throw Failure{"slot " + std::to_string(i) + ": wrong sequence or contents"};
+    if (board[i].digest != board[first].digest) throw Failure{"members do not agree on what they saw"};
   }
 }
 

@@ -236,7 +236,7 @@ class Replication {
   std::optional<Donation> donation_;
   std::shared_ptr<const Decision> decision_;     // of the last exchange
   std::map<Node, std::uint64_t> confirmations_;  // positions
-  std::uint64_t told_ = 0;                       // position that the others were told
+  std::uint64_t told_ = 0;                       // position up to which nothing is left to tell the others
   Time now_{};
   Time progressed_{};
   Time repeated_{};
