@@ -368,6 +368,8 @@ ClientMessage Reader::client_message(const fb::ClientMessage& m) {
       if (query->address() != nullptr) result.address = address(query->address());
       return result;
     }
+    case fb::ClientBody::Inspect:
+      return Inspect{bytes(m.body_as_Inspect()->ask())};
     case fb::ClientBody::NONE:
       break;
   }
@@ -409,6 +411,8 @@ ServerMessage Reader::server_message(const fb::ServerMessage& m, Token token) {
     case fb::ServerBody::NodeAdapters:
       return NodeAdapters{node_number(m.body_as_NodeAdapters()->node()),
                           adapters(*m.body_as_NodeAdapters()->adapters())};
+    case fb::ServerBody::Report:
+      return Report{bytes(m.body_as_Report()->report())};
     case fb::ServerBody::NONE:
       break;
   }

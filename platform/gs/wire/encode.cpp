@@ -138,6 +138,10 @@ ClientBody body(Builder& b, const QueryAdapters& m) {
   return {fb::ClientBody::QueryAdapters, fb::CreateQueryAdapters(b, m.node, address).Union()};
 }
 
+ClientBody body(Builder& b, const Inspect& m) {
+  return {fb::ClientBody::Inspect, fb::CreateInspect(b, put(b, m.ask)).Union()};
+}
+
 // ------------------------------------------------------------------------------------------- notifications
 
 using NotificationBody = Body<fb::Notification>;
@@ -257,6 +261,9 @@ ServerBody body(Builder& b, const DomainControl& m) {
 ServerBody body(Builder& b, const NodeAdapters& m) {
   const auto adapters = put_adapters(b, m.adapters);
   return {fb::ServerBody::NodeAdapters, fb::CreateNodeAdapters(b, m.node, adapters).Union()};
+}
+ServerBody body(Builder& b, const Report& m) {
+  return {fb::ServerBody::Report, fb::CreateReport(b, put(b, m.report)).Union()};
 }
 
 }  // namespace

@@ -50,11 +50,15 @@ struct QueryAdapters {
   std::uint32_t node = 0;
   std::optional<Adapter::Address> address;  // the one adapter that has it, on whatever node
 };
+/// Asks the daemon about itself; allowed on a connection that has said nothing else, and asked there alone.
+struct Inspect {
+  Bytes ask;  // an Ask of inspect/inspect.fbs
+};
 /// The session ends in good order: the daemon fails its providers as for a death but logs no error.
 struct Quit {};
 
-using ClientMessage =
-    std::variant<Hello, Attach, Call, SetResponsiveness, QueryNode, PingAnswer, Quit, QuorumAnswer, QueryAdapters>;
+using ClientMessage = std::variant<Hello, Attach, Call, SetResponsiveness, QueryNode, PingAnswer, Quit,
+                                   QuorumAnswer, QueryAdapters, Inspect>;
 
 // ---------------------------------------------------------------------------------------- daemon to client
 
@@ -97,8 +101,12 @@ struct Fanout {
 };
 /// A reader leaves it unread until all tokens have their notification, so that its descriptor stays readable.
 struct FanoutEnd {};
+/// Answers Inspect; a tap's come one after another.
+struct Report {
+  Bytes report;  // a Report of inspect/inspect.fbs
+};
 
 using ServerMessage = std::variant<Welcome, Answer, NodeInfo, Notify, Ping, Farewell, Fanout, FanoutEnd,
-                                   DomainControl, NodeAdapters>;
+                                   DomainControl, NodeAdapters, Report>;
 
 }  // namespace gs::wire
