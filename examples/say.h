@@ -10,12 +10,21 @@
 
 #include "gscl/wyx_api.h"
 
+/// The number in two parts, for people: the daemon numbers on from the microseconds since 1970 at its start.
+inline std::string event_text(std::uint64_t event) {
+  constexpr std::uint64_t kPart = 1000000;
+  char text[32];
+  std::snprintf(text, sizeof text, "%llu.%06llu", static_cast<unsigned long long>(event / kPart),
+                static_cast<unsigned long long>(event % kPart));
+  return event == 0 ? "-" : text;
+}
+
 /// Prints "SECONDS.MICROSECONDS EVENT TEXT"; the time is the host's, the same clock in every process.
 inline void say(std::uint64_t event, const std::string& text) {
   timespec now{};
   clock_gettime(CLOCK_MONOTONIC, &now);
-  std::printf("%lld.%06ld %llu %s\n", static_cast<long long>(now.tv_sec), now.tv_nsec / 1000,
-              static_cast<unsigned long long>(event), text.c_str());
+  std::printf("%lld.%06ld %s %s\n", static_cast<long long>(now.tv_sec), now.tv_nsec / 1000,
+              event_text(event).c_str(), text.c_str());
   std::fflush(stdout);
 }
 

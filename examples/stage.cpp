@@ -7,6 +7,7 @@
 #include <cstdio>
 
 #include "examples/demo.h"
+#include "examples/say.h"
 
 namespace zn {
 namespace {
@@ -31,22 +32,25 @@ struct Stage::Seen {
   std::string text;
 
   explicit Seen(const std::string& line) {
+    unsigned long long seconds = 0, micros = 0;
     int end = 0;
-    if (std::sscanf(line.c_str(), "%lf %llu %n", &time, &event, &end) != 2) {
+    const bool numbered = std::sscanf(line.c_str(), "%lf %llu.%6llu %n", &time, &seconds, &micros, &end) == 3;
+    if (!numbered && (std::sscanf(line.c_str(), "%lf - %n", &time, &end) != 1 || end == 0)) {
       throw Failure{"not a line of the timeline: " + line};
     }
+    event = seconds * 1000000 + micros;
     text = line.substr(static_cast<size_t>(end));
   }
 };
 
 Stage::Stage(Numbers numbers) : numbers_(numbers), start_(now()) {
-  std::printf("%s%14s  %-*s", colour("1"), "event", kTextWidth, "what happens");
+  std::printf("%s%18s  %-*s", colour("1"), "event", kTextWidth, "what happens");
   for (const char* name : kNames) std::printf("%*s", kTimeWidth, name);
   std::printf("%s\n", colour_off());
 }
 
 void Stage::action(const std::string& text) const {
-  std::printf("%s%16s%s%s\n", colour("2"), "", text.c_str(), colour_off());
+  std::printf("%s%20s%s%s\n", colour("2"), "", text.c_str(), colour_off());
   std::fflush(stdout);
 }
 
@@ -76,8 +80,10 @@ Stage::Seen Stage::next(size_t column) {
 
 void Stage::check_number(unsigned long long number) {
   if (number == 0) return;  // not of the group's, but about this host
-  if (number < last_event_ || (numbers_ == Numbers::kWithoutGaps && number > last_event_ + 1)) {
-    throw Failure{"event " + std::to_string(number) + " does not follow event " + std::to_string(last_event_)};
+  const bool follows =
+      numbers_ == Numbers::kRising || last_event_ == 0 ? number >= last_event_ : number - last_event_ <= 1;
+  if (!follows) {
+    throw Failure{"event " + event_text(number) + " does not follow event " + event_text(last_event_)};
   }
   last_event_ = number;
 }
@@ -89,8 +95,8 @@ void Stage::check_row(const Expected& event) {
     const Seen seen = next(column);
     if (times.empty()) number = seen.event;
     if (seen.text != text || seen.event != number) {
-      throw Failure{std::string(kNames[column]) + " saw event " + std::to_string(seen.event) + " \"" + seen.text +
-                    "\" where event " + std::to_string(number) + " \"" + text + "\" was expected"};
+      throw Failure{std::string(kNames[column]) + " saw event " + event_text(seen.event) + " \"" + seen.text +
+                    "\" where event " + event_text(number) + " \"" + text + "\" was expected"};
     }
     times[column] = seen.time;
   };
@@ -105,8 +111,8 @@ void Stage::check_row(const Expected& event) {
 
 void Stage::print_row(unsigned long long event, const std::string& text,
                       const std::map<size_t, double>& times) const {
-  const std::string number = event == 0 ? "-" : std::to_string(event);
-  std::printf("%14s  %s%-*s%s", number.c_str(), colour(kind_of(text)), kTextWidth, text.c_str(), colour_off());
+  const std::string number = event_text(event);
+  std::printf("%18s  %s%-*s%s", number.c_str(), colour(kind_of(text)), kTextWidth, text.c_str(), colour_off());
   int blank = 0;  // kept back, so that no line ends in blanks
   for (size_t c = 0; c < kColumns; c++) {
     blank += kTimeWidth;

@@ -87,13 +87,13 @@ TEST_F(DaemonSession, EveryMessageOutOfOrder_ClosesItsClientAndNobodyElse) {
   const wire::ClientMessage hello = wire::Hello{}, attach = wire::Attach{}, pong = wire::PingAnswer{},
                             quit = wire::Quit{}, node = wire::QueryNode{}, settings = wire::SetResponsiveness{},
                             call = wire::Call{GoodbyeRequest{1}}, quorum = wire::QuorumAnswer{1},
-                            adapters = wire::QueryAdapters{};
-  for (const auto& message : {call, settings, pong, quit, attach, quorum}) {
+                            adapters = wire::QueryAdapters{}, inspect = wire::Inspect{"\x01no question"};
+  for (const auto& message : {call, settings, pong, quit, attach, quorum, inspect}) {
     const ConnectionId id = daemon_.open();
     daemon_.say(id, message);
     EXPECT_TRUE(daemon_.closed(id)) << "first, kind " << message.index();
   }
-  for (const auto& message : {hello, attach, pong}) {
+  for (const auto& message : {hello, attach, pong, inspect}) {
     MemoryClient client(daemon_);
     daemon_.say(client.request, message);
     EXPECT_TRUE(client.closed()) << "request channel, kind " << message.index();

@@ -259,6 +259,12 @@ class Model {
   }
 
   /// One event is the same for all; only the proposer may differ, for those who read their own id there.
+  static bool only_changing(const Proposal& p) {
+    return std::ranges::all_of(*p.current_providers, [&](const ProviderId& id) {
+      return std::ranges::find(*p.changing_providers, id) != p.changing_providers->end();
+    });
+  }
+
   void group_event(const ProviderView& view, const ProtocolNotification& n) {
     GroupModel& group = groups_[view.group];
     if (group.event && group.event->seqnum == n.seqnum) {
@@ -267,13 +273,18 @@ class Model {
       if (!same(theirs, *group.event)) complain(view.group, n, "is not the same for all");
       return;
     }
-    if (n.seqnum == 1) {  // born again
+    const bool starts =
+        n.proposal.num_phases == WYX_1_PHASE || (n.type == WYX_N_PHASE_NOTIFICATION && n.proposal.phase == 1);
+    const bool first = starts && n.protocol == WYX_JOIN && only_changing(n.proposal);
+    if (first) {  // born again
       for (const auto& [endpoint, other] : providers_)
         if (other.group == view.group && other.joined)
           complain(view.group, n, "is the first of a group with members");
+      if (n.seqnum <= group.seqnum) complain(view.group, n, "goes back");
       group = {};
+    } else if (n.seqnum != group.seqnum + 1) {
+      complain(view.group, n, "does not follow the last one");
     }
-    if (n.seqnum != group.seqnum + 1) complain(view.group, n, "does not follow the last one");
     if (n.protocol == WYX_JOIN && !view.joined) group.attributes = view.attributes;
     if (group.open)
       check_end_of_phase(view.group, group, n);
@@ -489,7 +500,7 @@ class Model {
 
   void check_groups(const Engine& engine) {
     std::set<std::string> names;
-    for (const Engine::GroupStatus& status : engine.status()) {
+    for (const GroupStatus& status : engine.status()) {
       names.insert(status.name);
       check_group(engine, status, groups_[status.name]);
     }
@@ -505,12 +516,12 @@ class Model {
   }
 
   /// While a protocol runs it waits for somebody; at rest nothing is owed and only the living are members.
-  void check_group(const Engine& engine, const Engine::GroupStatus& status, GroupModel& group) {
+  void check_group(const Engine& engine, const GroupStatus& status, GroupModel& group) {
     bool waits = false;
     std::set<ProviderId> alive;
     group.unfinished = status.unfinished;
     if (status.unfinished && !engine.busy()) errors_ += status.name + ": has work that nobody asks for\n";
-    const bool at_rest = status.running_protocol.empty() && !status.unfinished;
+    const bool at_rest = !status.running && !status.unfinished;
     for (const auto& [endpoint, view] : providers_) {
       if (view.group != status.name) continue;
       waits |= view.asked;
@@ -521,12 +532,12 @@ class Model {
       if (at_rest && view.seqnum != status.seqnum) error(endpoint, "has not seen the group's last event");
     }
     group.heard = !alive.empty();
-    if (!group.heard) group.members = status.members;  // nobody was left to be told
-    if (!alive.empty() && (status.members != group.members || status.state_length != group.value.size()))
+    if (!group.heard) group.members = *status.members;  // nobody was left to be told
+    if (!alive.empty() && (*status.members != group.members || *status.state != group.value))
       errors_ += status.name + ": is not what its members believe\n";
     if (!at_rest && !waits && !status.unfinished)
       errors_ += status.name + ": runs a protocol and waits for nobody\n";
-    if (at_rest && std::set<ProviderId>(status.members.begin(), status.members.end()) != alive)
+    if (at_rest && std::set<ProviderId>(status.members->begin(), status.members->end()) != alive)
       errors_ += status.name + ": is at rest with members that are not alive\n";
   }
 

@@ -56,6 +56,8 @@ inline auto fields(const FanoutEnd&) { return std::tie(); }
 inline auto fields(const QuorumAnswer& m) { return std::tie(m.sequence); }
 inline auto fields(const QueryAdapters& m) { return std::tie(m.node, m.address); }
 inline auto fields(const DomainControl& m) { return std::tie(m.what); }
+inline auto fields(const Inspect& m) { return std::tie(m.ask); }
+inline auto fields(const Report& m) { return std::tie(m.report); }
 inline auto fields(const NodeAdapters& m) { return std::tie(m.node, m.adapters); }
 
 }  // namespace wire

@@ -5,10 +5,12 @@
 namespace gs::cluster {
 namespace {
 
-/// Greater than any before, as long as Corosync keeps the sequence of its rings.
+/// Greater than any before, as long as Corosync keeps the sequence of its rings, and than those that a host which
+/// was alone has had until then.
 std::uint64_t numbers_of(const Begin& begin) {
-  constexpr int kClockBits = 42;  // of milliseconds: until 2109
-  return (begin.ring.sequence << kClockBits) | (begin.clock & ((std::uint64_t{1} << kClockBits) - 1));
+  constexpr int kRingShift = 42;  // a ring has fewer events
+  constexpr std::uint64_t kMicrosecondsPerMillisecond = 1000;
+  return (begin.ring.sequence << kRingShift) + begin.clock * kMicrosecondsPerMillisecond;
 }
 
 }  // namespace

@@ -9,7 +9,9 @@ namespace gs::daemon {
 
 class LocalOrdering : public Ordering {
  public:
-  explicit LocalOrdering(Node node) : domain_{node, {node}} {}
+  /// Events are numbered above what `clock` says when it begins to serve: above all before, as long as it goes on
+  /// and counts faster than there are events. Null: from 1.
+  explicit LocalOrdering(Node node, std::uint64_t (*clock)() = nullptr) : domain_{node, {node}}, clock_(clock) {}
 
   void start(Replica& replica) override {
     replica_ = &replica;
@@ -37,6 +39,7 @@ class LocalOrdering : public Ordering {
 
  private:
   void serve() {
+    if (clock_ != nullptr) replica_->apply(NumbersEvent{clock_()});
     replica_->apply(HostCameEvent{domain_.self});
     replica_->serve(domain_);
   }
@@ -48,6 +51,7 @@ class LocalOrdering : public Ordering {
   };
 
   const Domain domain_;
+  std::uint64_t (*const clock_)();
   Replica* replica_ = nullptr;
   std::deque<Event> waiting_;
   bool delivering_ = false;

@@ -35,6 +35,7 @@ class Pinger {
   /// check or an action other than ping, announcement and close. Both change nothing.
   wyx_rc_t set(const wire::SetResponsiveness& wanted);
   void answered(const wire::PingAnswer& answer);
+  bool responding() const { return responding_; }
 
  private:
   void stop();

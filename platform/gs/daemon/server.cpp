@@ -38,6 +38,11 @@ void add(event* what, const timeval* after = nullptr) {
   if (event_add(what, after) != 0) throw std::bad_alloc();
 }
 
+std::uint64_t microseconds_since_1970() {
+  const auto since = std::chrono::system_clock::now().time_since_epoch();
+  return static_cast<std::uint64_t>(std::chrono::duration_cast<std::chrono::microseconds>(since).count());
+}
+
 /// As much as the system allows: past its limit for everyone where we may, else up to it.
 void enlarge_send_buffer(int fd) {
   if (setsockopt(fd, SOL_SOCKET, SO_SNDBUFFORCE, &kSendBuffer, sizeof kSendBuffer) == 0) return;
@@ -158,7 +163,10 @@ Server::Server(const Options& options, std::shared_ptr<spdlog::logger> log)
       sessions_({.queue_bound = options.queue_bound,
                  .drain_time = options.drain_time,
                  .limits = limits_of(options),
-                 .engine = options.engine},
+                 .engine = options.engine,
+                 .ordering = options.corosync ? "corosync" : "local",
+                 .version = GSD_VERSION,
+                 .node = options.corosync ? 0 : options.node_number},
                 {*this, *ordering_, now, random_number, log_, [this] { add(continue_.get(), &kAtOnce); },
                  [] { malloc_trim(0); }, options.corosync ? adapters_of_host : nullptr}),
       packet_(wire::kMaxPacket + 1) {
@@ -195,7 +203,7 @@ void Server::run() {
 }
 
 std::unique_ptr<Ordering> Server::make_ordering(const Options& options) {
-  if (!options.corosync) return std::make_unique<LocalOrdering>(options.node_number);
+  if (!options.corosync) return std::make_unique<LocalOrdering>(options.node_number, microseconds_since_1970);
   if (!options.require_quorum)
     log_->warn("require-quorum is no: hosts that lose sight of one another each go on, and differ from then on");
   CorosyncOrdering::Settings settings;

@@ -49,10 +49,7 @@ class Server : private Transport {
   spdlog::logger& log() { return *log_; }
   void set_bounds(const Options& options);
   std::size_t clients() const { return sessions_.sessions(); }
-  /// Null: no client is served.
-  const Domain* domain() const { return sessions_.domain(); }
-  std::vector<Engine::GroupStatus> groups() const { return sessions_.groups(); }
-  std::vector<SessionLayer::SessionStatus> sessions() const { return sessions_.status(); }
+  inspect::ReportT inspect(const inspect::AskT& ask) const { return sessions_.inspect(ask); }
 
  private:
   struct FreeBase {

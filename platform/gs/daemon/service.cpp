@@ -18,36 +18,52 @@ void line(const char* label, const std::string& text) {
   dae_status_printf("%s\n", text.c_str());
 }
 
-std::string members_of(const Engine::GroupStatus& group) {
-  std::string text;
-  for (const ProviderId& member : group.members) {
-    text += (text.empty() ? "" : " ") + std::to_string(member.instance) + "@" + std::to_string(member.node);
-  }
-  return text;
+std::string text(const inspect::Id& id) { return std::to_string(id.instance()) + "@" + std::to_string(id.node()); }
+
+std::string members_of(const inspect::GroupT& group) {
+  std::string all;
+  for (const inspect::Id& member : group.members) all += (all.empty() ? "" : " ") + text(member);
+  return all;
 }
 
-void print_group(const Engine::GroupStatus& group) {
+void print_group(const inspect::GroupT& group) {
   line("group", printable(group.name));
   line("  members", std::to_string(group.members.size()) + ": " + members_of(group));
-  line("  state", std::to_string(group.state_length) + " bytes, event " + std::to_string(group.seqnum));
-  line("  protocol", group.running_protocol.empty() ? "none" : group.running_protocol);
+  line("  state", std::to_string(group.state_size) + " bytes, event " + std::to_string(group.event_number));
+  line("  protocol", group.running ? group.running->kind : "none");
   line("  subscribers", std::to_string(group.subscribers));
 }
 
-std::string domain_of(const Domain* domain) {
-  if (domain == nullptr) return "serving nobody";
-  std::string text = "node " + std::to_string(domain->self);
-  if (domain->nodes.size() == 1) return text;
+std::string domain_of(const inspect::DaemonT& daemon) {
+  if (!daemon.serving) return "serving nobody";
+  std::string text = "node " + std::to_string(daemon.node);
+  if (daemon.nodes.size() == 1) return text;
   text += " of";
-  for (const Node node : domain->nodes) text += " " + std::to_string(node);
+  for (const std::uint32_t node : daemon.nodes) text += " " + std::to_string(node);
   return text;
 }
 
-void print_session(const SessionLayer::SessionStatus& session) {
-  line("session", std::to_string(session.number) + " " + session.program + " (pid " + std::to_string(session.pid) +
-                      ", uid " + std::to_string(session.uid) + ")");
+void print_session(const inspect::SessionT& session) {
+  const inspect::ProcessT& process = *session.process;
+  line("session", std::to_string(session.number) + " " + process.program + " (pid " + std::to_string(process.pid) +
+                      ", uid " + std::to_string(process.uid) + ")");
   line("  queued", std::to_string(session.answer_bytes) + " bytes of answers, " +
                        std::to_string(session.notification_bytes) + " of notifications");
+}
+
+/// Page after page, all of the same moment. Returns how many there were.
+template <typename List, typename Print>
+std::size_t print_all(const Server& server, inspect::What what, List inspect::ReportT::*list, Print print) {
+  inspect::AskT ask;
+  ask.what = what;
+  for (std::size_t printed = 0;;) {
+    const inspect::ReportT page = server.inspect(ask);
+    for (const auto& entry : page.*list) print(*entry);
+    printed += (page.*list).size();
+    if (!page.more) return printed;
+    ask.from = page.next;
+    ask.after = page.next_group;
+  }
 }
 
 }  // namespace
@@ -145,12 +161,11 @@ void Service::on_hangup() {
 
 void Service::longStatus() {
   print_short_status();
-  const auto groups = server_->groups();
-  const auto sessions = server_->sessions();
-  for (const auto& group : groups) print_group(group);
-  for (const auto& session : sessions) print_session(session);
-  line("total", std::to_string(groups.size()) + " groups, " + std::to_string(sessions.size()) + " sessions, " +
-                    domain_of(server_->domain()));
+  const std::size_t groups = print_all(*server_, inspect::What::Groups, &inspect::ReportT::groups, print_group);
+  const std::size_t sessions =
+      print_all(*server_, inspect::What::Sessions, &inspect::ReportT::sessions, print_session);
+  line("total", std::to_string(groups) + " groups, " + std::to_string(sessions) + " sessions, " +
+                    domain_of(*server_->inspect({}).daemon));
 }
 
 }  // namespace gs::daemon

@@ -22,7 +22,8 @@ SessionLayer::SessionLayer(const Settings& settings, Environment environment)
       env_(std::move(environment)),
       client_log_(*env_.log),
       engine_(std::make_unique<Engine>(settings.engine)),
-      accounts_(settings.limits) {
+      accounts_(settings.limits),
+      started_(env_.now()) {
   for (std::size_t rc = 0; rc < answers_.size(); ++rc) {
     answers_[rc] = wire::encode(wire::Answer{static_cast<wyx_rc_t>(rc)});
   }
@@ -49,6 +50,7 @@ void SessionLayer::set_bounds(std::size_t queue_bound, Duration drain_time, cons
 
 void SessionLayer::opened(ConnectionId id, const Peer& peer) {
   Connection& connection = connections_.try_emplace(id, peer, accounts_, recent_).first->second;
+  ++counters_.connections;
   if (const char* problem = accounts_.problem_with_connection(connection.share.account())) {
     return refuse(id, problem);
   }
@@ -142,6 +144,13 @@ void SessionLayer::on_message(ConnectionId id, Connection& connection, wire::Cli
       return on_request_channel(id, connection, message);
     case Channel::kEvent:
       break;
+    case Channel::kInspect:
+    case Channel::kTap: {
+      const auto* inspect = std::get_if<wire::Inspect>(&message);
+      if (inspect != nullptr && connection.channel == Channel::kInspect)
+        return on_inspect(id, connection, *inspect);
+      return end(id, End::kFault, "out of order: a message not for a connection that inspects");
+    }
   }
   const auto* ping_answer = std::get_if<wire::PingAnswer>(&message);
   if (ping_answer == nullptr) return end(id, End::kFault, "out of order: a message not for the event channel");
@@ -151,6 +160,7 @@ void SessionLayer::on_message(ConnectionId id, Connection& connection, wire::Cli
 void SessionLayer::on_fresh(ConnectionId id, Connection& connection, const wire::ClientMessage& message) {
   if (const auto* hello = std::get_if<wire::Hello>(&message)) return on_hello(id, connection, *hello);
   if (const auto* attach = std::get_if<wire::Attach>(&message)) return on_attach(id, connection, *attach);
+  if (const auto* inspect = std::get_if<wire::Inspect>(&message)) return on_inspect(id, connection, *inspect);
   if (on_query(id, message)) return;
   end(id, End::kFault, "out of order: neither Hello nor Attach came first");
 }
@@ -209,6 +219,8 @@ void SessionLayer::begin_session(ConnectionId id, Connection& connection, const 
   connection.session = number;
   session.request = id;
   session.cookie = env_.random();
+  session.since = env_.now();
+  ++counters_.sessions;
   session.domain = DomainListener(hello.socket_control);
   session.program = printable(hello.program);
   session.program.resize(platform::utf8_length(std::string_view(session.program).substr(0, kProgramName)));
@@ -244,6 +256,7 @@ void SessionLayer::on_call(ConnectionId id, Connection& connection, wire::Call& 
   const bool has_room = !short_of_memory_ && env_.ordering.has_room();
   if (!has_room && needs_memory(call.request)) return answer(id, WYX_NO_MEMORY);
   session->answer_due = true;
+  ++counters_.requests;
   env_.ordering.submit(
       RequestEvent{id_of(connection.session), std::move(call.request), false, connection.peer.uid});
 }
@@ -295,6 +308,7 @@ void SessionLayer::on_query_adapters(ConnectionId id, const wire::QueryAdapters&
 void SessionLayer::send_ping(std::uint64_t session, std::uint64_t ping) {
   const Session* found = find_session(session);
   if (found == nullptr || found->event == 0) return;
+  ++counters_.pings;
   try {
     send(found->event, wire::Ping{ping});
   } catch (const std::exception& error) {
@@ -319,7 +333,7 @@ void SessionLayer::too_slow(std::uint64_t session) {
 void SessionLayer::apply(const Event& event) {
   const char* failed = "finished: ";
   try {
-    const Outcome outcome = engine_->apply(event);
+    const Outcome outcome = engine_->apply(event, env_.now().count());
     failed = "told: ";
     deliver(event, outcome);
   } catch (const std::exception& error) {
@@ -346,6 +360,7 @@ void SessionLayer::deliver(const Event& event, const Outcome& outcome) {
   if (accounts_.waiting() == 0) recent_.drop();
   for (const TimerRequest& timer : outcome.timers) arm(timer);
   continue_later();
+  if (!taps_.empty()) feed_taps_soon();
 }
 
 /// The first of the hosts does, and each next one a while later: it may be gone.
@@ -433,6 +448,7 @@ void SessionLayer::reset(const std::string& why) {
   env_.log->critical("{}; all sessions are closed and all groups end", why);
   forget_sessions();
   engine_ = std::make_unique<Engine>(settings_.engine);
+  engine_->observe(taps_.empty() ? nullptr : &taps_);
   return_memory_soon();
 }
 
@@ -466,6 +482,7 @@ void SessionLayer::answer_request(SessionId asker, wyx_rc_t rc) {
   Session* session = find_session(asker.number);
   if (session == nullptr || !session->answer_due) return;
   session->answer_due = false;
+  if (rc != WYX_OK) ++counters_.refused;
   answer(session->request, rc);
 }
 
@@ -503,6 +520,7 @@ void SessionLayer::deliver_to_session(std::span<const Delivery* const> to, const
   const ConnectionId event = session->event;
   const bool at_once = sent_at_once_ < kEventShare;
   if (at_once) sent_at_once_ += what->size();
+  counters_.notifications += to.size();
   try {
     if (to.size() == 1) return void(put(event, {{}, what, to.front()->to.token}, at_once));
     wire::Fanout fanout;
@@ -645,7 +663,8 @@ bool SessionLayer::handle(ConnectionId id, OutQueue::Sent sent) {
 /// bring a client more than any bound.
 void SessionLayer::watch_bound(ConnectionId id, Connection& connection) {
   const std::size_t bytes = connection.out.bytes();
-  if (bytes <= settings_.queue_bound) return timers_.cancel(connection.drain_limit);
+  if (bytes <= settings_.queue_bound || connection.channel == Channel::kTap)
+    return timers_.cancel(connection.drain_limit);
   if (connection.channel != Channel::kEvent) {
     return end(id, End::kFault, "asks and does not read the answers: " + std::to_string(bytes) + " bytes wait");
   }
@@ -762,6 +781,7 @@ void SessionLayer::end(ConnectionId id, End how, const std::string& why) {
   Connection* connection = find(id);
   if (connection == nullptr) return;
   if (connection->session != 0) return end_session(connection->session, how, why);
+  if (how == End::kFault) ++counters_.faults;
   // A connection that asks for the node and goes is nothing to speak of.
   log_about(connection->peer.uid, how == End::kFault ? spdlog::level::warn : spdlog::level::debug,
             describe(*connection) + ": closed: " + why);
@@ -772,6 +792,7 @@ void SessionLayer::end_session(std::uint64_t number, End how, const std::string&
   const auto found = sessions_.find(number);
   if (found == sessions_.end()) return;
   const Connection& closed = *find(found->second.request);
+  if (how == End::kFault) ++counters_.faults;
   log_about(closed.peer.uid, how == End::kFault ? spdlog::level::warn : spdlog::level::info,
             describe(closed) + ": closed: " + why);
   const ConnectionId request = found->second.request;
@@ -793,6 +814,7 @@ void SessionLayer::drop(ConnectionId id) {
   timers_.cancel(found->second.handshake);
   timers_.cancel(found->second.message_limit);
   timers_.cancel(found->second.drain_limit);
+  if (found->second.channel == Channel::kTap) remove_tap(id);
   connections_.erase(found);
   env_.transport.close(id);
 }
@@ -810,22 +832,6 @@ std::string SessionLayer::describe(const Connection& connection) const {
   const auto session = sessions_.find(connection.session);
   if (session == sessions_.end()) return "connection (" + peer + ")";
   return "session " + std::to_string(session->first) + " (\"" + session->second.program + "\", " + peer + ")";
-}
-
-std::vector<SessionLayer::SessionStatus> SessionLayer::status() const {
-  std::vector<SessionStatus> result;
-  const auto bytes_for = [&](ConnectionId id) {
-    const auto found = connections_.find(id);
-    return found == connections_.end() ? 0 : found->second.out.bytes();
-  };
-  for (const auto& [number, session] : sessions_) {
-    const auto request = connections_.find(session.request);
-    const Peer peer = request == connections_.end() ? Peer{} : request->second.peer;
-    result.push_back(
-        {number, session.program, peer.pid, peer.uid, bytes_for(session.request), bytes_for(session.event)});
-  }
-  std::sort(result.begin(), result.end(), [](const auto& a, const auto& b) { return a.number < b.number; });
-  return result;
 }
 
 }  // namespace gs::daemon

@@ -10,6 +10,10 @@
 //   fresh     Welcome->request   Answer->event      close       close       answer     close       close
 //   request   close              close              Answer (1)  Answer      answer     close       Answer, end
 //   event     close              close              close       close       close      noted       close
+//   inspect   close              close              close       close       close      close       close
+//
+// Inspect makes a fresh connection one of those that inspect, on which nothing else is said: each is answered with
+// a Report. From the one that asks for a tap on, Reports come unasked, and any message closes it.
 //
 //   (1) once the session's event channel is attached; before that: close.
 //   (2) or QuorumAnswer. (3) QueryNode: NodeInfo. QueryAdapters: NodeAdapters.
@@ -36,9 +40,11 @@
 
 #include "common/client_log.h"
 #include "daemon/accounts.h"
+#include "daemon/inspection.h"
 #include "daemon/ordering.h"
 #include "daemon/out_queue.h"
 #include "daemon/pinger.h"
+#include "daemon/taps.h"
 #include "daemon/timers.h"
 #include "daemon/transport.h"
 #include "engine/domain_listener.h"
@@ -56,6 +62,10 @@ class SessionLayer : private PingSink, private Replica {
     ClientLimits limits{};
     Duration handshake_limit{10'000};  // to say Hello or Attach, to attach after Hello, to finish a message
     Limits engine{};
+    // For people.
+    const char* ordering = "local";
+    const char* version = "";
+    std::uint32_t node = 0;  // before the ordering names it; 0: not known
   };
   /// What it is given of the outside world.
   struct Environment {
@@ -101,20 +111,10 @@ class SessionLayer : private PingSink, private Replica {
   std::size_t sessions() const { return sessions_.size(); }
   std::size_t phase_timers() const { return phase_timers_.size(); }
 
-  /// For people: a session as it stands.
-  struct SessionStatus {
-    std::uint64_t number = 0;
-    std::string program;
-    int pid = 0;
-    std::uint32_t uid = 0;
-    std::size_t answer_bytes = 0;        // that wait for the client to read them
-    std::size_t notification_bytes = 0;  // likewise
-  };
   /// Null: no client is served.
   const Domain* domain() const { return serving_ ? &domain_ : nullptr; }
-  /// In the order of their numbers.
-  std::vector<SessionStatus> status() const;
-  std::vector<Engine::GroupStatus> groups() const { return engine_->status(); }
+  /// What it tells of itself; not for a tap.
+  inspect::ReportT inspect(const inspect::AskT& ask) const;
 
   /// Into the log, unless there have been too many such lines of late. `user`: whose doing it is, if anybody's.
   void log_about(std::optional<std::uint32_t> user, spdlog::level::level_enum level, const std::string& line);
@@ -123,7 +123,7 @@ class SessionLayer : private PingSink, private Replica {
   void set_bounds(std::size_t queue_bound, Duration drain_time, const ClientLimits& limits);
 
  private:
-  enum class Channel { kFresh, kRequest, kEvent };
+  enum class Channel { kFresh, kRequest, kEvent, kInspect, kTap };
   struct Connection {
     Connection(const Peer& of, Accounts& accounts, RecentPackets& recent)
         : peer(of), share(accounts, of.uid), out(share.account(), recent) {}
@@ -150,6 +150,7 @@ class SessionLayer : private PingSink, private Replica {
     std::string program;
     bool answer_due = false;  // of a Call that is being ordered
     DomainListener domain;
+    Time since{};
     Timers::Id attach_limit;
     SessionShare share;
     Pinger pinger;
@@ -179,6 +180,8 @@ class SessionLayer : private PingSink, private Replica {
   static constexpr Duration kBetweenReturns{100};                   // of memory to the system
   static constexpr Duration kStalled{1'000};                        // without progress
   static constexpr Duration kBetweenLooks{100};                     // for those who are stalled
+  static constexpr Duration kTapPause{10};                          // in which what happens is gathered
+  static constexpr std::size_t kTapBound = 1024 * 1024;             // bytes that may wait for a tap
 
   // One message of a client; each may close the connection it came on.
   void handshake_over(ConnectionId id);
@@ -195,6 +198,13 @@ class SessionLayer : private PingSink, private Replica {
   bool on_query(ConnectionId id, const wire::ClientMessage& message);
   void on_query_node(ConnectionId id);
   void on_query_adapters(ConnectionId id, const wire::QueryAdapters& query);
+  void on_inspect(ConnectionId id, Connection& connection, const wire::Inspect& inspect);
+  void begin_tap(ConnectionId id, Connection& connection, const inspect::AskT& ask);
+  void remove_tap(ConnectionId id);
+  void feed_taps_soon();
+  void feed_taps();
+  void feed_tap(ConnectionId id);
+  std::vector<SessionStatus> session_statuses() const;
 
   // Of the pingers.
   void send_ping(std::uint64_t session, std::uint64_t ping) override;
@@ -299,6 +309,10 @@ class SessionLayer : private PingSink, private Replica {
   bool continue_due_ = false;   // was asked for
   bool serving_ = false;
   Domain domain_;
+  const Time started_;
+  Counters counters_;
+  Taps taps_;
+  Timers::Id feed_taps_;
 };
 
 }  // namespace gs::daemon

@@ -14,10 +14,11 @@ struct Engine::State : EngineState {
   using EngineState::EngineState;
 
   std::size_t work_left = 0;  // of the event that is being applied
+  Watch watch;
 
   Surroundings surroundings(Outcome& out) {
-    return {out.deliveries, out.timers, subscribers, clients,  last_protocol,
-            numbers_above,  ledger,     limits,      work_left};
+    return {out.deliveries, out.timers, subscribers, clients, last_protocol,
+            numbers_above,  watch,      ledger,      limits,  work_left};
   }
 
   const Group* find_group(const std::string& name) const {
@@ -70,6 +71,8 @@ struct Engine::State : EngineState {
   void apply(const NumbersEvent& event, Outcome& out);
   void apply(const AdaptersEvent& event, Outcome& out);
 
+  void tell(const RequestEvent& event, wyx_rc_t rc) const;
+  void tell_failure(const Client& client, std::uint32_t leave_code);
   void lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out);
   void settle(Groups::iterator group, Outcome& out);
   void stand_in_line(const std::string& group);
@@ -182,6 +185,7 @@ wyx_rc_t Engine::State::check(const Payer& from, const UnsubscribeRequest& reque
 void Engine::State::apply(const RequestEvent& event, Outcome& out) {
   const Payer from{event.session, event.user};
   out.rc = check(from, event.request);
+  if (watch.observer != nullptr) tell(event, out.rc);
   if (out.rc == WYX_OK) {
     std::visit([&](const auto& r) { perform(from, r, out); }, event.request);
     return;
@@ -206,7 +210,7 @@ void Engine::State::perform(const Payer& from, const JoinRequest& request, Outco
   joiner->local_name = request.local_name;
   joiner->charge = Ledger::Charge(ledger, from, room_for(request));
   clients.add(joiner->to, {name, joiner});
-  const auto group = groups.try_emplace(name, name).first;
+  const auto group = groups.try_emplace(name, name, ended_number).first;
   group->second.join(std::move(joiner), request);
   settle(group, out);
 }
@@ -219,6 +223,7 @@ void Engine::State::perform(const Payer& from, const LeaveRequest& request, Outc
 
 void Engine::State::perform(const Payer& from, const GoodbyeRequest& request, Outcome& out) {
   const auto [provider, group] = provider_of(from, request.token);
+  tell_failure({group->first, provider}, WYX_PROVIDER_SAID_GOODBYE);
   clients.erase({from.session, request.token});
   group->second.lose(provider, WYX_PROVIDER_SAID_GOODBYE);
   settle(group, out);
@@ -275,6 +280,16 @@ void Engine::State::apply(const AdaptersEvent& event, Outcome&) { hosts.set_adap
 void Engine::State::apply(const TimerExpiredEvent& event, Outcome& out) {
   auto it = groups.find(event.timer.group);
   if (it == groups.end()) return;
+  if (watch.observer != nullptr && it->second.awaits(event.timer)) {
+    Happening told;
+    told.kind = Happening::Kind::kTimer;
+    told.group = it->first;
+    told.protocol = it->second.running_protocol();
+    told.number = event.timer.protocol;
+    told.phase = event.timer.phase;
+    told.n_phase = true;
+    watch.observer->happened(told);
+  }
   it->second.expire(event.timer);
   settle(it, out);
 }
@@ -300,6 +315,44 @@ void Engine::State::apply(const NumbersEvent& event, Outcome&) {
   last_protocol = std::max(last_protocol, event.above);
 }
 
+void Engine::State::tell(const RequestEvent& event, wyx_rc_t rc) const {
+  constexpr const char* kNames[] = {"join",       "state",   "message", "leave",     "expel",
+                                    "attributes", "goodbye", "vote",    "subscribe", "unsubscribe"};
+  static_assert(std::size(kNames) == std::variant_size_v<Request>);
+  Happening told;
+  told.protocol = kNames[event.request.index()];
+  told.session = event.session;
+  told.rc = rc;
+  const Token token = std::visit([](const auto& r) { return r.token; }, event.request);
+  if (const auto* join = std::get_if<JoinRequest>(&event.request)) {
+    told.group = join->attributes.group_name;
+    told.name = join->local_name;
+    told.who = ProviderId{join->instance, static_cast<std::int16_t>(event.session.node)};
+  } else if (const auto* subscribe = std::get_if<SubscribeRequest>(&event.request)) {
+    told.group = subscribe->group_name;
+  } else if (const Client* client = clients.find({event.session, token})) {
+    told.group = client->group;
+    if (client->provider) {
+      told.name = client->provider->local_name;
+      told.who = client->provider->id;
+    }
+  }
+  watch.observer->happened(told);
+}
+
+void Engine::State::tell_failure(const Client& client, std::uint32_t leave_code) {
+  ++watch.tally.failures;
+  if (watch.observer == nullptr) return;
+  Happening told;
+  told.kind = Happening::Kind::kFailure;
+  told.group = client.group;
+  told.who = client.provider->id;
+  told.name = client.provider->local_name;
+  told.session = client.provider->to.session;
+  told.leave_code = leave_code;
+  watch.observer->happened(told);
+}
+
 /// All are taken out before any group is told, so that nobody who is lost in this event is sent anything.
 void Engine::State::lose_clients(SessionId first, SessionId last, std::uint32_t leave_code, Outcome& out) {
   while (const auto session = clients.take_session(first, last)) {
@@ -308,6 +361,7 @@ void Engine::State::lose_clients(SessionId first, SessionId last, std::uint32_t 
         subscribers.remove(client.group, client.subscription);
         continue;
       }
+      tell_failure(client, leave_code);
       groups.at(client.group).lose(client.provider, leave_code);
       stand_in_line(client.group);
     }
@@ -321,7 +375,9 @@ void Engine::State::settle(Groups::iterator group, Outcome& out) {
   Surroundings env = surroundings(out);
   group->second.settle(env);
   if (group->second.unfinished()) stand_in_line(group->first);
-  if (group->second.finished()) groups.erase(group);
+  if (!group->second.finished()) return;
+  ended_number = std::max(ended_number, group->second.seqnum());
+  groups.erase(group);
 }
 
 void Engine::State::stand_in_line(const std::string& name) {
@@ -347,8 +403,9 @@ void Engine::State::go_on(Outcome& out) {
 Engine::Engine(const Limits& limits) : state_(std::make_unique<State>(limits)) {}
 Engine::~Engine() = default;
 
-Outcome Engine::apply(const Event& event) {
+Outcome Engine::apply(const Event& event, Moment now) {
   Outcome out;
+  state_->watch.now = now;
   state_->work_left = std::max<std::size_t>(state_->limits.slice, 1);
   std::visit([&](const auto& e) { state_->apply(e, out); }, event);
   return out;
@@ -386,20 +443,63 @@ MissingVotes Engine::missing_votes(const std::string& name, std::size_t at_most)
           group->missing_voters(at_most)};
 }
 
-std::vector<Engine::GroupStatus> Engine::status() const {
-  std::vector<GroupStatus> all;
+void Engine::observe(Observer* observer) { state_->watch.observer = observer; }
+
+const Tally& Engine::tally() const { return state_->watch.tally; }
+
+Totals Engine::totals() const {
+  Totals totals{state_->groups.size()};
   for (const auto& [name, group] : state_->groups) {
-    GroupStatus status;
-    status.name = name;
-    status.members = group.member_ids();
-    status.state_length = group.state_length();
-    status.seqnum = group.seqnum();
-    status.running_protocol = group.running_protocol();
-    status.unfinished = group.unfinished();
-    status.subscribers = state_->subscribers.count(name);
-    all.push_back(std::move(status));
+    totals.members += group.member_ids().size();
+    if (group.running_phase() != 0) ++totals.running;
   }
-  return all;
+  for (const auto& [name, subscribers] : state_->subscribers.groups()) totals.subscribers += subscribers.size();
+  return totals;
+}
+
+std::optional<GroupStatus> Engine::status_of(const std::string& name) const {
+  const Group* group = state_->find_group(name);
+  if (group == nullptr) return std::nullopt;
+  GroupStatus status = group->status();
+  status.subscribers = state_->subscribers.count(name);
+  return status;
+}
+
+std::vector<GroupStatus> Engine::status(const std::string& after, std::size_t at_most) const {
+  std::vector<GroupStatus> found;
+  const auto& groups = state_->groups;
+  auto at = after.empty() ? groups.begin() : groups.upper_bound(after);
+  for (; at != groups.end() && found.size() < at_most; ++at) found.push_back(*status_of(at->first));
+  return found;
+}
+
+std::vector<MemberStatus> Engine::members_of(const std::string& name, std::size_t from,
+                                             std::size_t at_most) const {
+  const Group* group = state_->find_group(name);
+  return group == nullptr ? std::vector<MemberStatus>() : group->member_status(from, at_most);
+}
+
+std::vector<SubscriberStatus> Engine::subscribers_of(const std::string& name, std::uint64_t above,
+                                                     std::size_t at_most) const {
+  std::vector<SubscriberStatus> found;
+  const auto of_group = state_->subscribers.groups().find(name);
+  if (of_group == state_->subscribers.groups().end()) return found;
+  auto at = of_group->second.upper_bound(above);
+  for (; at != of_group->second.end() && found.size() < at_most; ++at)
+    found.push_back({name, at->first, at->second.to, at->second.control});
+  return found;
+}
+
+std::string Engine::next_subscribed(const std::string& after) const {
+  const auto at = state_->subscribers.groups().upper_bound(after);
+  return at == state_->subscribers.groups().end() ? "" : at->first;
+}
+
+std::pair<std::size_t, std::size_t> Engine::clients_of(SessionId session) const {
+  const auto& clients = state_->clients.of(session);
+  const auto providers =
+      std::ranges::count_if(clients, [](const auto& client) { return client.second.provider != nullptr; });
+  return {static_cast<std::size_t>(providers), clients.size() - static_cast<std::size_t>(providers)};
 }
 
 std::vector<std::byte> Engine::snapshot() const { return write_snapshot(*state_); }
@@ -407,6 +507,7 @@ std::vector<std::byte> Engine::snapshot() const { return write_snapshot(*state_)
 bool Engine::restore(const std::vector<std::byte>& snapshot, std::string* error) {
   auto restored = std::make_unique<State>(state_->limits);
   if (!read_snapshot(snapshot, *restored, error)) return false;
+  restored->watch = state_->watch;
   state_ = std::move(restored);
   return true;
 }
@@ -415,6 +516,7 @@ std::uint64_t Engine::digest() const {
   Digest digest;
   digest.add(state_->last_protocol);
   digest.add(state_->numbers_above);
+  digest.add(state_->ended_number);
   state_->hosts.add_to(digest);
   digest.add(state_->ledger.total());
   for (const std::string& name : state_->line) digest.add(name);

@@ -13,13 +13,17 @@
 #pragma once
 
 #include <cstddef>
+#include <limits>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "engine/hosts.h"
 #include "engine/limits.h"
+#include "engine/status.h"
 #include "engine/types.h"
 
 namespace gs {
@@ -31,8 +35,8 @@ class Engine {
   Engine(const Engine&) = delete;
   Engine& operator=(const Engine&) = delete;
 
-  /// Applies the next ordered event.
-  Outcome apply(const Event& event);
+  /// Applies the next ordered event. `now` is kept beside what begins with it, for people; no part of the state.
+  Outcome apply(const Event& event, Moment now = 0);
 
   /// Work is left: a ContinueEvent is to be ordered.
   bool busy() const;
@@ -57,17 +61,24 @@ class Engine {
   /// For people and tools: whom a group's protocol waits for, at most so many by name.
   MissingVotes missing_votes(const std::string& group, std::size_t at_most) const;
 
-  /// For people and tools: a group as it stands.
-  struct GroupStatus {
-    std::string name;
-    Membership members;
-    std::size_t state_length = 0;  // bytes
-    std::uint64_t seqnum = 0;
-    std::string running_protocol;  // printable name; empty: none
-    std::size_t subscribers = 0;
-    bool unfinished = false;  // a ContinueEvent goes on with it
-  };
-  std::vector<GroupStatus> status() const;
+  // For people and tools.
+  /// Told of all that happens from now on, until another one or null is given; it outlives that.
+  void observe(Observer* observer);
+  const Tally& tally() const;
+  Totals totals() const;
+  /// Groups by name, so many of those that come after `after`.
+  std::vector<GroupStatus> status(const std::string& after = "",
+                                  std::size_t at_most = std::numeric_limits<std::size_t>::max()) const;
+  std::optional<GroupStatus> status_of(const std::string& group) const;
+  /// Oldest first, then who joins: from this place on, so many.
+  std::vector<MemberStatus> members_of(const std::string& group, std::size_t from, std::size_t at_most) const;
+  /// Those with numbers above this one, so many.
+  std::vector<SubscriberStatus> subscribers_of(const std::string& group, std::uint64_t above,
+                                               std::size_t at_most) const;
+  /// The first group after this one that has subscribers, whether it is there or not; empty: none has.
+  std::string next_subscribed(const std::string& after) const;
+  /// Providers and subscribers of a session.
+  std::pair<std::size_t, std::size_t> clients_of(SessionId session) const;
 
   /// The whole state, equal for engines that have been given the same events. Nothing: it is more than a snapshot
   /// can hold, 1.5 GiB of values.

@@ -17,10 +17,11 @@ Delivery delayed_error(const Endpoint& to, const Request& request, wyx_rc_t rc,
   return {to, std::make_shared<Notification>(std::move(error))};
 }
 
-Group::Group(std::string name)
+Group::Group(std::string name, std::uint64_t last_number)
     : name_(std::move(name)),
       member_ids_(std::make_shared<const Membership>()),
-      state_value_{std::make_shared<const Bytes>(), nullptr} {}
+      state_value_{std::make_shared<const Bytes>(), nullptr},
+      seqnum_(last_number) {}
 
 // ------------------------------------------------------------------------------------------------------ checks
 
@@ -142,6 +143,15 @@ void Group::settle(Surroundings& env) {
 
 void Group::send_announcement(Surroundings& env) {
   Announcement& next = announcements_.front();
+  if (env.watch.observer != nullptr) {
+    Happening told;
+    told.kind = Happening::Kind::kAnnouncement;
+    told.group = name_;
+    told.session = next.about;
+    told.summary = next.summary;
+    told.changing = next.ids;
+    env.watch.observer->happened(told);
+  }
   const auto note =
       std::make_shared<const Notification>(AnnouncementNotification{next.summary, std::move(next.ids)});
   announcements_.pop_front();
@@ -264,13 +274,13 @@ GroupView Group::view() const {
 
 std::uint64_t Group::next_number(const Surroundings& env) {
   seqnum_ = std::max(seqnum_, env.numbers_above) + 1;
+  since_ = env.watch.now;
   return seqnum_;
 }
 
 void Group::forget_values() {
   attributes_ = nullptr;
   state_value_ = {std::make_shared<const Bytes>(), nullptr};
-  seqnum_ = 0;
 }
 
 namespace {

@@ -11,6 +11,7 @@
 
 #include "engine/clients.h"
 #include "engine/protocols.h"
+#include "engine/status.h"
 #include "engine/subscribers.h"
 
 namespace gs {
@@ -23,6 +24,7 @@ struct Surroundings {
   ClientTable& clients;
   std::uint64_t& last_protocol;  // numbers are never used twice, so a timer of a dead group's protocol finds none
   const std::uint64_t& numbers_above;
+  Watch& watch;
   Ledger& ledger;
   const Limits& limits;
   std::size_t& work_left;  // units, of this event
@@ -55,7 +57,8 @@ struct Announcement {
 /// WYX_OK.
 class Group {
  public:
-  explicit Group(std::string name);
+  /// Its events are numbered above `last_number`.
+  Group(std::string name, std::uint64_t last_number);
 
   wyx_rc_t check_join(const GroupAttributes& attributes, ProviderId id) const;
   wyx_rc_t check_leave(const Member& member) const;
@@ -107,6 +110,10 @@ class Group {
   std::size_t missing_votes() const { return run_ ? run_->missing : 0; }
   /// The first of those who have not voted, in the order in which they were asked.
   std::vector<MissingVoter> missing_voters(std::size_t at_most) const;
+  /// But for its subscribers. Everything but the lists of voters is shared.
+  GroupStatus status() const;
+  /// Oldest first, then who joins: from this place on, so many.
+  std::vector<MemberStatus> member_status(std::size_t from, std::size_t at_most) const;
   GroupView view() const;
   void add_to(Digest& digest) const;
 
@@ -140,6 +147,8 @@ class Group {
     std::uint32_t collect = 0;      // WYX_COLLECT_ flags of the group as it was at the start
     std::size_t collected = 0;      // bytes of values kept for this phase's vote results
     std::uint32_t defaults = 0;     // summary flags of the default votes counted so far
+    Moment since = 0;               // no part of the state, like the next
+    Moment phase_since = 0;
   };
 
   using Queue = std::map<std::uint64_t, Queued>;  // by place
@@ -174,6 +183,13 @@ class Group {
   void tell_subscribers(const Run& run, bool was_born, Surroundings& env);
   std::uint64_t next_number(const Surroundings& env);
   void forget_values();
+  std::vector<MissingVoter> voters(bool who_voted, std::size_t at_most) const;
+
+  // What observers are told (group_status.cpp).
+  Happening happening(Happening::Kind kind, const Run& run) const;
+  void tell(Happening::Kind kind, const Run& run, const Surroundings& env, std::uint32_t summary = 0) const;
+  void tell_vote(Happening::Kind kind, const Member& voter, const Surroundings& env) const;
+  void tell_default_votes(const Surroundings& env) const;
 
   // What a protocol says (group_protocol.cpp).
   ProtocolNotification compose(const Run& run, wyx_notification_type_t type, std::uint32_t summary) const;
@@ -187,7 +203,8 @@ class Group {
   SharedMembership member_ids_;                        // theirs
   std::set<ProviderId> taken_ids_;                     // of members, joiners and queued joins that are not gone
   Value state_value_;
-  std::uint64_t seqnum_ = 0;  // of the last event
+  std::uint64_t seqnum_ = 0;  // of the last event, also of those that had the name before
+  Moment since_ = 0;          // that event; no part of the state
   std::optional<Run> run_;
   std::deque<MemberPtr> failures_;  // gone; those that are no members when their turn comes are passed over
   Queue queue_;                     // joins and leaves

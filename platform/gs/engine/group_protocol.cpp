@@ -47,6 +47,9 @@ void Group::start(Run&& run, Surroundings& env) {
   if (longest != 0 && (run.terms.time_limit == 0 || run.terms.time_limit > longest))
     run.terms.time_limit = longest;
   run.number = ++env.last_protocol;
+  run.since = env.watch.now;
+  tell(Happening::Kind::kBegin, run, env);
+  ++env.watch.tally.begun;
   run.collect = attributes_->batch_control & WYX_COLLECT_ALL_RESULT;
   if (run.terms.num_phases == WYX_1_PHASE) return approve(run, WYX_EXPLICIT_APPROVE, env);
   for (const MemberPtr& m : members_) m->ballot = {};
@@ -81,6 +84,8 @@ void Group::open_phase(Surroundings& env) {
   if (run.voted_message && run.traits->message_is_proposal) run.message = run.voted_message;
   run.voted_message = {};
   note.seqnum = next_number(env);
+  run.phase_since = env.watch.now;
+  tell(Happening::Kind::kPhase, run, env, run.defaults);
   send(run, std::move(note), run.voters, env);
   env.timers.push_back(*running_timer());
 }
@@ -100,6 +105,8 @@ void Group::vote(Member& voter, const VoteRequest& request, Surroundings& env) {
     collect(run_->voted_message, WYX_COLLECT_MSG_RESULT, ballot.message);
   }
   --run_->missing;
+  ++env.watch.tally.votes;
+  tell_vote(Happening::Kind::kVote, voter, env);
 }
 
 /// Values over the limit are left out, so that no notification grows with the number of voters without bound.
@@ -136,17 +143,20 @@ void Group::expire(const TimerId& timer) {
     if (m->ballot.open) cast_default(*m, WYX_TIME_LIMIT_EXCEEDED);
 }
 
-std::vector<MissingVoter> Group::missing_voters(std::size_t at_most) const {
-  std::vector<MissingVoter> missing;
-  if (!run_) return missing;
+std::vector<MissingVoter> Group::voters(bool who_voted, std::size_t at_most) const {
+  std::vector<MissingVoter> found;
+  if (!run_) return found;
   for (const MemberPtr& m : run_->voters) {
-    if (missing.size() == at_most) break;
-    if (m->ballot.open) missing.push_back({m->to, m->id, m->local_name});
+    if (found.size() == at_most) break;
+    if (m->ballot.open != who_voted) found.push_back({m->to, m->id, m->local_name});
   }
-  return missing;
+  return found;
 }
 
+std::vector<MissingVoter> Group::missing_voters(std::size_t at_most) const { return voters(false, at_most); }
+
 void Group::end_phase(Surroundings& env) {
+  tell_default_votes(env);
   bool any_continue = false;
   std::uint32_t rejects = 0;
   for (const MemberPtr& m : run_->voters) {
@@ -178,10 +188,13 @@ void Group::approve(const Run& run, std::uint32_t summary, Surroundings& env) {
   const std::vector<MemberPtr>& audience = run.changing.empty() ? members_ : all;
 
   change_membership(run);
+  for (const MemberPtr& m : run.changing) m->since = env.watch.now;
   if (run.proposed_state) state_value_ = run.proposed_state;
   if (run.new_attributes) attributes_ = run.new_attributes;
   ProtocolNotification note = compose(run, WYX_APPROVED_NOTIFICATION, summary);
   note.seqnum = next_number(env);
+  ++env.watch.tally.approved;
+  tell(Happening::Kind::kApproved, run, env, summary);
   send(run, std::move(note), audience, env);
 
   end(run, audience);
@@ -195,6 +208,8 @@ void Group::reject(const Run& run, std::uint32_t summary, Surroundings& env) {
   const std::vector<MemberPtr> audience = joins ? joined(members_, run.changing) : members_;
   ProtocolNotification note = compose(run, WYX_REJECTED_NOTIFICATION, summary);
   note.seqnum = next_number(env);
+  ++env.watch.tally.rejected;
+  tell(Happening::Kind::kRejected, run, env, summary);
   send(run, std::move(note), audience, env);
 
   end(run, audience);

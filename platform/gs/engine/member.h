@@ -5,6 +5,7 @@
 #include <string>
 
 #include "engine/ledger.h"
+#include "engine/observer.h"
 #include "engine/types.h"
 
 namespace gs {
@@ -43,6 +44,7 @@ struct Member {
   std::uint64_t place = 0;  // in its group's queue; 0: nothing of it waits
   Ballot ballot;
   Ledger::Charge charge;  // for its being there, names included
+  Moment since = 0;       // it has joined; no part of the state
 
   bool gone() const { return gone_code != 0; }
   Payer payer() const { return {to.session, user}; }

@@ -79,7 +79,7 @@ bool read_groups(SnapshotInput& in, const fb::Snapshot& from, EngineState& into)
     if (!in.take_table() || !in.name(group->name(), kMaxGroupName, name)) return false;
     in.set_where(printable(name));
     if (!in.require(!name.empty(), "no name")) return false;
-    const auto [entry, is_new] = into.groups.try_emplace(name, name);
+    const auto [entry, is_new] = into.groups.try_emplace(name, name, 0);
     if (!in.require(is_new, "is there twice") || !GroupReader(in, *group, into, entry->second).read())
       return false;
     if (group->run() && !protocols.insert(group->run()->number()).second)
@@ -181,6 +181,7 @@ bool read_snapshot(const std::vector<std::byte>& snapshot, EngineState& into, st
     return in.fail("made under other limits: set the same on all hosts");
   into.last_protocol = from->last_protocol();
   into.numbers_above = from->numbers_above();
+  into.ended_number = from->ended_number();
   return read_hosts(in, *from, into) && read_groups(in, *from, into) && read_line(in, *from, into) &&
          read_subscriptions(in, *from, into) &&
          in.require(into.ledger.within_limits(), "more than its limits allow to be kept");

@@ -215,7 +215,7 @@ std::vector<std::byte> write_snapshot(const EngineState& state) {
   const auto host_offsets = b.CreateVector(hosts);
   b.Finish(fb::CreateSnapshot(b, limits, group_offsets, line_offset, subscription_offsets,
                               state.subscribers.last_subscription(), gone_hosts, host_offsets,
-                              state.hosts.seqnum(), state.last_protocol, state.numbers_above),
+                              state.hosts.seqnum(), state.last_protocol, state.numbers_above, state.ended_number),
            kSnapshotId);
   const auto* bytes = reinterpret_cast<const std::byte*>(b.GetBufferPointer());
   return {bytes, bytes + b.GetSize()};

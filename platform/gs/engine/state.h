@@ -27,6 +27,7 @@ struct EngineState {
   HostTable hosts;
   std::uint64_t last_protocol = 0;
   std::uint64_t numbers_above = 0;  // every event of a group is numbered above it
+  std::uint64_t ended_number = 0;   // the highest of any group that has ended: no later one starts below it
 };
 
 }  // namespace gs

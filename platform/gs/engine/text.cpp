@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <iterator>
+#include <span>
 
 #include "engine/protocols.h"
 
@@ -13,11 +14,35 @@ struct Name {
   const char* name;
 };
 
-std::string flags(std::uint32_t value, std::initializer_list<Name> names) {
+constexpr Name kSummaryNames[] = {{WYX_EXPLICIT_APPROVE, "approve"},
+                                  {WYX_EXPLICIT_REJECT, "reject"},
+                                  {WYX_DEFAULT_APPROVE, "default-approve"},
+                                  {WYX_DEFAULT_REJECT, "default-reject"},
+                                  {WYX_TIME_LIMIT_EXCEEDED, "time"},
+                                  {WYX_PROVIDER_FAILED, "failed"},
+                                  {WYX_RESPONSIVENESS_NO_RESPONSE, "no-response"},
+                                  {WYX_RESPONSIVENESS_RESPONSE, "response"},
+                                  {WYX_GROUP_DISSOLVED, "dissolved"}};
+constexpr Name kSubscriptionNames[] = {
+    {WYX_SUBSCRIPTION_STATE, "state"},         {WYX_SUBSCRIPTION_DELTA_JOIN, "join"},
+    {WYX_SUBSCRIPTION_DELTA_LEAVE, "leave"},   {WYX_SUBSCRIPTION_MEMBERSHIP, "members"},
+    {WYX_SUBSCRIPTION_DISSOLVED, "dissolved"}, {WYX_SUBSCRIPTION_PERSISTENT, "persistent"}};
+constexpr Name kLeaveNames[] = {{WYX_VOLUNTARY_LEAVE, "voluntary"},
+                                {WYX_PROVIDER_FAILURE, "died"},
+                                {WYX_HOST_FAILURE, "host"},
+                                {WYX_PROVIDER_EXPELLED, "expelled"},
+                                {WYX_PROVIDER_SAID_GOODBYE, "goodbye"}};
+
+std::vector<std::string> names_of(std::uint32_t value, std::span<const Name> names) {
+  std::vector<std::string> set;
+  for (const Name& n : names)
+    if (value & n.bit) set.emplace_back(n.name);
+  return set;
+}
+
+std::string flags(std::uint32_t value, std::span<const Name> names) {
   std::string all;
-  for (const Name& n : names) {
-    if (value & n.bit) all += (all.empty() ? "" : "|") + std::string(n.name);
-  }
+  for (const std::string& name : names_of(value, names)) all += (all.empty() ? "" : "|") + name;
   return all.empty() ? "none" : all;
 }
 
@@ -35,42 +60,28 @@ std::string quoted(const Bytes& bytes) {
          (bytes.size() > kMaxPrinted ? "... (" + std::to_string(bytes.size()) + " bytes)" : "");
 }
 
-std::string summary_text(std::uint32_t summary) {
-  return flags(summary, {{WYX_EXPLICIT_APPROVE, "approve"},
-                         {WYX_EXPLICIT_REJECT, "reject"},
-                         {WYX_DEFAULT_APPROVE, "default-approve"},
-                         {WYX_DEFAULT_REJECT, "default-reject"},
-                         {WYX_TIME_LIMIT_EXCEEDED, "time"},
-                         {WYX_PROVIDER_FAILED, "failed"},
-                         {WYX_RESPONSIVENESS_NO_RESPONSE, "no-response"},
-                         {WYX_RESPONSIVENESS_RESPONSE, "response"},
-                         {WYX_GROUP_DISSOLVED, "dissolved"}});
-}
+std::string summary_text(std::uint32_t summary) { return flags(summary, kSummaryNames); }
 
-std::string changes_text(std::uint32_t bits) {
-  return flags(bits, {{WYX_PROPOSED_MEMBERSHIP, "proposed-members"},
-                      {WYX_ONGOING_MEMBERSHIP, "ongoing-members"},
-                      {WYX_UPDATED_MEMBERSHIP, "updated-members"},
-                      {WYX_REJECTED_MEMBERSHIP, "rejected-members"},
-                      {WYX_PROPOSED_STATE_VALUE, "proposed-state"},
-                      {WYX_ONGOING_STATE_VALUE, "ongoing-state"},
-                      {WYX_UPDATED_STATE_VALUE, "updated-state"},
-                      {WYX_PROPOSED_GROUP_ATTRIBUTES, "proposed-attributes"},
-                      {WYX_ONGOING_GROUP_ATTRIBUTES, "ongoing-attributes"},
-                      {WYX_UPDATED_GROUP_ATTRIBUTES, "updated-attributes"},
-                      {WYX_REJECTED_GROUP_ATTRIBUTES, "rejected-attributes"},
-                      {WYX_UPDATED_PROVIDER_MESSAGE, "message"},
-                      {WYX_EXPEL_INFORMATION, "expel"}});
-}
+constexpr Name kChangeNames[] = {{WYX_PROPOSED_MEMBERSHIP, "proposed-members"},
+                                 {WYX_ONGOING_MEMBERSHIP, "ongoing-members"},
+                                 {WYX_UPDATED_MEMBERSHIP, "updated-members"},
+                                 {WYX_REJECTED_MEMBERSHIP, "rejected-members"},
+                                 {WYX_PROPOSED_STATE_VALUE, "proposed-state"},
+                                 {WYX_ONGOING_STATE_VALUE, "ongoing-state"},
+                                 {WYX_UPDATED_STATE_VALUE, "updated-state"},
+                                 {WYX_PROPOSED_GROUP_ATTRIBUTES, "proposed-attributes"},
+                                 {WYX_ONGOING_GROUP_ATTRIBUTES, "ongoing-attributes"},
+                                 {WYX_UPDATED_GROUP_ATTRIBUTES, "updated-attributes"},
+                                 {WYX_REJECTED_GROUP_ATTRIBUTES, "rejected-attributes"},
+                                 {WYX_UPDATED_PROVIDER_MESSAGE, "message"},
+                                 {WYX_EXPEL_INFORMATION, "expel"}};
+
+std::string changes_text(std::uint32_t bits) { return flags(bits, kChangeNames); }
 
 std::string leave_codes_text(const std::vector<LeaveCode>& codes) {
   std::string all;
   for (const LeaveCode& code : codes) {
-    all += (all.empty() ? "" : " ") + flags(code.voluntary_or_failure, {{WYX_VOLUNTARY_LEAVE, "voluntary"},
-                                                                        {WYX_PROVIDER_FAILURE, "died"},
-                                                                        {WYX_HOST_FAILURE, "host"},
-                                                                        {WYX_PROVIDER_EXPELLED, "expelled"},
-                                                                        {WYX_PROVIDER_SAID_GOODBYE, "goodbye"}});
+    all += (all.empty() ? "" : " ") + flags(code.voluntary_or_failure, kLeaveNames);
     if (code.voluntary_code != 0) all += "=" + std::to_string(code.voluntary_code);
   }
   return "(" + all + ")";
@@ -125,14 +136,7 @@ std::string body(const AnnouncementNotification& n) {
 }
 
 std::string body(const SubscriptionNotification& n) {
-  std::string all = "subscription {" +
-                    flags(n.type, {{WYX_SUBSCRIPTION_STATE, "state"},
-                                   {WYX_SUBSCRIPTION_DELTA_JOIN, "join"},
-                                   {WYX_SUBSCRIPTION_DELTA_LEAVE, "leave"},
-                                   {WYX_SUBSCRIPTION_MEMBERSHIP, "members"},
-                                   {WYX_SUBSCRIPTION_DISSOLVED, "dissolved"},
-                                   {WYX_SUBSCRIPTION_PERSISTENT, "persistent"}}) +
-                    "}";
+  std::string all = "subscription {" + flags(n.type, kSubscriptionNames) + "}";
   if (n.full_membership) all += ", members " + text(n.full_membership);
   if (n.changing_membership) all += ", changing " + text(n.changing_membership);
   if (n.leave_codes) all += leave_codes_text(*n.leave_codes);
@@ -206,6 +210,9 @@ std::string printable(const std::string& bytes) {
       text.begin(), text.end(), [](unsigned char c) { return c < 0x20 || c > 0x7e || c == '"'; }, '?');
   return text;
 }
+
+std::vector<std::string> names_of_summary(std::uint32_t summary) { return names_of(summary, kSummaryNames); }
+std::vector<std::string> names_of_leave_code(std::uint32_t code) { return names_of(code, kLeaveNames); }
 
 std::string text(ProviderId id) {
   return std::to_string(id.instance) + (id.node == 1 ? "" : "@" + std::to_string(id.node));

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 #include "engine/types.h"
 
@@ -11,6 +12,10 @@ inline constexpr std::size_t kMaxPrinted = 64;  // bytes of a client's text, sta
 
 /// A client's text as it may stand in a line of a log: its beginning, with '?' for what does not print.
 std::string printable(const std::string& bytes);
+
+/// Of the flags of wyx_summary_code_t and wyx_leave_code_t that are set.
+std::vector<std::string> names_of_summary(std::uint32_t summary);
+std::vector<std::string> names_of_leave_code(std::uint32_t code);
 
 /// "3" on node 1, else "3@2".
 std::string text(ProviderId id);
