@@ -29,12 +29,29 @@ install(FILES ${CMAKE_BINARY_DIR}/packaging/zn_gscl.pc DESTINATION ${CMAKE_INSTA
 
 set(CPACK_PACKAGE_NAME zn-gscl)
 set(CPACK_PACKAGE_VENDOR "zn-gscl")
-set(CPACK_PACKAGE_CONTACT "The zn-gscl developers <zn-gscl@localhost>")
-set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "Group services: client library, daemon and base API library")
+# The developers have no address yet.
+set(CPACK_PACKAGE_CONTACT "The zn-gscl developers <zn-gscl@zn-gscl.invalid>")
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "group services: client library, daemon, and a master of daemons")
+set(CPACK_PACKAGE_DESCRIPTION "Processes form named groups, on one host or on several. They agree by voting
+on who is in and on a shared state value, send each other messages in one
+order, and are told when one of them dies.
+.
+This package has the C++ library with its headers, the base API library, the
+daemon gsd, and kplmstr with kplctl, which start, watch and ask daemons.")
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION net)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${CMAKE_LIBRARY_OUTPUT_DIRECTORY})
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)
+
+# What only a Debian package has.
+set(debian ${PROJECT_SOURCE_DIR}/packaging/debian)
+configure_file(${debian}/changelog.in ${CMAKE_BINARY_DIR}/packaging/debian/doc/changelog @ONLY)
+configure_file(${debian}/copyright ${CMAKE_BINARY_DIR}/packaging/debian/doc/copyright COPYONLY)
+configure_file(${debian}/lintian-overrides ${CMAKE_BINARY_DIR}/packaging/debian/overrides/zn-gscl COPYONLY)
+set(CPACK_INSTALLED_DIRECTORIES ${CMAKE_BINARY_DIR}/packaging/debian/doc usr/share/doc/zn-gscl
+                                ${CMAKE_BINARY_DIR}/packaging/debian/overrides usr/share/lintian/overrides)
+set(CPACK_PRE_BUILD_SCRIPTS ${debian}/stage.cmake)
+set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA ${debian}/triggers)
 include(CPack)

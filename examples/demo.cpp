@@ -5,6 +5,8 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
+#include <sstream>
 
 #include "examples/processes.h"
 
@@ -13,6 +15,17 @@ namespace {
 bool is_coloured() {
   static const bool coloured = std::getenv(zn::kColoured) || (isatty(STDOUT_FILENO) && !std::getenv("NO_COLOR"));
   return coloured;
+}
+
+/// The root of a chroot is a folder like any other: nothing is mounted on it.
+bool in_chroot() {
+  std::ifstream mounts("/proc/self/mountinfo");
+  for (std::string line; std::getline(mounts, line);) {
+    std::istringstream words(line);
+    std::string id, parent, device, root, where;
+    if (words >> id >> parent >> device >> root >> where && where == "/") return false;
+  }
+  return true;
 }
 
 }  // namespace
@@ -24,6 +37,16 @@ const char* zn::colour(const char* code) {
 }
 
 const char* zn::colour_off() { return is_coloured() ? "\033[0m" : ""; }
+
+void zn::say_skipped(const std::string& why) {
+  if (in_chroot()) {
+    std::printf(
+        "skipped: you are in a chroot, where this act cannot be kept apart from your other processes; outside\n"
+        "of it, or in a container, it can\n");
+  } else {
+    std::printf("skipped: %s\n", why.c_str());
+  }
+}
 
 void zn::relay(Process& part, Clock::time_point deadline) {
   for (bool more = true; more;) {

@@ -30,6 +30,10 @@ void demo_inside(const std::string& folder);
 /// The part of demo_cluster that runs where the hosts are. `folder` is for its files.
 void demo_hosts(const std::string& folder);
 
+/// Says why an act that needs processes apart from all others is skipped: in a chroot because of that, elsewhere
+/// `why`.
+void say_skipped(const std::string& why);
+
 /// Prints what a part says, to its end.
 void relay(Process& part, Clock::time_point deadline);
 

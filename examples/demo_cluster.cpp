@@ -163,7 +163,7 @@ void zn::demo_cluster() {
   const auto start = Clock::now();
   const std::string obstacle = hosts_obstacle();
   if (!obstacle.empty()) {
-    std::printf("skipped: %s\n", obstacle.c_str());
+    say_skipped(obstacle);
     return;
   }
   const TempFolder folder;

@@ -229,7 +229,7 @@ void zn::demo_master() {
   std::printf("\n%sDaemons under their master: gsd, and tiny_daemon as \"tiny\"%s\n", colour("1"), colour_off());
   const std::string obstacle = namespaces_obstacle();
   if (!obstacle.empty()) {
-    std::printf("skipped: the master needs root, or namespaces of its own: %s\n", obstacle.c_str());
+    say_skipped("here this act cannot be kept apart from your other processes, as root it might: " + obstacle);
     return;
   }
   const auto start = Clock::now();

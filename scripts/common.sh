@@ -15,11 +15,24 @@ fixed_addresses() {
   if setarch -R true 2>/dev/null; then setarch -R "$@"; else "$@"; fi
 }
 
-# build PRESET [TARGET...]: always configures, since what was missing last time may be there now.
+# configure PRESET [OPTION...]: always, since what was missing last time may be there now.
+configure() {
+  local said
+  said=$(cmake --preset "$@" 2>&1) || { echo "$said"; return 1; }
+}
+
+# build PRESET [TARGET...]
 build() {
   local preset=$1
   shift
-  local said
-  said=$(cmake --preset "$preset" 2>&1) || { echo "$said"; return 1; }
+  configure "$preset" || return
   fixed_addresses cmake --build --preset "$preset" -j "$jobs" ${1:+--target "$@"}
+}
+
+# build_product: needs nothing that only tests and benchmarks need, but where the folder has them they stay.
+build_product() {
+  local without=(-DZN_BUILD_TESTS=OFF -DZN_BUILD_BENCH=OFF)
+  if grep -qs bin/tests/ build/release/build.ninja; then without=(); fi
+  configure release ${without[@]+"${without[@]}"} || return
+  cmake --build --preset release -j "$jobs" --target product
 }

@@ -1,16 +1,20 @@
 #!/bin/bash
-# dependencies.sh build|test|cluster|package: installs with apt whatever of the packages below is missing; silent when nothing is.
+# dependencies.sh product|build|test|cluster|package: installs with apt whatever is missing of what is needed to build
+# the libraries and programs, with the tests and benchmarks, to run the tests, to play several hosts, to make the .deb;
+# silent when nothing is.
 . "$(dirname "$0")/common.sh"
+purpose=${1:-build}
 
 wanted=(g++ cmake ninja-build pkg-config libevent-dev libflatbuffers-dev flatbuffers-compiler libcli11-dev
         libtoml11-dev nlohmann-json3-dev libspdlog-dev libsodium-dev libcpg-dev libquorum-dev libvotequorum-dev
-        libcfg-dev libcorosync-common-dev libgtest-dev libgmock-dev libbenchmark-dev)
+        libcfg-dev libcorosync-common-dev)
+case $purpose in build | test) wanted+=(libgtest-dev libgmock-dev libbenchmark-dev) ;; esac
+case $purpose in cluster | test) wanted+=(corosync iproute2) ;; esac
 # The sanitizer builds use clang. Where its runtimes are a package of their own they are wanted too, elsewhere
 # (Ubuntu 22.04) they come with the compiler. The symbolizer of llvm makes the sanitizers' reports readable.
-if [ "${1:-build}" = test ]; then wanted+=(clang llvm libclang-rt-dev); fi
-if [[ "${1:-build}" = test || "${1:-build}" = cluster ]]; then wanted+=(corosync iproute2); fi
-
-if [ "${1:-build}" = package ]; then wanted+=(dpkg-dev); fi
+# abigail-tools compares the library's interface with its description.
+if [ "$purpose" = test ]; then wanted+=(clang llvm libclang-rt-dev abigail-tools); fi
+if [ "$purpose" = package ]; then wanted+=(dpkg-dev file); fi
 
 if ! command -v dpkg-query >/dev/null; then
   echo "Not a Debian or Ubuntu: please see to it that you have the equivalents of: ${wanted[*]}" >&2
