@@ -9,5 +9,5 @@ if [ "${3:-}" = --update ]; then
   exit 0
 fi
 if printf '%s\n' "$names" | diff -u "$2" -; then exit 0; fi
-echo "The exported names changed. If they should have: cmake --build --preset release --target update_exports"
+echo "The exported names changed. If they should have: make interface"
 exit 1
