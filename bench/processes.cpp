@@ -1,7 +1,7 @@
 // Whole processes over a daemon of their own: how long until a group has agreed, how many messages it takes, how
 // far one change spreads, how soon a death is known, what an idle client costs the daemon. Set against the same
-// kind of socket used bare, in the same run; and everything that is measured is also checked: sequence, contents,
-// agreement.
+// kind of socket used bare, and against the same traffic without group services (relay.h), in the same run; and
+// everything that is measured is also checked: sequence, contents, agreement.
 //
 //   processes [--quick] [--benchmark_out=FILE]
 #include "examples/processes.h"
@@ -18,6 +18,7 @@
 
 #include "bench/figures.h"
 #include "bench/process_roles.h"
+#include "bench/relay.h"
 #include "bench/waits.h"
 
 namespace {
@@ -91,8 +92,11 @@ class Benchmark {
   void check(int first, int count) { zn::check(board_, first, count); }
 
   void latencies(bool one_core);
-  void add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& bare);
+  void add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& relayed,
+                     std::vector<double>& bare);
   void ping_pong(int socket, std::vector<double>* samples);
+  Children start_relay(const std::string& path);
+  void relayed(zn::RelayedProposer& proposer, wyx_num_phases_t phases, std::vector<double>* samples);
   void agreement(wyx_num_phases_t phases, std::vector<double>* samples);
   void message_rate(int senders, double ping_pong_us);
   void idle_memory();
@@ -150,6 +154,23 @@ void Benchmark::ping_pong(int socket, std::vector<double>* samples) {
   }
 }
 
+/// The relay and its members but for the proposer.
+Benchmark::Children Benchmark::start_relay(const std::string& path) {
+  Children children;
+  children.push_back(start(daemon_, "relay", {path}));
+  children.front()->wait_line(zn::Clock::now() + zn::kWaitLimit);
+  for (int i = 1; i < zn::kRelayed; i++) children.push_back(start(daemon_, "relayed", {path, std::to_string(i)}));
+  return children;
+}
+
+void Benchmark::relayed(zn::RelayedProposer& proposer, wyx_num_phases_t phases, std::vector<double>* samples) {
+  for (int i = 0; i < settings_.samples; i++) {
+    const int64_t start = zn::now_ns();
+    proposer.agree(phases == WYX_N_PHASE);
+    samples->push_back(static_cast<double>(zn::now_ns() - start) / 1e3);
+  }
+}
+
 void Benchmark::agreement(wyx_num_phases_t phases, std::vector<double>* samples) {
   zn::Slot& mine = board_[kProposer];
   for (int i = 0; i < settings_.samples; i++) {
@@ -161,27 +182,34 @@ void Benchmark::agreement(wyx_num_phases_t phases, std::vector<double>* samples)
   }
 }
 
-// The three latencies in turns, so that what else the machine does falls on all of them. On one core a hand-over
+// The latencies in turns, so that what else the machine does falls on all of them. On one core a hand-over
 // costs a change of context; over all cores, where the scheduler puts the processes, it may cost the wake-up of
 // another core.
 void Benchmark::latencies(bool one_core) {
-  const std::string path = daemon_.folder() + "/echo.sock";
+  const std::string path = daemon_.folder() + "/echo.sock", relay_path = daemon_.folder() + "/relay.sock";
   const int listening = zn::listen_on(path);
   auto echo = start(daemon_, "echo", {path});
   const int socket = ::accept(listening, nullptr, nullptr);
-  const Placement placement(one_core, {0, daemon_.pid(), echo->pid(), members_[0]->pid(), members_[1]->pid()});
+  const Children relay = start_relay(relay_path);
+  zn::RelayedProposer relayed_proposer(relay_path);
+  std::vector<pid_t> processes = {0, daemon_.pid(), echo->pid(), members_[0]->pid(), members_[1]->pid()};
+  for (const auto& one : relay) processes.push_back(one->pid());
+  const Placement placement(one_core, processes);
 
-  std::vector<double> bare, one, several, warm_up;
+  std::vector<double> bare, one, several, relayed_one, relayed_several, warm_up;
   ping_pong(socket, &warm_up);
   agreement(WYX_1_PHASE, &warm_up);
   for (int round = 0; round < settings_.rounds; round++) {
     ping_pong(socket, &bare);
     agreement(WYX_1_PHASE, &one);
+    relayed(relayed_proposer, WYX_1_PHASE, &relayed_one);
     agreement(WYX_N_PHASE, &several);
+    relayed(relayed_proposer, WYX_N_PHASE, &relayed_several);
   }
   ::close(socket);
   ::close(listening);
   ::unlink(path.c_str());
+  ::unlink(relay_path.c_str());
   await_counts(kProposer, 3, board_[kProposer].count);
   check(kProposer, 3);
 
@@ -189,14 +217,18 @@ void Benchmark::latencies(bool one_core) {
   ping_pong_us_ = zn::percentile(bare, 0.5);
   figures_.add("bare ping-pong between two processes" + where + ", p50", ping_pong_us_, "us");
   figures_.add("  p99", zn::percentile(bare, 0.99), "us");
-  add_agreement("one phase, three processes" + where, one, bare);
-  add_agreement("n phases, three voters" + where, several, bare);
+  add_agreement("one phase, three processes" + where, one, relayed_one, bare);
+  add_agreement("n phases, three voters" + where, several, relayed_several, bare);
 }
 
-void Benchmark::add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& bare) {
+void Benchmark::add_agreement(const std::string& what, std::vector<double>& samples, std::vector<double>& relayed,
+                              std::vector<double>& bare) {
   const double p50 = zn::percentile(samples, 0.5), p99 = zn::percentile(samples, 0.99);
+  const double relayed_p50 = zn::percentile(relayed, 0.5);
   figures_.add("request to own approval, " + what + ", p50", p50, "us");
   figures_.add("  over a bare ping-pong (p50)", p50 / zn::percentile(bare, 0.5), "x", 4);
+  figures_.add("  the same packets and sleeps without group services (p50)", relayed_p50, "us");
+  figures_.add("  over that (p50)", p50 / relayed_p50, "x", 1.3);
   figures_.add("  p99", p99, "us");
   figures_.add("  over a bare ping-pong (p99)", p99 / zn::percentile(bare, 0.99), "x");
 }
@@ -343,6 +375,8 @@ void Benchmark::run() {
 
 int main(int argc, char** argv) {
   const std::string role = zn::option(argc, argv, "role");
+  if (role == "relay") return zn::run_relay(argv[2]);
+  if (role == "relayed") return zn::run_relayed(argv[2], std::atoi(argv[3]));
   if (!role.empty()) return zn::run_role(role, argc - 2, argv + 2);
 
   zn::catch_interrupts();
