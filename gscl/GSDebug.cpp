@@ -6,67 +6,54 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <ctime>
-#include <mutex>
-#include <utility>
 
+#include "gscl/GSDebugFile_internal.h"
+#include "gscl/GSLocalTime_internal.h"
 #include "gscl/GSLocalVar.h"
 #include "gscl/GSUtils.h"
 #include "gscl/trace.h"
 
 namespace {
 
+using gscl_internal::ForkableGate;
 using zelt_gscl_V1::GSLocalVar;
 
 constexpr unsigned int kMessageBytes = 2048;
 constexpr int kMaxIndentation = 30;
+// Room for a line: not more than a pipe takes in one piece. Only a GSTraceFn's name can be too long for it.
+constexpr int kLineBytes = 4096;
 
-constinit std::mutex init_mutex;                // makes the first reading of the environment happen once
+constinit std::atomic<pid_t> initialising{0};  // gate of those who set the level word, from the environment or not
 constinit std::atomic<bool> dbg_inited{false};  // level_mask holds the level word
-
-constinit std::mutex file_mutex;  // guards debugout, and keeps it open while a line is written
-FILE* debugout = nullptr;         // null: standard error
 
 constinit std::atomic<const char*> dbg_trace_name{nullptr};
 constinit std::atomic<int> dbg_trace_indent{0};
 
-/// Where and when a line is written, as every line says it. Taken under file_mutex: times do not run backwards in
-/// the file, and setting the time zone does not race with itself.
-struct LinePrefix {
-  char time[16];
-  char thread[16];
-};
-
-LinePrefix line_prefix() {
-  LinePrefix prefix{};
-  char full[32] = "";
-  const time_t now = time(nullptr);
-  tzset();  // ctime_r, unlike ctime, need not notice a change of TZ
-  if (ctime_r(&now, full) != nullptr) memcpy(prefix.time, full + 4, 15);
-  const auto id = static_cast<unsigned int>(zelt_gscl::gscl_thread_self());
-  snprintf(prefix.thread, sizeof(prefix.thread), "0x%x", id);
-  return prefix;
+/// Builds a line behind its time and thread, and writes it.
+__attribute__((format(printf, 1, 2))) void write_line(const char* format, ...) {
+  char line[kLineBytes];
+  char now[gscl_internal::kLineTimeBytes];
+  gscl_internal::lineTime(now);
+  const auto thread = static_cast<unsigned int>(zelt_gscl::gscl_thread_self());
+  const int prefix = snprintf(line, sizeof line, "%s TID=0x%x ", now, thread);
+  va_list args;
+  va_start(args, format);
+  const int rest = vsnprintf(line + prefix, static_cast<size_t>(kLineBytes - prefix), format, args);
+  va_end(args);
+  if (rest < 0) return;
+  gscl_internal::writeDebugLine(line, static_cast<size_t>(std::min(prefix + rest, kLineBytes - 1)));
 }
 
-FILE* stream() { return debugout != nullptr ? debugout : stderr; }
-
-void standard_trace(int, char* text) {
-  const std::lock_guard<std::mutex> lock(file_mutex);
-  const LinePrefix prefix = line_prefix();
-  fprintf(stream(), "%s TID=%s TRC_GSCL %s", prefix.time, prefix.thread, text);
-  fflush(stream());
-}
+void standard_trace(int, char* text) { write_line("TRC_GSCL %s", text); }
 
 void standard_debug(int, char* text) {
   const char* name = dbg_trace_name.load(std::memory_order_relaxed);
   const int depth = std::clamp(dbg_trace_indent.load(std::memory_order_relaxed), 0, kMaxIndentation);
-  const std::lock_guard<std::mutex> lock(file_mutex);
-  const LinePrefix prefix = line_prefix();
-  if (name != nullptr)
-    fprintf(stream(), "%s TID=%s %*s %s:%s", prefix.time, prefix.thread, depth, "", name, text);
-  else
-    fprintf(stream(), "%s TID=%s %s", prefix.time, prefix.thread, text);
-  fflush(stream());
+  if (name != nullptr) {
+    write_line("%*s %s:%s", depth, "", name, text);
+  } else {
+    write_line("%s", text);
+  }
 }
 
 int parse_level(const char* text) {
@@ -76,7 +63,7 @@ int parse_level(const char* text) {
 }
 
 void read_environment() {
-  const std::lock_guard<std::mutex> lock(init_mutex);
+  const ForkableGate gate(initialising);
   if (dbg_inited.load(std::memory_order_relaxed)) return;
   const char* level = getenv("GSCL_DBGLVL");
   gscl_set_debug_file(getenv("GSCL_DBGFILE"));
@@ -131,7 +118,7 @@ int GSDebugLevel() {
 int GSDebugging(int level) { return level == 0 || (GSDebugLevel() & level) != 0 ? 1 : 0; }
 
 void GSSetDebugLevel(int level) {
-  const std::lock_guard<std::mutex> lock(init_mutex);
+  const ForkableGate gate(initialising);
   zelt_gscl_trace::level_mask.store(level, std::memory_order_relaxed);
   dbg_inited.store(true, std::memory_order_release);
 }
@@ -164,14 +151,6 @@ gscl_debugf_rtn GSSetDebugRtn(gscl_debugf_rtn rtn) {
 
 gscl_tracef_rtn GSSetTraceRtn(gscl_tracef_rtn rtn) {
   return __atomic_exchange_n(&_gs_tracef_, rtn, __ATOMIC_ACQ_REL);
-}
-
-void gscl_set_debug_file(const char* path) {
-  const std::lock_guard<std::mutex> lock(file_mutex);
-  // Closing and opening are cancellation points: debugout never names a closed file.
-  FILE* old = std::exchange(debugout, nullptr);
-  if (old != nullptr) fclose(old);
-  if (path != nullptr) debugout = fopen(path, "w");
 }
 
 namespace {

@@ -6,16 +6,16 @@
 //   GSCL_DBGFILE  the file to write to, truncated; absent or not to be opened: standard error
 // Without either and without GSSetDebugLevel the level word is 0 and the library writes nothing.
 //
-// Each channel ends in a replaceable routine. The standard ones write one line for each message and flush it:
+// Each channel ends in a replaceable routine. The standard ones write one line for each message, at once:
 //   Nov 16 20:46:11 TID=0x1a2b TRC_GSCL <message>                                (trace)
 //   Nov 16 20:46:11 TID=0x1a2b <indentation> <function>:<message>                (debug, inside a GSTraceFn)
 // A message carries its own line end; none is added.
 //
 // Threads: every function here may be called from any thread at any time. The level word, the routines and the
-// function name and depth of GSTraceFn are one for the process. A standard routine writes its line in one piece
-// and holds a lock of its own while it does; other routines run with no lock of this facility held. Errors: what
-// cannot be written is dropped. Only a failed allocation of the message's buffer is thrown. After a fork in a
-// process with several threads the child may write only after exec, like with every stream.
+// function name and depth of GSTraceFn are one for the process. A standard routine takes no lock of this facility: it
+// hands its line to the system in one piece, of at most 4095 characters, and so may a process that was forked while
+// other threads were writing. Errors: what cannot be written is dropped. Only a failed allocation of the message's
+// buffer is thrown.
 #ifndef GSCL_GSDEBUG_H
 #define GSCL_GSDEBUG_H
 
@@ -70,10 +70,13 @@ ZN_GSCL_EXPORT void GStracef(int level, const char* format, ...) __attribute__((
 ZN_GSCL_EXPORT gscl_debugf_rtn GSSetDebugRtn(gscl_debugf_rtn rtn);
 ZN_GSCL_EXPORT gscl_tracef_rtn GSSetTraceRtn(gscl_tracef_rtn rtn);
 
-/// Closes the debug file and opens `path` for writing, truncated. Null, or a path that cannot be opened, leaves
-/// none open, and the standard routines write to standard error. The file stays open until the next call. The
-/// first test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call
-/// GSSetDebugLevel first.
+/// Closes the debug file and opens `path` for writing, truncated; a new file is writable by its owner alone. Null, or
+/// a path that cannot be opened, leaves none open, and the standard routines write to standard error. The file stays
+/// open until the next call, and is not handed on to programs that are executed. The first
+/// test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call GSSetDebugLevel first.
+///
+/// The descriptor, once there was one, belongs to the library for good. Should the
+/// application close it, lines go to standard error, never to what takes its number over.
 ZN_GSCL_EXPORT void gscl_set_debug_file(const char* path);
 
 /// Marks the life of a function on the debug channel: writes "Entering....\n" and "Leaving...\n" at GSCL_TRC_FUNC

@@ -1,6 +1,10 @@
 // Level word, file and routines are set once in a process, so every test runs in one of its own and answers
 // through its standard output.
+#include <fcntl.h>
+#include <sys/stat.h>
+
 #include <algorithm>
+#include <atomic>
 #include <barrier>
 #include <cstdlib>
 #include <cstring>
@@ -239,6 +243,58 @@ TEST(Debug, manyWritersWhileFileAndLevelChange_everyLineIsWhole) {
   });
   EXPECT_EQ(seen.status, 0) << seen.err;
   expectWholeLines(seen.err + file.text());
+}
+
+TEST(Debug, fileClosedByTheApplication_isNeverMistakenForWhatTakesItsNumber) {
+  const TempFile trace(""), data("data");
+  const FreshOutput seen = in_fresh_process([&] {
+    unlink(trace.path());
+    umask(0);
+    gscl_set_debug_file(trace.path());
+    struct stat created = {};
+    stat(trace.path(), &created);
+    GStracef(0, "kept\n");
+    close_range(STDERR_FILENO + 1, ~0U, 0);
+    for (int i = 0; i < 20; ++i) open(data.path(), O_RDWR);
+    GStracef(0, "closed\n");
+    gscl_set_debug_file(nullptr);
+    printf("%o %d", created.st_mode & 0777, fcntl(STDERR_FILENO + 1, F_GETFD) != -1);
+  });
+  EXPECT_EQ(seen.out, "644 1");
+  EXPECT_THAT(seen.err, MatchesRegex(PREFIX "TRC_GSCL closed\n"));
+  EXPECT_THAT(trace.text(), MatchesRegex(PREFIX "TRC_GSCL kept\n"));
+  EXPECT_EQ(data.text(), "data");
+}
+
+TEST(Debug, childrenForkedWhileOthersWrite_writeTheirLinesToo) {
+  constexpr int kChildren = 300;
+  const TempFile file("");
+  const FreshOutput seen = in_fresh_process([&] {
+    gscl_set_debug_file(file.path());
+    std::atomic<bool> done = false;
+    std::vector<std::jthread> writers;
+    for (int i = 0; i < 3; ++i) {
+      writers.emplace_back([&] {
+        while (!done) GStracef(0, "trace line 0\n");
+      });
+    }
+    for (int i = 0, status = 0; i < kChildren && status == 0; ++i) {
+      const pid_t child = fork();
+      if (child == 0) {
+        alarm(60);  // should it hang
+        GStracef(0, "trace line 1\n");
+        _exit(0);
+      }
+      waitpid(child, &status, 0);
+    }
+    done = true;
+  });
+  EXPECT_EQ(seen.status, 0) << seen.err;
+  expectWholeLines(file.text());
+  const std::string text = file.text();
+  int children = 0;
+  for (size_t at = 0; (at = text.find("line 1\n", at)) != text.npos; ++at) ++children;
+  EXPECT_EQ(children, kChildren);
 }
 
 }  // namespace

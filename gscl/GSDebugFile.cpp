@@ -1,0 +1,105 @@
+#include <errno.h>
+#include <fcntl.h>
+#include <stdint.h>
+#include <stdio.h>
+#include <sys/stat.h>
+
+#include "gscl/GSDebug.h"
+#include "gscl/GSDebugFile_internal.h"
+
+namespace {
+
+/// The descriptor that belongs to the debug file, as one word, which writers read without a lock.
+///
+/// Once there was a file its number is kept, on /dev/null while there is none, and another file takes it over in
+/// one step: a writer that has just read the word never meets a number that has become somebody else's. The
+/// application may close it all the same; that is what the mark is for.
+struct Place {
+  int32_t number = -1;  // -1: none
+  uint32_t mark = 0;    // of the file that the number leads to; see markOf
+  bool in_use = false;  // whether lines go there
+
+  static Place of(uint64_t word) {
+    return {static_cast<int32_t>(word & 0x7fffffff) - 1, static_cast<uint32_t>(word >> 32),
+            (word & 0x80000000) != 0};
+  }
+  uint64_t word() const {
+    return static_cast<uint64_t>(mark) << 32 | (in_use ? 0x80000000 : 0) | static_cast<uint32_t>(number + 1);
+  }
+};
+
+constexpr uint32_t kAnyFile = 0;  // the number is just being given another file
+
+constinit std::atomic<uint64_t> debug_place{0};
+constinit std::atomic<pid_t> setting{0};  // gate of those who change it
+
+/// Tells files apart. 0: the number is not open.
+uint32_t markOf(int number) {
+  struct stat file;
+  if (fstat(number, &file) != 0) return 0;
+  const uint64_t mixed = (file.st_dev * 0x9e3779b97f4a7c15 ^ file.st_ino) * 0xff51afd7ed558ccd;
+  return static_cast<uint32_t>(mixed >> 32) | 1;
+}
+
+bool isOurs(const Place& place) {
+  return place.number >= 0 && (place.mark == kAnyFile || place.mark == markOf(place.number));
+}
+
+int outputDescriptor() {
+  for (uint64_t word = debug_place.load(); Place::of(word).in_use;) {
+    if (isOurs(Place::of(word))) return Place::of(word).number;
+    const uint64_t now = debug_place.load();
+    if (now == word) break;  // the application has closed it
+    word = now;
+  }
+  return fileno(stderr);
+}
+
+/// Not as one of the standard descriptors, to which others write, and never writable by everybody: a daemon's mask
+/// is 0.
+int openFile(const char* path) {
+  const int number = open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOCTTY, 0644);
+  if (number < 0 || number > STDERR_FILENO) return number;
+  const int higher = fcntl(number, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+  close(number);
+  return higher;
+}
+
+/// Takes over `file`; -1: none. The caller is inside the gate.
+void replaceFile(int file) {
+  const Place before = Place::of(debug_place.load());
+  if (!isOurs(before)) {
+    debug_place.store(file < 0 ? 0 : Place{file, markOf(file), true}.word());
+    return;
+  }
+  const int next = file >= 0 ? file : open("/dev/null", O_WRONLY | O_CLOEXEC);
+  debug_place.store(Place{before.number, kAnyFile, before.in_use && file >= 0}.word());
+  if (next < 0) {
+    close(before.number);
+    debug_place.store(0);
+    return;
+  }
+  while (dup3(next, before.number, O_CLOEXEC) < 0 && (errno == EINTR || errno == EBUSY)) {
+  }
+  close(next);
+  debug_place.store(Place{before.number, markOf(before.number), file >= 0}.word());
+}
+
+}  // namespace
+
+void gscl_internal::writeDebugLine(const char* line, size_t length) {
+  const int output = outputDescriptor();
+  while (length > 0) {
+    const ssize_t written = write(output, line, length);
+    if (written < 0 && errno == EINTR) continue;
+    if (written <= 0) return;
+    line += written;
+    length -= static_cast<size_t>(written);
+  }
+}
+
+void gscl_set_debug_file(const char* path) {
+  const int file = path != nullptr ? openFile(path) : -1;
+  const gscl_internal::ForkableGate gate(setting);
+  replaceFile(file);
+}
