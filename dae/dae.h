@@ -171,7 +171,8 @@ ZN_GSCL_EXPORT void dae_init_KPL_sock_block(void);
 /// ignores SIGHUP, SIGINT, SIGQUIT,
 /// SIGTSTP, SIGTTIN, SIGTTOU and SIGPIPE, has "/" as working directory and a umask of 0, descriptors 0 to 2 open
 /// and, unless they were to be kept, no inherited descriptor below 2000 and the limit in force (under KPL and inetd
-/// from 3 on).
+/// from 3 on). The debug file of gscl/GSDebug.h stays open under a number from there up (under its own where the hard
+/// limit is no higher).
 /// Started by anything else than these two and process 1, it is a child of the process that called, which has
 /// ended with exit(0), its exit handlers included: failures after that are reported in the child. The child goes
 /// on when the caller is no longer its parent, whether process 1 or a sub-reaper has adopted it.

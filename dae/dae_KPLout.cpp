@@ -211,8 +211,8 @@ void add_segment(output_ctl_t* oc, const Segment& segment, bool doubles) {
   oc->pack_line(segment.text, segment.length, oc);
 }
 
-/// Length of the piece of text up to the next line end or, in text whose "%" is doubled, through the first "%". Not
-/// more than `most` is looked at, so that a long line costs no more than a short one at each of its breaks.
+/// Length of the piece of text up to the next line end or, in text whose "%" is doubled, through the first "%".
+/// Not more than `most` is looked at, so that a long line costs no more than a short one at each of its breaks.
 int segment_length(const char* text, bool doubles, int most) {
   int length = 0;
   while (length < most && text[length] != '\0' && text[length] != '\n') {

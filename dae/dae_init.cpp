@@ -14,6 +14,7 @@
 #include <algorithm>
 
 #include "dae/dae_failure_internal.h"
+#include "gscl/GSDebugFile_internal.h"
 
 namespace {
 
@@ -180,7 +181,10 @@ int close_files(dae_parent_index_t kind) {
   if (limit == -1 && errno != 0) return dae::fail_call(DAE_E_CLOSE, "sysconf");
   if (limit == -1) limit = kMaxDescriptors;
   const int end = static_cast<int>(std::min(limit, kMaxDescriptors));
-  for (int fd = kind == DAE_I_OTHER ? 0 : 3; fd < end; ++fd) close(fd);
+  const int kept = gscl_internal::moveDebugFileUp(end);
+  for (int fd = kind == DAE_I_OTHER ? 0 : 3; fd < end; ++fd) {
+    if (fd != kept) close(fd);
+  }
   return DAE_OK;
 }
 

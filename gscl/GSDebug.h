@@ -72,10 +72,10 @@ ZN_GSCL_EXPORT gscl_tracef_rtn GSSetTraceRtn(gscl_tracef_rtn rtn);
 
 /// Closes the debug file and opens `path` for writing, truncated; a new file is writable by its owner alone. Null, or
 /// a path that cannot be opened, leaves none open, and the standard routines write to standard error. The file stays
-/// open until the next call, and is not handed on to programs that are executed. The first
+/// open until the next call, through dae_init too, and is not handed on to programs that are executed. The first
 /// test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call GSSetDebugLevel first.
 ///
-/// The descriptor, once there was one, belongs to the library for good. Should the
+/// The descriptor, once there was one, belongs to the library for good and may change its number. Should the
 /// application close it, lines go to standard error, never to what takes its number over.
 ZN_GSCL_EXPORT void gscl_set_debug_file(const char* path);
 

@@ -2,7 +2,10 @@
 #include <fcntl.h>
 #include <stdint.h>
 #include <stdio.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
+
+#include <algorithm>
 
 #include "gscl/GSDebug.h"
 #include "gscl/GSDebugFile_internal.h"
@@ -85,6 +88,27 @@ void replaceFile(int file) {
   debug_place.store(Place{before.number, markOf(before.number), file >= 0}.word());
 }
 
+/// While it lives a descriptor may have the number `wanted`, if the system lets it.
+class RaisedLimit {
+ public:
+  explicit RaisedLimit(int wanted) {
+    if (getrlimit(RLIMIT_NOFILE, &before_) != 0) return;
+    const rlim_t least = static_cast<rlim_t>(wanted) + 1;
+    if (before_.rlim_cur >= least) return;
+    const rlimit raised = {least, std::max(least, before_.rlim_max)};
+    raised_ = setrlimit(RLIMIT_NOFILE, &raised) == 0;
+  }
+  ~RaisedLimit() {
+    if (raised_) setrlimit(RLIMIT_NOFILE, &before_);
+  }
+  RaisedLimit(const RaisedLimit&) = delete;
+  RaisedLimit& operator=(const RaisedLimit&) = delete;
+
+ private:
+  rlimit before_ = {};
+  bool raised_ = false;
+};
+
 }  // namespace
 
 void gscl_internal::writeDebugLine(const char* line, size_t length) {
@@ -96,6 +120,23 @@ void gscl_internal::writeDebugLine(const char* line, size_t length) {
     line += written;
     length -= static_cast<size_t>(written);
   }
+}
+
+int gscl_internal::moveDebugFileUp(int end) {
+  const ForkableGate gate(setting);
+  Place place = Place::of(debug_place.load());
+  if (!isOurs(place) || place.number >= end) return -1;
+  const int number = place.number;
+  if (place.in_use) {
+    const RaisedLimit raised(end);
+    place.number = fcntl(number, F_DUPFD_CLOEXEC, end);
+    if (place.number < 0) return number;
+  } else {
+    place = {};
+  }
+  debug_place.store(place.word());
+  close(number);
+  return -1;
 }
 
 void gscl_set_debug_file(const char* path) {

@@ -36,6 +36,10 @@ class ForkableGate {
 /// Hands the line to the system in one piece. What cannot be written is dropped.
 void writeDebugLine(const char* line, size_t length);
 
+/// For one who is about to close all descriptors below `end`: gives the debug file a number from there up. Returns
+/// the number that must stay open, where the limit on descriptors allows no other; else -1.
+int moveDebugFileUp(int end);
+
 }  // namespace gscl_internal
 
 #endif

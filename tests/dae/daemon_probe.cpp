@@ -1,8 +1,8 @@
 // A small daemon for the tests: starts as its options say, reports to the test's socket what came of it, serves
 // its requests, and does what the test's commands say. Usage: daemon_probe REPORT-ADDRESS [OPTION...]
 //
-// Options: mask=N  sock[=FD]  term  keep=MASK  excl=PATH  psalloc=N  zombies. Commands: again, fork, reap, exit,
-// crash
+// Options: mask=N  sock[=FD]  term  keep=MASK  excl=PATH  psalloc=N  zombies  trace=PATH. Commands: again, fork,
+// reap, exit, crash
 #include <errno.h>
 #include <signal.h>
 #include <stdlib.h>
@@ -13,6 +13,7 @@
 
 #include "dae/dae.h"
 #include "datagram.h"
+#include "gscl/GSDebug.h"
 
 namespace {
 
@@ -109,8 +110,10 @@ int main(int argc, char** argv) {
     options[text.substr(0, text.find('='))] = text.find('=') < text.size() ? text.substr(text.find('=') + 1) : "";
   }
   apply_options();
+  if (options.contains("trace")) gscl_set_debug_file(options["trace"].c_str());
   const std::string result = start();
   const Datagram commands;  // made here, since start-up closes descriptors
+  GStracef(0, "started\n");
   report(commands.name() + " " + result);
   if (const int code = std::stoi(result); code != 0) return code;
   atexit([] { report(dae_process_is_the_daemon() ? "exit" : "exit of a child"); });
