@@ -49,6 +49,7 @@ static_assert(sizeof(GSxControllerData) == 72, "fields as listed, nothing betwee
 static_assert(sizeof(std::atomic<wyx_descriptor_t>) == sizeof(wyx_descriptor_t), "");
 
 std::atomic<GSController*> GSxControllerData::_theController{nullptr};
+std::atomic<zelt_gscl_V3::GSController*> GSxControllerData::_theDomainController{nullptr};
 
 GSxControllerData::~GSxControllerData() {
   while (pClientList != nullptr) {
@@ -72,6 +73,7 @@ GSController::GSController() : _ctrlData(nullptr) {
   auto data = std::make_unique<GSxControllerData>();
   _ctrlData = data.get();
   GS_TRACE(GSCL_TRC_API, "GSController %x is created.\n", addressText(this));
+  GSxControllerData::_theDomainController.store(nullptr, std::memory_order_release);
   GSxControllerData::_theController.store(this, std::memory_order_release);
   zelt_vrmf_version.store(get_zelt_vrmf_version(), std::memory_order_relaxed);
   data.release();
@@ -89,6 +91,7 @@ GSController::~GSController() {
     _ctrlData = nullptr;
   }
   GSxControllerData::_theController.store(nullptr, std::memory_order_release);
+  GSxControllerData::_theDomainController.store(nullptr, std::memory_order_release);
 }
 
 wyx_rc_t GSController::initialize() {
@@ -210,5 +213,7 @@ GSController::GSController(unsigned int version) {
   GS_TRACE(GSCL_TRC_API, "GSController::GSController GSCL_VER=%x\n", version);
   gsapi_compiled_version.store(version & 0xFFFFu, std::memory_order_relaxed);
 }
+
+GSController::~GSController() = default;
 
 }  // namespace zelt_gscl_V2

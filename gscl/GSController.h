@@ -175,6 +175,7 @@ class ZN_GSCL_EXPORT GSController : public zelt_gscl_V1::GSController {
   /// also after this controller is gone; the high 16 bits are the client library version and change nothing.
   /// 0x0003001C stands for the defaults.
   explicit GSController(unsigned int version);
+  virtual ~GSController();
 };
 
 }  // namespace zelt_gscl_V2
@@ -187,6 +188,7 @@ class ZN_GSCL_EXPORT GSController : public zelt_gscl_V2::GSController {
  public:
   /// As the second version; `version` is passed on to it.
   explicit GSController(unsigned int version);
+  virtual ~GSController();
 
   /// wyx_change_responsiveness. When it answers WYX_OK, the record becomes the current controller's option too, so
   /// that a later initialize() opens the session with it (write lock).

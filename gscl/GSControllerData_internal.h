@@ -34,6 +34,9 @@ struct GSxControllerData {
   wyx_responsiveness_t responsiveness = {};
 
   static std::atomic<GSController*> _theController;
+  /// The current controller where it is of the third version, else null. Programs may be compiled without runtime
+  /// type information, so the object cannot be asked.
+  static std::atomic<zelt_gscl_V3::GSController*> _theDomainController;
 };
 
 }  // namespace zelt_gscl_V1

@@ -1,9 +1,10 @@
 // The third version of the controller and the operations on the whole domain.
-#include "gscl/GSController.h"
+#include "gscl/GSControllerData_internal.h"
 #include "gscl/base_api_internal.h"
 #include "gscl/trace_text_internal.h"
 
 using gscl_internal::callBaseApi;
+using zelt_gscl_V1::GSxControllerData;
 using Api = GSAPIRtnCollection;
 
 // Null records are the base API's to judge; only their trace line is left out.
@@ -72,10 +73,14 @@ namespace zelt_gscl_V3 {
 
 static_assert(sizeof(GSController) == sizeof(zelt_gscl_V1::GSController), "later versions add no field");
 
-GSController::GSController(unsigned int version) : zelt_gscl_V2::GSController(version) {}
+GSController::GSController(unsigned int version) : zelt_gscl_V2::GSController(version) {
+  GSxControllerData::_theDomainController.store(this, std::memory_order_release);
+}
+
+GSController::~GSController() = default;
 
 GSController* GSController::theController() {
-  return dynamic_cast<GSController*>(zelt_gscl_V1::GSController::theController());
+  return GSxControllerData::_theDomainController.load(std::memory_order_acquire);
 }
 
 wyx_rc_t GSController::changeResponsiveness(const wyx_responsiveness_t* responsiveness) {
