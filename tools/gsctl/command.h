@@ -1,0 +1,40 @@
+// What a command is to the rest of gsctl.
+#pragma once
+
+#include <CLI/CLI.hpp>
+#include <functional>
+#include <optional>
+#include <span>
+#include <string>
+
+#include "tools/gsctl/status.h"
+
+namespace gsctl {
+
+/// The options that every command takes, before or after its name.
+struct Settings {
+  bool json = false;
+  std::string endpoint;           // as GSD_ENDPOINT has it; empty: the environment's
+  std::optional<double> timeout;  // seconds; none: no limit
+};
+
+/// Does the work and gives the exit status. Throws Error.
+using Run = std::function<int(const Settings&)>;
+
+/// Adds a command's options and arguments to `command`, which has its name and one line of help already. The
+/// result owns what they are read into. (CLI11 keeps references into it: make it a shared pointer.)
+using Add = Run (*)(CLI::App& command);
+
+struct Command {
+  const char* name;
+  const char* help;
+  Add add;
+};
+
+/// All there are, in the order of --help.
+std::span<const Command> commands();
+
+// Each in the file of its name.
+Run add_get(CLI::App& command);
+
+}  // namespace gsctl
