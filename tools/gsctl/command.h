@@ -35,6 +35,9 @@ struct Command {
 std::span<const Command> commands();
 
 // Each in the file of its name.
+Run add_expel(CLI::App& command);
 Run add_get(CLI::App& command);
+Run add_send(CLI::App& command);
+Run add_set(CLI::App& command);
 
 }  // namespace gsctl

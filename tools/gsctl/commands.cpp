@@ -5,6 +5,9 @@ namespace {
 
 constexpr Command kCommands[] = {
     {"get", "Print a group's state value", add_get},
+    {"set", "Propose a group a new state value", add_set},
+    {"send", "Propose a group a message", add_send},
+    {"expel", "Propose a group that members are put out", add_expel},
 };
 
 }  // namespace

@@ -1,6 +1,7 @@
 // gsctl get: a group's state value.
 #include "common/printable.h"
 #include "tools/gsctl/command.h"
+#include "tools/gsctl/member.h"
 #include "tools/gsctl/output.h"
 #include "tools/gsctl/session.h"
 #include "tools/gsctl/text.h"

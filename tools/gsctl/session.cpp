@@ -8,7 +8,6 @@
 namespace gsctl {
 namespace {
 
-constexpr std::size_t kMaxGroupName = 32;
 constexpr std::size_t kFailureId = 256;
 
 std::string daemon_name() {
@@ -92,11 +91,6 @@ Subscription::Subscription(Loop& loop, const std::string& group, int what, Chang
 
 void Subscription::subscribeCb(const wyx_subscription_notification_t* notification) {
   loop_.guard([&] { on_change_(*notification); });
-}
-
-void check_group(const std::string& group) {
-  if (group.empty()) throw Error(kWrongUse, "GROUP: a name is needed");
-  if (group.size() > kMaxGroupName) throw Error(kWrongUse, "GROUP: a name has at most 32 characters");
 }
 
 }  // namespace gsctl
