@@ -37,6 +37,8 @@ std::span<const Command> commands();
 // Each in the file of its name.
 Run add_expel(CLI::App& command);
 Run add_get(CLI::App& command);
+Run add_lead(CLI::App& command);
+Run add_lock(CLI::App& command);
 Run add_send(CLI::App& command);
 Run add_set(CLI::App& command);
 

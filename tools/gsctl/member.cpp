@@ -19,12 +19,17 @@ short some_instance() {
 
 }  // namespace
 
-void Member::ask_to_join(std::optional<short> instance) {
+wyx_rc_t Member::try_to_join(std::optional<short> instance) {
   wyx_rc_t rc = WYX_DUPLICATE_INSTANCE_NUMBER;
   for (int i = 0; rc == WYX_DUPLICATE_INSTANCE_NUMBER && i < (instance ? 1 : kTries); ++i) {
     setInstanceNumber(instance ? *instance : some_instance());
     rc = joinGroup();
   }
+  return rc;
+}
+
+void Member::ask_to_join(std::optional<short> instance) {
+  const wyx_rc_t rc = try_to_join(instance);
   if (rc == WYX_OK) return;
   throw Error(rc == WYX_NO_INIT ? kLost : kRefused,
               std::string("cannot join group '") + getGroupName() + "': " + explain(rc));

@@ -19,6 +19,8 @@ class Member : public zelt_gscl_V1::GSProvider {
 
   /// Asks to join, as this instance or as one that is free. Throws Error: refused.
   void ask_to_join(std::optional<short> instance = std::nullopt);
+  /// The same, with the daemon's answer.
+  wyx_rc_t try_to_join(std::optional<short> instance = std::nullopt);
 
   /// Whether this member is what the notification is about.
   bool is_me(const wyx_membership_t* members);

@@ -9,6 +9,7 @@ namespace gsctl {
 namespace {
 
 constexpr std::size_t kFailureId = 256;
+constexpr std::chrono::duration<double> kReopenPause(0.1);
 
 std::string daemon_name() {
   const char* endpoint = getenv("GSD_ENDPOINT");
@@ -49,17 +50,28 @@ void Session::close() {
 }
 
 void Session::deliver() {
-  if (dispatch(WYX_NON_BLOCKING) == WYX_OK) return;
+  if (dispatch(WYX_NON_BLOCKING) == WYX_OK) {
+    if (delivered_) delivered_();
+    return;
+  }
   close();
   if (lost_) lost_();
 }
 
-void Session::be_responsive(unsigned seconds, std::function<void()> asked) {
+void Session::reopen(std::function<void()> callback) {
+  retry_ = loop_.after(kReopenPause, [this, callback] {
+    if (!try_open()) return reopen(callback);
+    retry_.reset();
+    callback();
+  });
+}
+
+void Session::be_responsive(unsigned short seconds, std::function<void()> asked) {
   wyx_responsiveness_t wanted{};
   wanted.gs_responsiveness_type =
       static_cast<wyx_responsiveness_type_t>(WYX_PING_RESPONSIVENESS | WYX_ANNOUNCEMENT_WHEN_SLOW);
-  wanted.gs_responsiveness_interval = seconds;
-  wanted.gs_responsiveness_response_time_limit = static_cast<wyx_time_limit_t>(seconds);
+  wanted.gs_responsiveness_interval = 1;
+  wanted.gs_responsiveness_response_time_limit = seconds;
   setResponsiveness(&wanted);
   asked_ = std::move(asked);
 }

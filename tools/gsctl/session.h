@@ -27,9 +27,15 @@ class Session : private zelt_gscl_V1::GSController {
   /// this session works then until it is opened again.
   void on_lost(std::function<void()> callback) { lost_ = std::move(callback); }
 
-  /// Takes effect at the next opening: the daemon asks every `seconds` whether this process runs, and announces it
-  /// to its groups when there is no answer for as long. `asked` is called each time.
-  void be_responsive(unsigned seconds, std::function<void()> asked);
+  /// Tries, until it is open, and calls `callback` then, from the loop.
+  void reopen(std::function<void()> callback);
+
+  /// What is called whenever all that had arrived has been handed out.
+  void on_delivered(std::function<void()> callback) { delivered_ = std::move(callback); }
+
+  /// Takes effect at the next opening: the daemon asks every second whether this process runs, and announces it to
+  /// its groups when an answer takes `seconds`. `asked` is called each time.
+  void be_responsive(unsigned short seconds, std::function<void()> asked);
 
   /// This host's.
   static short node();
@@ -42,6 +48,8 @@ class Session : private zelt_gscl_V1::GSController {
   Loop::Handle readable_;
   std::function<void()> lost_;
   std::function<void()> asked_;
+  std::function<void()> delivered_;
+  Loop::Handle retry_;
 };
 
 /// For commands that end with the session: status 5 with this text.
