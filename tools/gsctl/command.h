@@ -42,4 +42,14 @@ Run add_lock(CLI::App& command);
 Run add_send(CLI::App& command);
 Run add_set(CLI::App& command);
 
+// Those that look.
+Run add_chart(CLI::App& command);
+Run add_groups(CLI::App& command);
+Run add_members(CLI::App& command);
+Run add_nodes(CLI::App& command);
+Run add_record(CLI::App& command);
+Run add_sessions(CLI::App& command);
+Run add_stats(CLI::App& command);
+Run add_status(CLI::App& command);  // in daemon_status.cpp
+
 }  // namespace gsctl

@@ -4,6 +4,14 @@ namespace gsctl {
 namespace {
 
 constexpr Command kCommands[] = {
+    {"status", "Tell how the daemon is, in five lines", add_status},
+    {"groups", "List the groups", add_groups},
+    {"members", "List the members of a group", add_members},
+    {"nodes", "List the hosts that serve the same groups", add_nodes},
+    {"sessions", "List the programs that are connected", add_sessions},
+    {"stats", "Tell the daemon's counts", add_stats},
+    {"record", "Record what happens in groups", add_record},
+    {"chart", "Draw a recording as a sequence chart", add_chart},
     {"get", "Print a group's state value", add_get},
     {"set", "Propose a group a new state value", add_set},
     {"send", "Propose a group a message", add_send},

@@ -4,6 +4,7 @@
 
 #include "common/command_line.h"
 #include "tools/gsctl/command.h"
+#include "tools/gsctl/inspection.h"
 #include "tools/gsctl/output.h"
 
 namespace {
@@ -67,6 +68,10 @@ int main(int argc, char** argv) {
     gsctl::complain(error.what());
     return gsctl::kWrongUse;
   } catch (const Error& error) {
+    gsctl::complain(error.what());
+    return error.status();
+  } catch (const gs::inspect::InspectError& lost) {
+    const Error error = gsctl::explained(lost);
     gsctl::complain(error.what());
     return error.status();
   } catch (const std::exception& error) {

@@ -32,9 +32,11 @@ int write_all(int fd, std::string_view bytes) {
 
 void print_line(std::string_view text) { print_raw(platform::printable(text) + "\n"); }
 
-void print_json(const nlohmann::ordered_json& object) {
-  print_raw(object.dump(-1, ' ', true, nlohmann::ordered_json::error_handler_t::replace) + "\n");
+std::string json_text(const nlohmann::ordered_json& object) {
+  return object.dump(-1, ' ', true, nlohmann::ordered_json::error_handler_t::replace);
 }
+
+void print_json(const nlohmann::ordered_json& object) { print_raw(json_text(object) + "\n"); }
 
 void print_raw(std::string_view bytes) {
   const int error = write_all(STDOUT_FILENO, bytes);

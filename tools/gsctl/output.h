@@ -13,7 +13,10 @@ struct OutputGone {};
 /// A line for people, written at once. Throws OutputGone; Error where it cannot be written otherwise.
 void print_line(std::string_view text);
 
-/// An object on a line of its own, in ASCII. Throws as print_line.
+/// In ASCII: nothing in it steers a terminal.
+std::string json_text(const nlohmann::ordered_json& object);
+
+/// An object on a line of its own. Throws as print_line.
 void print_json(const nlohmann::ordered_json& object);
 
 /// The bytes as they are. Throws as print_line.

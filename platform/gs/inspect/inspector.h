@@ -52,13 +52,14 @@ class Inspector {
 
   /// From now on this connection brings what happens, in `groups` or in all, and nothing is asked on it any more.
   void tap(const std::vector<std::string>& groups = {}, bool contents = false);
+  /// Asks without waiting for the answer: `next` has it once it is there.
+  void send(const AskT& ask);
   /// Readable when `next` has something to say.
   int fd() const { return socket_.get(); }
-  /// The happenings that are there, and how many are missing before them; nothing: no more for now.
+  /// What has come: an answer, or happenings and how many are missing before them; nothing: no more for now.
   std::optional<ReportT> next();
 
  private:
-  void send(const AskT& ask);
   ReportT ask(const AskT& ask);
   template <typename T>
   List<T> all(AskT ask, List<T> ReportT::*list);

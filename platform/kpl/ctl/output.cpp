@@ -3,32 +3,16 @@
 #include <algorithm>
 #include <cstdint>
 
+#include "common/table.h"
+
 namespace kpl::ctl {
 namespace {
 
 using nlohmann::json;
-using Row = std::vector<std::string>;
+using platform::Row;
 
 constexpr double kMaxShownSeconds = 1e12;
 constexpr std::size_t kFullBody = 64;  // a body that fills its record goes on in the next one
-
-std::string padded(const std::string& text, std::size_t width) {
-  return text + std::string(width > text.size() ? width - text.size() : 0, ' ');
-}
-
-std::string table(const std::vector<Row>& rows) {
-  std::vector<std::size_t> widths(rows.front().size());
-  for (const Row& row : rows) {
-    for (std::size_t i = 0; i < row.size(); ++i) widths[i] = std::max(widths[i], row[i].size());
-  }
-  std::string text;
-  for (const Row& row : rows) {
-    std::string line;
-    for (std::size_t i = 0; i < row.size(); ++i) line += padded(row[i], widths[i] + 2);
-    text += line.erase(line.find_last_not_of(' ') + 1) + "\n";
-  }
-  return text;
-}
 
 /// "-" for what is not there.
 std::string text_of(const json& entry, const char* name) {
@@ -107,7 +91,7 @@ std::string status_table(const std::vector<json>& entries) {
                     text_of(entry, "state"), duration_of(entry), text_of(entry, "restarts"),
                     text_of(entry, "last_end")});
   }
-  return table(rows);
+  return platform::table(rows);
 }
 
 std::string definition_table(const std::vector<json>& entries) {
@@ -117,14 +101,14 @@ std::string definition_table(const std::vector<json>& entries) {
                     text_of(entry, "transport"), text_of(entry, "autostart"), text_of(entry, "restart"),
                     command_of(entry)});
   }
-  return table(rows);
+  return platform::table(rows);
 }
 
 std::string long_status(const std::vector<control::Line>& lines) {
   std::size_t width = 0;
   for (const control::Line& line : lines) width = std::max(width, line.margin.size());
   std::string text;
-  for (const control::Line& line : lines) text += padded(line.margin, width) + line.body + "\n";
+  for (const control::Line& line : lines) text += platform::padded(line.margin, width) + line.body + "\n";
   return text;
 }
 
