@@ -51,5 +51,6 @@ Run add_record(CLI::App& command);
 Run add_sessions(CLI::App& command);
 Run add_stats(CLI::App& command);
 Run add_status(CLI::App& command);  // in daemon_status.cpp
+Run add_top(CLI::App& command);
 
 }  // namespace gsctl

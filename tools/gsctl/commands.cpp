@@ -10,6 +10,7 @@ constexpr Command kCommands[] = {
     {"nodes", "List the hosts that serve the same groups", add_nodes},
     {"sessions", "List the programs that are connected", add_sessions},
     {"stats", "Tell the daemon's counts", add_stats},
+    {"top", "Show groups live on a full screen", add_top},
     {"record", "Record what happens in groups", add_record},
     {"chart", "Draw a recording as a sequence chart", add_chart},
     {"get", "Print a group's state value", add_get},
