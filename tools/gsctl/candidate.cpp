@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <filesystem>
 
 #include "tools/gsctl/keeper.h"
 #include "tools/gsctl/member.h"
@@ -311,7 +312,8 @@ void add_candidacy_options(CLI::App& command, Candidacy& candidacy) {
 int stand(const Candidacy& asked, const Settings& settings) {
   check_group(asked.group);
   Candidacy candidacy = asked;
-  if (candidacy.name.empty()) candidacy.name = candidacy.command.front();
+  if (candidacy.name.empty())
+    candidacy.name = std::filesystem::path(candidacy.command.front()).filename().string();
   Keeper keeper({candidacy.command, duration<double>(candidacy.grace), !candidacy.restart});
   Loop loop;
   Session session(loop);

@@ -37,10 +37,13 @@ std::span<const Command> commands();
 // Each in the file of its name.
 Run add_expel(CLI::App& command);
 Run add_get(CLI::App& command);
+Run add_join(CLI::App& command);
 Run add_lead(CLI::App& command);
 Run add_lock(CLI::App& command);
 Run add_send(CLI::App& command);
 Run add_set(CLI::App& command);
+Run add_wait(CLI::App& command);
+Run add_watch(CLI::App& command);
 
 // Those that look.
 Run add_chart(CLI::App& command);

@@ -31,7 +31,11 @@ class Loop::Registration : public std::enable_shared_from_this<Registration> {
   platform::EventPtr event_;
 };
 
-Loop::Loop() : base_(event_base_new()) {
+Loop::Loop() {
+  const std::unique_ptr<event_config, decltype(&event_config_free)> config(event_config_new(), &event_config_free);
+  if (config && event_config_require_features(config.get(), EV_FEATURE_FDS) == 0) {  // files, too
+    base_.reset(event_base_new_with_config(config.get()));
+  }
   if (!base_) throw Error(kRefused, "cannot make an event loop: too many open files, or no memory");
 }
 

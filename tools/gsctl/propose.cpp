@@ -10,16 +10,8 @@ namespace {
 
 using std::chrono::duration;
 
-constexpr duration<double> kLeaveTime(2);  // then the end of the session does it
-constexpr double kFirstPause = 0.005;      // seconds, doubled with each collision
+constexpr double kFirstPause = 0.005;  // seconds, doubled with each collision
 constexpr double kLongestPause = 0.5;
-
-/// Of those that try again at the same time, one is to be first.
-duration<double> pause_before(int attempt) {
-  static std::minstd_rand source{std::random_device()()};
-  const double longest = std::min(kFirstPause * static_cast<double>(1U << std::min(attempt, 16)), kLongestPause);
-  return duration<double>(std::uniform_real_distribution<double>(longest / 2, longest)(source));
-}
 
 /// The voters whose votes are known, as the group collects them, to be a rejection.
 Members rejecters(const wyx_proposal_t& proposal) {
@@ -170,6 +162,12 @@ void add_proposal_options(CLI::App& command, Proposal& proposal) {
   command.add_option("--vote-time", proposal.vote_time, "What voters have for each phase; 0: no limit")
       ->capture_default_str()
       ->type_name("SECONDS");
+}
+
+duration<double> pause_before(int attempt) {
+  static std::minstd_rand source{std::random_device()()};
+  const double longest = std::min(kFirstPause * static_cast<double>(1U << std::min(attempt, 16)), kLongestPause);
+  return duration<double>(std::uniform_real_distribution<double>(longest / 2, longest)(source));
 }
 
 int propose(const Proposal& proposal, const Settings& settings, const std::function<wyx_rc_t(Member&)>& submit) {

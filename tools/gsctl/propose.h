@@ -22,6 +22,12 @@ void add_proposal_options(CLI::App& command, Proposal& proposal);
 /// each collision.
 int propose(const Proposal& proposal, const Settings& settings, const std::function<wyx_rc_t(Member&)>& submit);
 
+/// What those that collide wait before they try again, each as long as it happens to.
+std::chrono::duration<double> pause_before(int attempt);
+
+/// What an orderly end waits for; then the end of the session does it.
+constexpr std::chrono::duration<double> kLeaveTime(2);
+
 /// The base API's own form of bytes that it does not change.
 template <typename Record>
 Record record_of(const std::string& bytes) {
