@@ -50,7 +50,8 @@ void Session::close() {
 }
 
 void Session::deliver() {
-  if (dispatch(WYX_NON_BLOCKING) == WYX_OK) {
+  // Twice: what hands out the last notification of a daemon that is gone is still good, and nothing follows it.
+  if (dispatch(WYX_NON_BLOCKING) == WYX_OK && dispatch(WYX_NON_BLOCKING) == WYX_OK) {
     if (delivered_) delivered_();
     return;
   }
