@@ -330,8 +330,8 @@ void paint_axis(Svg& svg, const TimeScale& scale, Microseconds zero, double top,
     if (i == 0) continue;
     const double from = stretches[i - 1].x_to;
     const double wide = stretches[i].x_from - from;
-    const std::string text = time_span_text(stretches[i].from - stretches[i - 1].to);
-    svg.rectangle(from, top, wide, bottom - top, "cut", 0, "cut out: " + text);
+    const std::string text = time_span_text(stretches[i].from - stretches[i - 1].to) + " cut";
+    svg.rectangle(from, top, wide, bottom - top, "cut");
     svg.text(from + (wide - text_width(text, kText) * 0.9) / 2, bottom - 4, text, "dim");
   }
 }

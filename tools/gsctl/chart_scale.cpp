@@ -10,9 +10,9 @@ namespace {
 
 using Span = std::pair<std::int64_t, std::int64_t>;
 
-constexpr double kBreak = 64;       // wide, what stands for a time that was cut out
+constexpr double kBreak = 84;       // wide, what stands for a time that was cut out
 constexpr double kLeastBusy = 400;  // wide, all in which something goes on
-constexpr double kCutFrom = 0.35;   // of the time in which something goes on: longer quiet is cut out
+constexpr double kCutFrom = 0.5;    // of the time in which something goes on: longer quiet is cut out
 constexpr double kMargin = 0.03;    // of it, before and after
 
 std::string formatted(const char* form, int digits, double value) {

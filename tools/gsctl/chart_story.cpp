@@ -128,7 +128,7 @@ void Teller::vote(const HappeningT& h) {
   const bool is_default = h.kind == Kind::DefaultVote;
   Phase& phase = protocol.phases.back();
   phase.waits.push_back({lane(*h.who, h.name), phase.from, h.time_us, !is_default, is_default ? h.what : ""});
-  const std::string message = h.message.empty() ? "" : " " + gsctl::quoted(h.message);
+  const std::string message = h.message.empty() ? "" : " " + in_quotes(h.message);
   note(h, is_default ? Mark::Shape::kDefault : shape_of_vote(h.what),
        (is_default ? "default: " + h.what : h.what) + message);
 }
@@ -225,7 +225,7 @@ std::vector<std::string> groups_of(const Recording& recording) {
 }
 
 Microseconds end_of(const Recording& recording) {
-  Microseconds end = recording.started_us;
+  Microseconds end = std::max(recording.started_us, recording.ended_us);
   for (const HappeningT& h : recording.happenings) end = std::max(end, h.time_us);
   return end;
 }

@@ -72,7 +72,7 @@ Story story_of(const Recording& recording, const std::string& group);
 /// All groups that the recording tells something of, by name.
 std::vector<std::string> groups_of(const Recording& recording);
 
-/// The time of its last line.
+/// When it ended, as far as it says so.
 Microseconds end_of(const Recording& recording);
 
 }  // namespace gsctl

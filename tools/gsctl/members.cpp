@@ -1,7 +1,7 @@
 // gsctl members: who is in a group.
 #include "tools/gsctl/listing.h"
+#include "tools/gsctl/member.h"
 #include "tools/gsctl/reports.h"
-#include "tools/gsctl/session.h"
 
 namespace gsctl {
 namespace {

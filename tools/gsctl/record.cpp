@@ -1,5 +1,6 @@
 // gsctl record: what happens in groups, into a file.
 #include <fcntl.h>
+#include <poll.h>
 
 #include <cerrno>
 #include <chrono>
@@ -7,6 +8,7 @@
 
 #include "tools/gsctl/inspection.h"
 #include "tools/gsctl/loop.h"
+#include "tools/gsctl/member.h"
 #include "tools/gsctl/output.h"
 #include "tools/gsctl/recording.h"
 #include "tools/gsctl/session.h"
@@ -81,6 +83,13 @@ std::string lines_of(gs::inspect::Inspector& tap, std::uint64_t* count) {
   return lines;
 }
 
+/// The first report says that from then on nothing is left out.
+void await_begin(gs::inspect::Inspector& tap) {
+  constexpr int kPatience = 10'000;  // milliseconds
+  pollfd told{tap.fd(), POLLIN, 0};
+  if (poll(&told, 1, kPatience) <= 0) throw Error(kTimeOver, "the daemon does not answer in time: see its log");
+}
+
 void check(const Options& options) {
   if (options.all == !options.groups.empty()) throw Error(kWrongUse, "give the GROUPs to record, or --all");
   for (const std::string& group : options.groups) check_group(group);
@@ -93,6 +102,7 @@ int record(const Options& options, const Settings& settings) {
   check(options);
   gs::inspect::Inspector tap = connected(Settings{});
   tap.tap(options.groups, options.contents);
+  await_begin(tap);
   const Recording start = beginning(options, Settings{});
   Output output(options.file);
   output.write(line_of(header_json(start)));
@@ -104,7 +114,7 @@ int record(const Options& options, const Settings& settings) {
   Loop::Handle over;
   if (settings.timeout) over = loop.after(std::chrono::duration<double>(*settings.timeout), [&] { loop.stop(); });
   loop.run();
-  output.write(lines_of(tap, &count));
+  output.write(lines_of(tap, &count) + line_of(end_json(now_us())));
   if (settings.json) {
     print_json({{"file", options.file}, {"happenings", count}});
   } else {

@@ -108,8 +108,9 @@ void read_line(Recording& recording, const Json& object) {
     recording.missed.push_back({number_of<std::uint64_t>(object, "count"), time_of(object)});
     return;
   }
+  if (kind == "end") recording.ended_us = time_of(object);
   const auto found = std::find(std::begin(kKindNames), std::end(kKindNames), kind);
-  if (found == std::end(kKindNames)) return;  // of a later gsctl
+  if (found == std::end(kKindNames)) return;  // the end, or of a later gsctl
   const auto number = static_cast<std::uint8_t>(found - std::begin(kKindNames));
   recording.happenings.push_back(happening_of(object, static_cast<inspect::Kind>(number)));
 }
@@ -156,6 +157,8 @@ Json to_json(const inspect::HappeningT& h) {
 Json missed_json(std::uint64_t count, std::int64_t time_us) {
   return {{"kind", "missed"}, {"time_us", time_us}, {"count", count}};
 }
+
+Json end_json(std::int64_t time_us) { return {{"kind", "end"}, {"time_us", time_us}}; }
 
 Json header_json(const Recording& recording) {
   Json groups = Json::array();

@@ -14,6 +14,9 @@ Json to_json(const inspect::HappeningT& happening);
 /// So many happenings were left out before `time_us`, since they were not read in time.
 Json missed_json(std::uint64_t count, std::int64_t time_us);
 
+/// The last line.
+Json end_json(std::int64_t time_us);
+
 struct KnownMember {
   inspect::Id id;
   std::string name;
@@ -21,6 +24,7 @@ struct KnownMember {
 
 struct Recording {
   std::int64_t started_us = 0;
+  std::int64_t ended_us = 0;  // 0: nobody said; its last line is its end
   /// Who was there when it began, oldest first.
   std::map<std::string, std::vector<KnownMember>> groups;
   std::vector<inspect::HappeningT> happenings;

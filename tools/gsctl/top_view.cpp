@@ -240,11 +240,11 @@ void TopView::add_help(std::vector<ScreenLine>& to) const {
 }
 
 void TopView::add_table(std::vector<ScreenLine>& to, const Table& table, int width, int height) {
-  const auto line_of = [&](const auto& cell) {
-    std::string line;
+  const auto line_of = [&](const char* begin, const auto& cell) {
+    std::string line = begin;
     for (std::size_t i = 0; i < table.columns.size(); ++i) {
-      const std::size_t left =
-          static_cast<std::size_t>(width) - std::min<std::size_t>(platform::width_of(line), width);
+      const auto whole = static_cast<std::size_t>(width);
+      const std::size_t left = whole - std::min(platform::width_of(line), whole);
       line += fitted(cell(i), table.columns[i].width == 0 ? left : table.columns[i].width) + " ";
     }
     return line;
@@ -256,13 +256,14 @@ void TopView::add_table(std::vector<ScreenLine>& to, const Table& table, int wid
   selected_ = std::min(selected_, keys_.empty() ? 0 : keys_.size() - 1);
   selected_key_ = keys_.empty() ? "" : keys_[selected_];
 
-  to.push_back({line_of([&](std::size_t i) { return std::string(table.columns[i].name); }), Look::kReverse});
+  to.push_back({line_of(" ", [&](std::size_t i) { return std::string(table.columns[i].name); }), Look::kReverse});
   page_ = static_cast<std::size_t>(std::max(height - static_cast<int>(to.size()) - 1, 1));
   first_ = std::min(first_, selected_);
   if (selected_ >= first_ + page_) first_ = selected_ - page_ + 1;
   for (std::size_t i = first_; i < table.entries.size() && i < first_ + page_; ++i) {
-    const std::string line = line_of([&](std::size_t cell) { return table.entries[i].cells[cell]; });
-    to.push_back({i == selected_ ? ">" + line : " " + line, i == selected_ ? Look::kReverse : Look::kPlain});
+    const bool is_selected = i == selected_;
+    const auto cell = [&](std::size_t column) { return table.entries[i].cells[column]; };
+    to.push_back({line_of(is_selected ? ">" : " ", cell), is_selected ? Look::kReverse : Look::kPlain});
   }
 }
 
