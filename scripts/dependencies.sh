@@ -8,7 +8,7 @@ purpose=${1:-build}
 wanted=(g++ cmake ninja-build pkg-config libevent-dev libflatbuffers-dev flatbuffers-compiler libcli11-dev
         libtoml11-dev nlohmann-json3-dev libspdlog-dev libsodium-dev libncurses-dev libcpg-dev libquorum-dev
         libvotequorum-dev libcfg-dev libcorosync-common-dev)
-case $purpose in build | test) wanted+=(libgtest-dev libgmock-dev libbenchmark-dev) ;; esac
+case $purpose in build | test) wanted+=(libgtest-dev libgmock-dev libbenchmark-dev libvterm-dev) ;; esac
 case $purpose in cluster | test) wanted+=(corosync iproute2) ;; esac
 # The sanitizer builds use clang. Where its runtimes are a package of their own they are wanted too, elsewhere
 # (Ubuntu 22.04) they come with the compiler. The symbolizer of llvm makes the sanitizers' reports readable.

@@ -9,10 +9,6 @@ namespace {
 using inspect::HappeningT;
 using inspect::Kind;
 
-bool is_departure(const std::string& protocol) {
-  return protocol == "leave" || protocol == "failure" || protocol == "expel";
-}
-
 Mark::Shape shape_of_vote(const std::string& vote) {
   if (vote == "reject") return Mark::Shape::kReject;
   return vote == "continue" ? Mark::Shape::kContinue : Mark::Shape::kApprove;

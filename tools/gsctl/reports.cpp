@@ -140,6 +140,10 @@ std::string to_text(const std::unique_ptr<inspect::ProtocolT>& running) {
   return running->age_ms < 0 ? text : text + ", " + duration_text(running->age_ms);
 }
 
+bool is_departure(std::string_view protocol) {
+  return protocol == "leave" || protocol == "failure" || protocol == "expel";
+}
+
 std::uint64_t count_of(const inspect::DaemonT& daemon, std::string_view name) {
   const auto found = std::find_if(daemon.counts.begin(), daemon.counts.end(),
                                   [&](const auto& count) { return count->name == name; });

@@ -27,6 +27,9 @@ std::string user_text(std::uint32_t user);
 /// "state_value_change, phase 2, 1 of 3 voted, 2.1 s"; "-" for null.
 std::string to_text(const std::unique_ptr<inspect::ProtocolT>& running);
 
+/// Whether members go by this protocol.
+bool is_departure(std::string_view protocol);
+
 /// The value of one of the daemon's counts; 0 where it has none of this name.
 std::uint64_t count_of(const inspect::DaemonT& daemon, std::string_view name);
 
