@@ -51,8 +51,8 @@ struct BeginId {
 struct History {
   std::uint64_t ring = 0;       // sequence of the ring in which it last won an exchange
   std::uint64_t exchanges = 0;  // won in that ring
-  std::uint64_t messages = 0;   // ordered since the last of them
-  std::uint64_t digest = 0;     // of those, and of the exchange
+  std::uint64_t messages = 0;   // ordered in that ring since the last of them
+  std::uint64_t digest = 0;     // of all ordered since, and of the exchange
   auto operator<=>(const History&) const = default;
 };
 

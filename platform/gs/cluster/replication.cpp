@@ -283,7 +283,7 @@ void Replication::on(const Process& from, const Ordered& ordered) {
   if (!track.history || (keeps(Rule::kLives) && !has(track.lives, from.node, ordered.life))) return;
   if (!may_order(from.node, *ordered.event)) return;
   if (track.waiting.empty()) progress();
-  track.append(ordered);
+  track.append(ordered, ring_);
   if (state_ != State::kRunning) return;
   confirmations_[settings_.self.node] = track.received;
   if (!settings_.safe) apply_confirmed();

@@ -38,8 +38,9 @@ struct Track {
   std::size_t bytes = 0;           // of those
   std::uint64_t received = 0;      // position of the last
 
-  void append(const Ordered& message) {
-    ++history->messages;
+  /// In another ring than that of the history it may be known to few: it does not put them ahead of the others.
+  void append(const Ordered& message, const RingId& ring) {
+    if (history->ring == ring.sequence) ++history->messages;
     history->digest = mix(mix(history->digest, message.life), message.number);
     waiting.push_back({++received, message.event, message.size});
     bytes += message.size;
