@@ -45,7 +45,7 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
   const Message at_limit[] = {
       Begin{{}, ring, most, {{1, kMaxVotes}}, 0, 0},
       Word{{}, 1, 1, {}, address, address},
-      Piece{{}, 0, 1, std::vector<std::byte>(kMaxPiece)},
+      Piece{0, 1, std::vector<std::byte>(kMaxPiece)},
       Confirmed{{}, 1, std::vector<Node>(kMaxNodes, 1)},
       ordered(TimerExpiredEvent{{std::string(kMaxGroupName, 'g'), 1, 1}}),
       ordered(AdaptersEvent{1, Adapters(kMaxAdapters, {std::string(kMaxAdapterName, 'a'), {}})})};
@@ -61,8 +61,8 @@ TEST(ClusterCodec, MessageOverALimit_IsNotEncoded_OneAtTheLimitIs) {
                              Word{{}, 1, 1, {}, address + "a", ""},
                              Word{{}, 1, 1, {}, std::string("a\0b", 3), ""},
                              Word{{}, 1, 1, {}, "", address + "a"},
-                             Piece{{}, 1, 1, {}},
-                             Piece{{}, 0, 1, std::vector<std::byte>(kMaxPiece + 1)},
+                             Piece{1, 1, {}},
+                             Piece{0, 1, std::vector<std::byte>(kMaxPiece + 1)},
                              Confirmed{{}, 1, std::vector<Node>(kMaxNodes + 1, 1)},
                              Ordered{},
                              ordered(NumbersEvent{1}),

@@ -33,7 +33,7 @@ struct Datagram {
 
 /// What the hosts of one simulation share.
 struct World {
-  explicit World(const Plan& of) : plan(of), network(of.hosts), history(static_cast<Node>(of.hosts), of.safe) {}
+  explicit World(const Plan& of) : plan(of), network(of.hosts), history(static_cast<Node>(of.hosts)) {}
 
   /// For whoever reads a failure.
   void tell(Node node, const std::string& what) {
@@ -46,10 +46,11 @@ struct World {
   History history;
   Time now{0};
   std::vector<Datagram> datagrams;
-  std::deque<TimerId> timers;    // that somebody has armed
-  std::set<SessionId> sessions;  // all that have begun
-  std::set<SessionId> over;      // those that have ended
-  std::map<Node, Word> words;    // everybody's last, since it has lost its state
+  std::deque<TimerId> timers;                    // that somebody has armed
+  std::set<SessionId> sessions;                  // all that have begun
+  std::set<SessionId> over;                      // those that have ended
+  std::map<Node, Word> words;                    // everybody's last, since it has lost its state
+  std::set<std::pair<Node, BeginId>> concluded;  // who has confirmed the decision of which exchange
   struct Named {
     std::uint64_t name = 0;
     std::shared_ptr<const Event> event;
@@ -196,10 +197,13 @@ class Daemon : public Order, public Replica, public Host {
     }
     if (const auto* ordered = std::get_if<Ordered>(&message))
       world_.events[ordered->event.get()] = {world_.events.size(), ordered->event};
+    if (const auto* confirmed = std::get_if<Confirmed>(&message))
+      world_.concluded.emplace(self_.node, confirmed->begin);
     world_.tell(self_.node, "sends " + test::text(message));
     world_.network.send(self_, message);
   }
   void confirm(const Confirmed& confirmed) override {
+    world_.concluded.emplace(self_.node, confirmed.begin);
     for (const auto& [node, word] : peers_)
       if (node != self_.node) world_.datagrams.push_back({self_.node, node, word.address, key(), confirmed});
   }
@@ -218,6 +222,7 @@ class Daemon : public Order, public Replica, public Host {
     if (!world_.network.is_quorate(ring_)) world_.history.error("no quorum: but something is applied");
     world_.history.applied(self_.node, place_, beside());
     world_.history.hold(self_.node, place_);
+    check_concluded();
     if (world_.plan.safe) note_confirmed();
     if (serving_) {
       world_.history.serves(self_.node, ring_, place_, beside());
@@ -328,6 +333,15 @@ class Daemon : public Order, public Replica, public Host {
     for (const auto& [node, word] : world_.words)
       if (word.begin == own_word_.begin) nodes.insert(node);
     return nodes;
+  }
+  /// Nothing is applied before everyone who takes part knows who does.
+  void check_concluded() const {
+    for (const auto& [node, word] : peers_) {
+      const auto last = world_.words.find(node);
+      const bool lives = last != world_.words.end() && last->second.life == word.life;
+      if (node != self_.node && lives && !world_.concluded.contains({node, own_word_.begin}))
+        world_.history.error("applied too early: node " + std::to_string(node) + " has not received it");
+    }
   }
   /// All whom the last exchange asked have received what is applied here, and who had the state has it still.
   void note_confirmed() {

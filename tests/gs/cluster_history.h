@@ -12,18 +12,17 @@ namespace gs::cluster::test {
 /// A tree: a place in it is a sequence of events, the root an empty engine. Replicas that are at the same place
 /// must be in the same state.
 ///
-/// A host *holds* a place when it has applied it, or has confirmed it while it had the state before it, and has
-/// not lost its state since; it loses it by dying, by leaving the group, and where it takes up a state without
-/// that place. What a replica has applied and a majority of all hosts holds, is on every later replica's way: each
-/// ring with quorum has somebody who holds it. Where an exchange without a majority of holders leaves somebody out
-/// who has a state, he counts as if he held what is applied: such an exchange must not be.
+/// A host *holds* a place when it has applied it, or (with safe delivery) has confirmed it while it had the state
+/// before it, and has not lost its state since; it loses it by dying, by leaving the group, and where it takes up
+/// a state without that place. What a replica has applied and a majority of all hosts holds, is on every later
+/// replica's way: each ring with quorum has somebody who holds it. Where an exchange without a majority of holders
+/// leaves somebody out who has a state, he counts as if he held what is applied: such an exchange must not be.
 class History {
  public:
   using Place = std::uint32_t;
   static constexpr Place kEmpty = 0;
 
-  History(Node hosts, bool never_taken_back)
-      : majority_(hosts / 2 + 1), never_taken_back_(never_taken_back), held_(hosts + 1, kEmpty), places_(1) {}
+  explicit History(Node hosts) : majority_(hosts / 2 + 1), held_(hosts + 1, kEmpty), places_(1) {}
 
   /// From `at`, by the event of this name, to a state of this digest.
   Place apply(Place at, std::uint64_t event, std::uint64_t digest, const std::vector<TimerRequest>& timers) {
@@ -59,7 +58,7 @@ class History {
   }
   /// Where a majority is in this exchange, it has what a majority holds.
   void applied(Node node, Place at, const std::set<Node>& beside) {
-    if (never_taken_back_ && beside.size() >= majority_ && !on_one_way(at, kept_))
+    if (beside.size() >= majority_ && !on_one_way(at, kept_))
       error("taken back: node " + std::to_string(node) + " has not what a majority holds");
   }
   /// It has confirmed this, and knows what comes before.
@@ -106,7 +105,6 @@ class History {
   }
 
   const Node majority_;
-  const bool never_taken_back_;
   std::vector<Place> held_;  // by node
   std::vector<Entry> places_;
   std::map<std::pair<Place, std::uint64_t>, Place> children_;

@@ -122,10 +122,18 @@ class Network {
       return connected(host.node, node) && other.ring == host.ring && !other.gathering;
     });
   }
+  /// Its members have formed none after it, though not all may have been shown it: who has may say something in
+  /// it.
+  bool is_latest(const Station& host) const {
+    if (!host.up || host.gathering) return false;
+    return std::ranges::all_of(host.ring->members, [&](Node node) {
+      return connected(host.node, node) && stations_[node].sequence == host.ring->id.sequence;
+    });
+  }
   bool is_to_reform(const Station& host) const {
     return host.up && !(is_whole(host) && component(host.node) == host.ring->members);
   }
-  bool can_order(const Station& host) const { return (!host.outbox.empty() || host.owed) && is_whole(host); }
+  bool can_order(const Station& host) const { return (!host.outbox.empty() || host.owed) && is_latest(host); }
   bool can_receive(const Station& host) const { return host.position < received_around(host); }
 
   /// The next message of this host goes into the order; who sends has received all before it.
@@ -142,17 +150,26 @@ class Network {
     receive(host, std::min(host.position + count, received_around(host)));
   }
 
+  /// It is cut off for so short that nobody is shown a ring of it: what the others receive meanwhile it may miss.
+  void blip(Node node) {
+    Station& host = at(node);
+    if (!host.up) return;
+    host.sequence += 4;
+    host.companions = host.sequence * 16 + 8 + node;
+    host.gathering = true;
+  }
   /// A new ring of the hosts that this one can reach. `random`: it may be given up, or leave somebody out.
-  void reform(Node node, Random* random) {
+  /// `lost`: more often than not.
+  void reform(Node node, Random* random, bool lost = false) {
     if (!at(node).up) return;
     auto members = component(node);
-    if (random && random->chance(20))
-      std::erase_if(members, [&](Node m) { return m != node && random->chance(40); });
+    if (random && random->chance(lost ? 60 : 20))
+      std::erase_if(members, [&](Node m) { return m != node && random->chance(lost ? 60 : 40); });
     auto ring = std::make_shared<Ring>(Ring{{0, members.front()}, members, {}});
     for (const Node m : members) ring->id.sequence = std::max(ring->id.sequence, at(m).sequence + 4);
     rings_[ring->id] = members;
     const auto apart = equalise(members, ring->id);
-    const int percent = !random || random->chance(60) ? 100 : random->chance(60) ? 0 : 50;
+    const int percent = !random || random->chance(lost ? 20 : 60) ? 100 : random->chance(60) ? 0 : 50;
     std::set<Node> shown;
     for (const Node m : members)
       if (percent == 100 || random->chance(percent)) shown.insert(m);

@@ -23,7 +23,7 @@ inline auto fields(const Word& m) {
   return std::tie(m.begin, m.version, m.life, m.history, m.address, m.key, m.limits, m.left);
 }
 inline auto fields(const Ordered& m) { return std::tie(m.life, m.number, m.event); }
-inline auto fields(const Piece& m) { return std::tie(m.begin, m.index, m.count, m.bytes); }
+inline auto fields(const Piece& m) { return std::tie(m.index, m.count, m.bytes); }
 inline auto fields(const Confirmed& m) { return std::tie(m.begin, m.position, m.ask); }
 inline auto fields(const Evict& m) { return std::tie(m.ring, m.who); }
 
@@ -41,7 +41,7 @@ inline std::vector<Message> messages() {
       Begin{kBegin, ring, {{kNode, 5}, {1, 6}}, {{1, 2}, {kNode, 3}}, 4, 1ull << 40},
       Word{kBegin, kProtocolVersion, 9, History{1, 2, 3, kLife}, "192.0.2.1:5405", key, 7, {{kNode, 16}}},
       Word{kBegin, kProtocolVersion + 1, 9, {}, "", ""},
-      Piece{kBegin, 2, 3, std::vector<std::byte>(1000, std::byte{0x80})},
+      Piece{2, 3, std::vector<std::byte>(1000, std::byte{0x80})},
       Confirmed{kBegin, 0x100000002, {1, kNode}},
       Evict{ring, {{kNode, 1}, {32767, 2}}}};
   std::vector<Event> events = {SessionGoneEvent{session}, TimerExpiredEvent{{"a group", 0xfedcba9876543210, 3}},

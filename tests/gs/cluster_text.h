@@ -33,7 +33,7 @@ inline std::string text(const Ordered& m) {
   return "event " + std::to_string(m.number) + " of life " + std::to_string(m.life % 1'000);
 }
 inline std::string text(const Piece& m) {
-  return "piece " + std::to_string(m.index) + " of " + std::to_string(m.count) + " for " + text(m.begin);
+  return "piece " + std::to_string(m.index) + " of " + std::to_string(m.count);
 }
 inline std::string text(const Confirmed& m) {
   std::string said = "confirmed " + std::to_string(m.position) + " of " + text(m.begin);

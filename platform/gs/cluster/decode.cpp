@@ -72,7 +72,7 @@ class Reader {
     return Ordered{m->life(), m->number(), std::make_shared<const Event>(std::move(*read)), message_size_};
   }
   std::optional<Message> value_of(const fb::Piece* m) {
-    return Piece{value(m->begin()), m->index(), m->count(), bytes_of<std::vector<std::byte>>(m->bytes())};
+    return Piece{m->index(), m->count(), bytes_of<std::vector<std::byte>>(m->bytes())};
   }
   std::optional<Message> value_of(const fb::Confirmed* m) {
     return Confirmed{value(m->begin()), m->position(), {m->ask()->begin(), m->ask()->end()}};

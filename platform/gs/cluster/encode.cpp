@@ -85,9 +85,8 @@ MessageBody body(Builder& b, const Ordered& m) {
   return {fb::Body::Ordered, fb::CreateOrdered(b, m.life, m.number, event.kind, event.value).Union()};
 }
 MessageBody body(Builder& b, const Piece& m) {
-  const auto begin = pack(m.begin);
   const auto bytes = put_bytes(b, m.bytes);
-  return {fb::Body::Piece, fb::CreatePiece(b, &begin, m.index, m.count, bytes).Union()};
+  return {fb::Body::Piece, fb::CreatePiece(b, m.index, m.count, bytes).Union()};
 }
 MessageBody body(Builder& b, const Confirmed& m) {
   const auto begin = pack(m.begin);

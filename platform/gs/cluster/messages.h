@@ -88,7 +88,6 @@ struct Ordered {
 
 /// Part of the state as it was when the decision of an exchange was applied.
 struct Piece {
-  BeginId begin;
   std::uint32_t index = 0;
   std::uint32_t count = 0;
   std::vector<std::byte> bytes;

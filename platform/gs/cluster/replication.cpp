@@ -78,18 +78,19 @@ void Replication::verdict(const Verdict& verdict) {
     if (!verdict.quorate) replica_.wait_no_more();
     return join_if_quorate();
   }
-  if (!verdict.quorate && verdict.ring.sequence >= ring_.sequence) return lose("this host has no quorum");
+  if (is_judged(false)) return lose("this host has no quorum");
   begin_if_lowest();
   answer_begin();
   apply_confirmed();
 }
 
-/// The ring that this daemon is in has quorum, and no later one is known of.
-bool Replication::goes_on() const {
-  if (!keeps(Rule::kVerdictFirst)) return true;
-  if (!verdict_ || !verdict_->quorate) return false;
-  return verdict_->ring == ring_ || (!keeps(Rule::kPassOver) && verdict_->ring.sequence > ring_.sequence);
+/// By the verdict of the ring that this daemon is in, or of one that comes after it: what a daemon sends once a
+/// ring is judged never goes into an earlier one, so that no exchange without quorum can come of it.
+bool Replication::is_judged(bool quorate) const {
+  return verdict_ && verdict_->quorate == quorate && verdict_->ring.sequence >= ring_.sequence;
 }
+
+bool Replication::goes_on() const { return is_judged(true) || !keeps(Rule::kVerdictFirst); }
 
 void Replication::stop() {
   state_ = State::kWaiting;
@@ -98,8 +99,7 @@ void Replication::stop() {
   donation_.reset();
   begun_ = false;
   progress();
-  if (verdict_ && !verdict_->quorate && verdict_->ring.sequence >= ring_.sequence)
-    return lose("this host has no quorum");
+  if (is_judged(false)) return lose("this host has no quorum");
   begin_if_lowest();
 }
 
@@ -372,10 +372,10 @@ void Replication::serve(const Decision& decision) {
 void Replication::donate(const Decision& decision) {
   const bool lowest = decision.holders.begin()->first == settings_.self.node;
   if (!lowest || decision.holders.size() == decision.asked.size()) return;
-  donation_ = Donation{decision.begin, replica_.snapshot()};
+  donation_ = Donation{replica_.snapshot()};
   if (donation_->bytes.empty()) {
     host_.log("the state is over 1.5 GiB and cannot be sent: set a lower state-bound on all hosts");
-    order_.send(Piece{decision.begin, 0, 1, {}});
+    order_.send(Piece{0, 1, {}});
     return donation_.reset();
   }
   donation_->count = static_cast<std::uint32_t>((donation_->bytes.size() + settings_.piece - 1) / settings_.piece);
@@ -387,16 +387,12 @@ void Replication::send_piece() {
   const std::size_t from = donation_->sent * settings_.piece;
   const std::size_t length = std::min(settings_.piece, donation_->bytes.size() - from);
   const auto first = donation_->bytes.begin() + static_cast<std::ptrdiff_t>(from);
-  order_.send(Piece{donation_->begin,
-                    donation_->sent++,
-                    donation_->count,
-                    {first, first + static_cast<std::ptrdiff_t>(length)}});
+  order_.send(Piece{donation_->sent++, donation_->count, {first, first + static_cast<std::ptrdiff_t>(length)}});
 }
 
 void Replication::on(const Process& from, const Piece& piece) {
-  if (donation_ && from == settings_.self && piece.begin == donation_->begin) return send_piece();
-  if (!catching_up_ || (keeps(Rule::kPieceNamesBegin) && piece.begin != exchange_->begin().id)) return;
-  if (from.node != decision_->holders.begin()->first || piece.index != catching_up_->next) return;
+  if (donation_ && from == settings_.self) return send_piece();
+  if (!catching_up_ || from.node != decision_->holders.begin()->first || piece.index != catching_up_->next) return;
   ++catching_up_->next;
   catching_up_->bytes.insert(catching_up_->bytes.end(), piece.bytes.begin(), piece.bytes.end());
   progress();
