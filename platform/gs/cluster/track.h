@@ -1,8 +1,10 @@
 // A state of the engine as the order sees it: how far it is ahead, and what it has received and not applied.
 #pragma once
 
+#include <algorithm>
 #include <deque>
 #include <optional>
+#include <utility>
 
 #include "cluster/messages.h"
 
@@ -36,17 +38,22 @@ struct Track {
   Lives hosts;                     // that the engine knows
   std::deque<Entry> waiting;       // received and not applied
   std::size_t bytes = 0;           // of those
+  std::size_t apart = 0;           // the last of those: received in another ring than that of the history
   std::uint64_t received = 0;      // position of the last
 
   /// In another ring than that of the history it may be known to few: it does not put them ahead of the others.
   void append(const Ordered& message, const RingId& ring) {
-    if (history->ring == ring.sequence) ++history->messages;
+    ++(history->ring == ring.sequence ? history->messages : apart);
     history->digest = mix(mix(history->digest, message.life), message.number);
     waiting.push_back({++received, message.event, message.size});
     bytes += message.size;
   }
-  /// What an older view may have confirmed counts no more: it has to be confirmed with the decision.
+  /// What an older view may have confirmed counts no more: it has to be confirmed with the decision. Before what
+  /// was received in another ring something may be missing that others have told: its numbers are new ones.
   void append(const std::shared_ptr<const Decision>& decision) {
+    const auto number_on = std::make_shared<const Event>(NumbersEvent{decision->numbers});
+    const auto those = static_cast<std::ptrdiff_t>(std::min(std::exchange(apart, 0), waiting.size()));
+    if (those > 0) waiting.insert(waiting.end() - those, {1, number_on});
     for (Entry& entry : waiting) entry.position = 1;
     history = decision->history;
     lives = decision->asked;
