@@ -78,19 +78,20 @@ void Replication::verdict(const Verdict& verdict) {
     if (!verdict.quorate) replica_.wait_no_more();
     return join_if_quorate();
   }
-  if (is_judged(false)) return lose("this host has no quorum");
+  if (has_lost_quorum()) return lose("this host has no quorum");
   begin_if_lowest();
   answer_begin();
   apply_confirmed();
 }
 
-/// By the verdict of the ring that this daemon is in, or of one that comes after it: what a daemon sends once a
-/// ring is judged never goes into an earlier one, so that no exchange without quorum can come of it.
-bool Replication::is_judged(bool quorate) const {
-  return verdict_ && verdict_->quorate == quorate && verdict_->ring.sequence >= ring_.sequence;
+/// In a ring that a later one has passed over, what this daemon says would come too late.
+bool Replication::goes_on() const {
+  return !keeps(Rule::kVerdictFirst) || (verdict_ && verdict_->quorate && verdict_->ring == ring_);
 }
 
-bool Replication::goes_on() const { return is_judged(true) || !keeps(Rule::kVerdictFirst); }
+bool Replication::has_lost_quorum() const {
+  return verdict_ && !verdict_->quorate && verdict_->ring.sequence >= ring_.sequence;
+}
 
 void Replication::stop() {
   state_ = State::kWaiting;
@@ -99,7 +100,7 @@ void Replication::stop() {
   donation_.reset();
   begun_ = false;
   progress();
-  if (is_judged(false)) return lose("this host has no quorum");
+  if (has_lost_quorum()) return lose("this host has no quorum");
   begin_if_lowest();
 }
 

@@ -16,7 +16,7 @@
 //
 //   (1) Every view and every ring, and every eviction, ends what runs and asks for an exchange of its own.
 //   (2) By the lowest daemon of the view that is not evicted.
-//   (3) Words and begins wait for the verdict that this ring or a later one is quorate. That it is not: lose.
+//   (3) Words and begins wait for the verdict that this ring is quorate. Not quorate, this or a later ring: lose.
 //   (4) Who has the greatest history is a holder and goes on; it serves once all have confirmed the decision. Who
 //       has it not has lost its clients and catches up: it takes the state as the lowest holder sends it.
 //   (5) With the last of them it has the state and orders a begin, in which it is a holder.
@@ -176,8 +176,8 @@ class Replication {
   void on(const Process& from, const Evict& evict);
 
   bool keeps(Rule rule) const { return settings_.without != rule; }
-  bool is_judged(bool quorate) const;
   bool goes_on() const;
+  bool has_lost_quorum() const;
   std::vector<Process> not_evicted() const;
   void stop();
   void begin_if_lowest();
