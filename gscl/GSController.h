@@ -211,7 +211,9 @@ class ZN_GSCL_EXPORT GSController : public zelt_gscl_V2::GSController {
   /// wyx_internal_send_domain_msg_to_gsd; `length` in bytes.
   wyx_rc_t sendDomainMsgToGSD(wyx_priv_channel_msg_type_t type, void* data, unsigned long length);
 
-  /// The current controller; null when there is none or it is of an older version.
+  /// The pointer that the first version's function returns, as one to this version: null only when there is no current
+  /// controller. Where the current one may have been constructed as an older version, use nothing through it that
+  /// this class adds virtually.
   static GSController* theController();
 };
 

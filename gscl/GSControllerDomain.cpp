@@ -60,7 +60,7 @@ wyx_rc_t stub_change_responsiveness(const wyx_responsiveness_t* responsiveness) 
 
 void stub_domain_controlCb(const wyx_domain_control_notification_t* notification) {
   GS_TRACE(GSCL_TRC_API, "stub_domain_control_cb() domain_event=%d ENTER\n", notification->domain_event_type);
-  if (zelt_gscl_V3::GSController* controller = zelt_gscl_V3::GSController::theController()) {
+  if (auto* controller = GSxControllerData::_theDomainController.load(std::memory_order_acquire)) {
     controller->domainControlCb(notification);
   } else {
     GS_TRACE(GSCL_TRC_WARNING, "stub_domain_control_cb() domain_event=%d dropped: no controller of version 3\n",
@@ -80,7 +80,7 @@ GSController::GSController(unsigned int version) : zelt_gscl_V2::GSController(ve
 GSController::~GSController() = default;
 
 GSController* GSController::theController() {
-  return GSxControllerData::_theDomainController.load(std::memory_order_acquire);
+  return static_cast<GSController*>(zelt_gscl_V1::GSController::theController());
 }
 
 wyx_rc_t GSController::changeResponsiveness(const wyx_responsiveness_t* responsiveness) {
