@@ -73,7 +73,9 @@ TempFolder::~TempFolder() {
 }
 
 std::string program(const std::string& name) {
-  const auto here = std::filesystem::read_symlink("/proc/self/exe").parent_path();
+  std::error_code missing;
+  const auto here = std::filesystem::read_symlink("/proc/self/exe", missing).parent_path();
+  if (missing) throw Failure{"there is no /proc here; as root: mount -t proc proc /proc"};
   if (std::filesystem::exists(here / name)) return (here / name).string();
   return (here.parent_path() / name).string();
 }

@@ -12,9 +12,9 @@ case $purpose in build | test) wanted+=(libgtest-dev libgmock-dev libbenchmark-d
 case $purpose in cluster | test) wanted+=(corosync iproute2) ;; esac
 # The sanitizer builds use clang. Where its runtimes are a package of their own they are wanted too, elsewhere
 # (Ubuntu 22.04) they come with the compiler. The symbolizer of llvm makes the sanitizers' reports readable.
-# abigail-tools compares the library's interface with its description.
-if [ "$purpose" = test ]; then wanted+=(clang llvm libclang-rt-dev abigail-tools); fi
-if [ "$purpose" = package ]; then wanted+=(dpkg-dev file); fi
+# abigail-tools compares the library's interface with its description, lintian looks through the package.
+if [ "$purpose" = test ]; then wanted+=(clang llvm libclang-rt-dev abigail-tools lintian); fi
+case $purpose in package | test) wanted+=(dpkg-dev file) ;; esac
 
 if ! command -v dpkg-query >/dev/null; then
   echo "Not a Debian or Ubuntu: please see to it that you have the equivalents of: ${wanted[*]}" >&2
