@@ -143,7 +143,7 @@ void Cluster::run() {
 
 /// Why there can be no hosts here; empty: there can.
 std::string hosts_obstacle() {
-  Process tried({ZN_CLUSTER_SCRIPT, "check"}, {});
+  Process tried({ZN_CLUSTER_SCRIPT, "check"}, {{"WAIT", "15"}});  // less than the limit, so that it says why
   const int status = tried.wait_end(Clock::now() + zn::kStepLimit);
   while (tried.read_some()) {
   }
