@@ -77,7 +77,7 @@ await gsctl wait crew --state ready --timeout 1
 kill -KILL $ben
 await_text '"failure"' crew.record
 await_text '"change":"left".*"why":"failed"' all.log
-has '"change":"state","event":[0-9]*,.*"state":"ready"' all.log || die "no state in what watch says of all"
+has '"change":"state","event":[0-9]*,.*"value":"ready"' all.log || die "no state in what watch says of all"
 await gsctl wait crew --leader --timeout 1
 kill -INT $recorder
 wait $recorder || die "record ends with status $?"

@@ -8,6 +8,7 @@
 namespace gsctl {
 namespace {
 
+constexpr char kAll[] = "*";                             // in the place of a group: what is about all of them
 constexpr auto kPause = std::chrono::milliseconds(200);  // until a daemon is looked for again
 constexpr auto kPatience = std::chrono::seconds(1);      // of connecting
 
@@ -40,7 +41,7 @@ void AllChanges::receive() {
   } catch (const gs::inspect::InspectError& error) {
     readable_.reset();
     tap_.reset();
-    say_({"", "lost", {}, {}, "the daemon is gone", {}, {}});
+    say_({kAll, "lost", {}, {}, "the daemon is gone", {}, {}});
     come_back();
   }
 }
@@ -49,7 +50,7 @@ void AllChanges::come_back() {
   time_ = loop_.after(kPause, [this] {
     try {
       connect();
-      say_({"", "found", {}, {}, "the daemon is back", {}, {}});
+      say_({kAll, "found", {}, {}, "the daemon is back", {}, {}});
     } catch (const gs::inspect::InspectError&) {
       come_back();
     }
@@ -57,7 +58,7 @@ void AllChanges::come_back() {
 }
 
 void AllChanges::take(const gs::inspect::ReportT& report) {
-  if (report.missed > 0) say_({"", "missed", {}, {}, std::to_string(report.missed) + " happenings", {}, {}});
+  if (report.missed > 0) say_({kAll, "missed", {}, {}, std::to_string(report.missed) + " happenings", {}, {}});
   for (const auto& happening : report.happenings) take(*happening);
 }
 

@@ -4,6 +4,7 @@
 
 #include <list>
 
+#include "tools/gsctl/all_changes.h"
 #include "tools/gsctl/change.h"
 #include "tools/gsctl/command.h"
 #include "tools/gsctl/member.h"
@@ -19,6 +20,13 @@ struct Options {
   std::vector<std::string> groups;
   std::string command;
 };
+
+/// A pipe is readable at its writing end when nobody reads it any more.
+Loop::Handle end_with_reader(Loop& loop) {
+  struct stat output {};
+  if (fstat(STDOUT_FILENO, &output) != 0 || !S_ISFIFO(output.st_mode)) return nullptr;
+  return loop.on_readable(STDOUT_FILENO, [] { throw OutputGone(); });
+}
 
 class Watch {
  public:
@@ -55,10 +63,7 @@ void Watch::begin() {
       subscribe();
     });
   });
-  struct stat output {};
-  if (fstat(STDOUT_FILENO, &output) == 0 && S_ISFIFO(output.st_mode)) {  // readable: nobody reads it any more
-    reader_ = loop_.on_readable(STDOUT_FILENO, [] { throw OutputGone(); });
-  }
+  reader_ = end_with_reader(loop_);
   subscribe();
 }
 
@@ -122,20 +127,37 @@ void Watch::say_of_all(const std::string& what) {
   }
 }
 
-/// Of every group there is.
-int watch_all(const Options&, const Settings&) { throw Error(kWrongUse, "GROUP: name at least one"); }
+/// Until interrupted.
+void run(Loop& loop, const Settings& settings) {
+  const auto interrupts = on_interrupt(loop, [&](int) { loop.stop(); });
+  const auto limit = end_in_time(loop, settings, "watched for as long as --timeout says");
+  loop.run();
+}
 
-int watch(const Options& options, const Settings& settings) {
-  if (options.groups.empty()) return watch_all(options, settings);
+/// Of every group there is.
+void watch_all(const Options& options, const Settings& settings) {
+  Loop loop;
+  JobQueue jobs(loop);
+  AllChanges changes(loop, [&](const Change& change) {
+    print(change, settings.json);
+    if (!options.command.empty()) jobs.add(job_of(change, options.command));
+  });
+  const auto reader = end_with_reader(loop);
+  run(loop, settings);
+}
+
+void watch_some(const Options& options, const Settings& settings) {
   for (const std::string& group : options.groups) check_group(group);
   Loop loop;
   Session session(loop);
   session.open();
   Watch watch(loop, session, options, settings);
-  const auto interrupts = on_interrupt(loop, [&](int) { loop.stop(); });
-  const auto limit = end_in_time(loop, settings, "watched for as long as --timeout says");
   watch.begin();
-  loop.run();
+  run(loop, settings);
+}
+
+int watch(const Options& options, const Settings& settings) {
+  options.groups.empty() ? watch_all(options, settings) : watch_some(options, settings);
   return kDone;
 }
 
@@ -143,9 +165,8 @@ int watch(const Options& options, const Settings& settings) {
 
 Run add_watch(CLI::App& command) {
   auto options = std::make_shared<Options>();
-  command.add_option("GROUP", options->groups, "Their names; they need not be there yet")
-      ->type_name("")
-      ->required();
+  command.add_option("GROUP", options->groups, "Their names; they need not be there yet. None: all there are")
+      ->type_name("");
   command.add_option("--exec", options->command, "Run this by the shell for each change, one after the other")
       ->type_name("CMD");
   return [options](const Settings& settings) { return watch(*options, settings); };
