@@ -14,11 +14,11 @@ for command in status groups "members crew" nodes sessions stats watch "record c
   line 3 'start gsd' gsctl $command
 done
 [ ! -e never ] || die "a recording was begun without a daemon"
-line 1 'a terminal is needed' gsctl top
 
 start_gsd
 [ "$(gsctl status | wc -l)" -eq 5 ] || die "status is not five lines"
 line 1 "there is no group 'crew'" gsctl members crew
+line 1 'a terminal is needed' gsctl top
 
 # Who is waited for: ben votes when there is a file, once for each of two phases.
 gsctl record --all -o crew.record >record.log &
@@ -120,7 +120,8 @@ mkfifo typed
 $terminal 80x24 gsctl top --interval 0.1 <typed &
 top=$!
 exec 8>typed
-printf 'expect crew\n' >&8
+printf 'expect crew\ntouch shown\n' >&8
+await test -e shown
 kill -KILL $gsd
 wait $watching
 [ $? -eq 5 ] && [ "$(wc -l <lost)" -eq 1 ] || die "the loss is told in another way: $(cat lost)"

@@ -4,6 +4,7 @@
 //   expect TEXT   waits until the screen shows it          gone TEXT   until it shows it no more
 //   keys TEXT     types it; \e, \r and \t as in C          size CxR    makes the terminal another size
 //   signal N      to the command                           lines N     the screen has so many that are not empty
+//   touch FILE    makes one: so far has it come
 //   end STATUS    waits for the command's end with this status (128 + N: by signal N), and sees to it that the
 //                 terminal is as it was: its modes, and what its screen showed before
 //
@@ -20,6 +21,7 @@
 
 #include <chrono>
 #include <cstring>
+#include <fstream>
 #include <iostream>
 #include <sstream>
 #include <string>
@@ -92,6 +94,7 @@ class Terminal {
     if (verb == "keys") return type(unescaped(rest));
     if (verb == "size") return resize(size_of(rest));
     if (verb == "signal") return void(kill(child_, std::stoi(rest)));
+    if (verb == "touch") return void(std::ofstream(rest));
     if (verb == "end") return end(std::stoi(rest));
     throw Wrong{"unknown: " + line};
   }
