@@ -2,6 +2,7 @@
 
 #include <climits>
 #include <cstring>
+#include <functional>
 #include <new>
 
 #include "gscl/GSUtils.h"
@@ -20,6 +21,13 @@ int ids_in(const wyx_membership_t* mbrs) {
 int bytes_in(const wyx_state_value_t* value) {
   if (value == nullptr || value->gs_state == nullptr || value->gs_length < 0) return 0;
   return value->gs_length;
+}
+
+/// Whether the text begins in the string's storage.
+bool isInside(const GSString& string, const char* text) {
+  const char* storage = string;
+  const std::less<const char*> before;
+  return storage != nullptr && !before(text, storage) && before(text, storage + string.size());
 }
 
 }  // namespace
@@ -204,8 +212,11 @@ void GSGroupAttributes::setSourceGroupName(const char* name) {
 void GSGroupAttributes::copy(const wyx_group_attributes_t* attributes) {
   if (attributes == nullptr) return;
   const wyx_group_attributes_t from = *attributes;  // may be this object's own record, which changes below
+  // The source group's name may stand where the group's name is about to be stored.
+  const bool is_in_the_way = isInside(_group_name, from.gs_source_group_name);
+  const GSString source(is_in_the_way ? from.gs_source_group_name : nullptr);
   setGroupName(from.gs_group_name);
-  setSourceGroupName(from.gs_source_group_name);
+  setSourceGroupName(is_in_the_way ? static_cast<const char*>(source) : from.gs_source_group_name);
   _gattr.gs_sizeof_group_attributes = sizeof(wyx_group_attributes_t);
   _gattr.gs_client_version = from.gs_client_version;
   _gattr.gs_batch_control = from.gs_batch_control;

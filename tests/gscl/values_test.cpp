@@ -159,6 +159,20 @@ void expect_copied(const GSGroupAttributes& attributes, wyx_group_attributes_t f
   EXPECT_EQ(std::memcmp(&copy, &from, sizeof(copy)), 0);
 }
 
+TEST(GroupAttributes, setFromTheOwnNames_takesThemAsTheyWere) {
+  GSGroupAttributes attributes;
+  wyx_group_attributes_t* record = attributes.getAttributes();
+  attributes.setGroupName("group");
+  attributes.setSourceGroupName("another source");
+  std::swap(record->gs_group_name, record->gs_source_group_name);
+  attributes.setAttributes(record);
+  EXPECT_STREQ(record->gs_group_name, "another source");
+  EXPECT_STREQ(record->gs_source_group_name, "group");
+  record->gs_source_group_name = record->gs_group_name + 8;
+  attributes.setAttributes(record);
+  EXPECT_STREQ(record->gs_source_group_name, "source");
+}
+
 TEST(GroupAttributes, copied_ownTheirNamesAndKeepThreeFields) {
   std::string name = "group", source = "source";
   const wyx_group_attributes_t record = unusual_attributes(name, source);
