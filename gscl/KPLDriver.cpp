@@ -128,19 +128,10 @@ void KPLDriver::recordInSignal(int cd, const char* msg) {
   writers.fetch_sub(1);
 }
 
-void KPLDriver::takeSignalMsg() {
-  std::atomic_ref state(_signalMsgState);
-  if (state.load(std::memory_order_acquire) != kSignalMsgReady) return;
-  WriteScope scope(_stopLocker);
-  if (state.load(std::memory_order_acquire) != kSignalMsgReady) return;
-  _stopMsg = _signalMsg;
-  state.store(kNoSignalMsg, std::memory_order_relaxed);
-}
-
 const char* KPLDriver::getStopMsg() {
-  takeSignalMsg();
   ReadScope scope(_stopLocker);
-  return _stopMsg;
+  const bool in_signal = std::atomic_ref(_signalMsgState).load(std::memory_order_acquire) == kSignalMsgReady;
+  return in_signal ? _signalMsg : static_cast<const char*>(_stopMsg);
 }
 
 void KPLDriver::clearStopCode() {

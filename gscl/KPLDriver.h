@@ -55,7 +55,7 @@ class ZN_GSCL_EXPORT KPLDriver {
   int getStopCode();
 
   /// The text recorded with the code, null after clearStopCode. Good until the next setStopCode or clearStopCode.
-  /// Takes the stop lock. Not for signal handlers.
+  /// Takes the stop lock for reading. Not for signal handlers.
   const char* getStopMsg();
 
   /// Records why to stop, unless a code is recorded already; a code of 0 counts as 1. Takes the stop lock.
@@ -122,13 +122,11 @@ class ZN_GSCL_EXPORT KPLDriver {
   static KPLDriver* _theKPLDriver;
 
  private:
-  // The text of a code recorded inside stopCancel, until somebody who may allocate takes it over. It belongs to
-  // the handler that changed _stopCode from 0, then to whoever has _stopLocker; _signalWriters is not 0 in
-  // between.
+  // The text of a code recorded inside stopCancel, in place of _stopMsg while that code stands. It belongs to the
+  // handler that changed _stopCode from 0, then to whoever has _stopLocker; _signalWriters is not 0 in between.
   enum SignalMsgState { kNoSignalMsg, kSignalMsgReady };
   ZN_GSCL_HIDDEN bool claimStopCode(int cd);
   ZN_GSCL_HIDDEN void recordInSignal(int cd, const char* msg);
-  ZN_GSCL_HIDDEN void takeSignalMsg();
 
   int _signalWriters;   // handlers now recording
   int _signalMsgState;  // set by a handler; cleared under _stopLocker

@@ -79,7 +79,9 @@ TEST(DriverStopCode, A_SIGTERM_under_the_stop_lock_is_neither_stuck_nor_lost) {
   EXPECT_EQ(errno, EDOM);
   EXPECT_EQ(driver.getStopCode(), -3);  // at once
   driver._stopLocker.WriteUnlock();
-  for (int i = 0; i < 2; ++i) EXPECT_EQ(driver.stop(), "-3 stopCancel");
+  driver._stopLocker.ReadLock(nullptr);
+  EXPECT_EQ(driver.stop(), "-3 stopCancel") << "with a read lock held";
+  driver._stopLocker.ReadUnlock();
   driver.clearStopCode();
 
   raise(SIGTERM);
