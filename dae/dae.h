@@ -209,7 +209,7 @@ ZN_GSCL_EXPORT void dae_KPL_req(void);
 // more comes, a flush or the end of the request. In body and error text every "%" is sent as "%%".
 // All return -1 and do nothing outside a request; otherwise the length of the text given, or -1 for text that
 // cannot be written (see below, and characters that the locale rejects: what stood before them is taken).
-// Formatted text is cut at 4095 characters. `errno` stays as it was.
+// Formatted text is cut at 4095 bytes, before a character that does not fit whole. `errno` stays as it was.
 
 ZN_GSCL_EXPORT int dae_status_printf(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
 ZN_GSCL_EXPORT int dae_status_vprintf(const char* fmt, va_list args) __attribute__((format(printf, 1, 0)));

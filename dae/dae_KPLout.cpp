@@ -5,6 +5,7 @@
 #include <stdlib.h>
 #include <string.h>
 #include <unistd.h>
+#include <wchar.h>
 
 #include <algorithm>
 
@@ -278,8 +279,30 @@ bool is_open(output_ctl_ndx index) {
   return index == STATUS_CTL ? STATUS_kplhdr != nullptr : KPL_kplhdr != nullptr;
 }
 
-/// Formats into printf_buf, cut to what fits. False when it cannot be formatted.
-bool format(const char* fmt, va_list args) { return vsnprintf(printf_buf, kPrintfSize, fmt, args) >= 0; }
+/// Takes off what a cut has left of a last character.
+void drop_partial_character(char* text) {
+  mbstate_t state = {};
+  for (size_t rest = strlen(text); rest > 0;) {
+    size_t width = mbrlen(text, rest, &state);
+    if (width == static_cast<size_t>(-2)) {
+      *text = '\0';
+      return;
+    }
+    if (width == static_cast<size_t>(-1)) {  // no character; the line builder judges it
+      width = 1;
+      state = {};
+    }
+    text += width;
+    rest -= width;
+  }
+}
+
+/// Formats into printf_buf, cut between characters to what fits. False when it cannot be formatted.
+bool format(const char* fmt, va_list args) {
+  const int length = vsnprintf(printf_buf, kPrintfSize, fmt, args);
+  if (length >= kPrintfSize) drop_partial_character(printf_buf);
+  return length >= 0;
+}
 
 int body_puts(output_ctl_ndx index, const char* text) {
   dae::KeepErrno keep_errno;

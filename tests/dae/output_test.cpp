@@ -103,6 +103,12 @@ TEST_F(Output, Status_text_is_broken_into_margin_and_body) {
       {{{body, "kept\n"}, {body, x(60) + "\xff" + x(20) + "\n", -1}}, "[|kept;]"},
       {{{margin<2>, "€\n", -1}, {margin<3>, "€\n"}}, "[€|;]"},  // wider than the column
   });
+  const auto lines =
+      [](const std::string& end) {  // the last one is too long, so that its characters are looked at
+        return x(63, x(62) + "\n") + x(62) + x(62) + end;
+      };
+  EXPECT_EQ(serve(true, [&] { EXPECT_EQ(dae_status_printf("%s€€\n", lines("").c_str()), 4093); }),
+            serve(true, [&] { dae_status_puts(lines("").c_str()); }));
 }
 
 TEST_F(Output, Packets_go_out_full_and_never_empty) {
