@@ -1,9 +1,9 @@
 #include "gscl/GSThread.h"
 
+#include <cxxabi.h>
 #include <errno.h>
 #include <stdint.h>
 #include <stdio.h>
-#include <string.h>
 
 #include <memory>
 #include <mutex>
@@ -33,7 +33,6 @@ using RunFunction = void* (*)(zelt_gscl_V1::GSThread*, void*);
 struct Launch {
   std::shared_ptr<ThreadControl> control;
   zelt_gscl_V1::GSThread* thread;
-  RunFunction run;
   void* args;
 };
 
@@ -51,13 +50,15 @@ void traceIfPossible(Write write) {
   }
 }
 
-// The function in the slot of `run`, behind the two of the destructor. A new thread that looked it up by itself,
-// with a virtual call, could do so when its object's destruction has come to the base class, which has none.
-RunFunction overriderOfRun(const zelt_gscl_V1::GSThread* thread) {
-  constexpr size_t kRunSlot = 2;
-  void* const* slots = nullptr;
-  memcpy(&slots, static_cast<const void*>(thread), sizeof slots);
-  return reinterpret_cast<RunFunction>(slots[kRunSlot]);
+// What a virtual call of `run` calls at this moment; null while the object's destruction is in the classes that
+// have none, in which a virtual call would end the process. The destructor of an object whose thread has just been
+// started changes the table meanwhile, and either answer is right then.
+__attribute__((noinline, no_sanitize("thread"))) RunFunction overriderOfRun(const zelt_gscl_V1::GSThread* thread) {
+  typedef void* const* __attribute__((may_alias)) Table;
+  constexpr size_t kRunSlot = 2;  // behind the two of the destructor
+  void* const function = (*reinterpret_cast<const volatile Table*>(thread))[kRunSlot];
+  if (function == reinterpret_cast<void*>(abi::__cxa_pure_virtual)) return nullptr;
+  return reinterpret_cast<RunFunction>(function);
 }
 
 // Each way out of a thread, by return, cancellation or pthread_exit. It unregisters itself here and not in join,
@@ -224,7 +225,7 @@ int GSThread::finishEarlier() {
 int GSThread::launch(void* args, pthread_t* id) {
   GSxThreadData& data = dataOf(innerData);
   ThreadControl& control = *data.control;
-  std::unique_ptr<Launch> start(new Launch{data.control, this, overriderOfRun(this), args});
+  std::unique_ptr<Launch> start(new Launch{data.control, this, args});
   ThreadAttributes attributes;
   int rc = attributes.set(data);
 
@@ -258,7 +259,12 @@ void* GSThread::stub_create_run_me(void* argument) {
   }
   cu_stackdump_thread_enable_1();
   pthread_testcancel();
-  return launch->run(launch->thread, launch->args);
+  RunFunction run = nullptr;
+  {
+    std::lock_guard<std::mutex> lock(control.mutex);  // the object is there as long as its data
+    if (control.data != nullptr) run = overriderOfRun(launch->thread);
+  }
+  return run != nullptr ? run(launch->thread, launch->args) : nullptr;
 }
 
 int GSThread::stop() {

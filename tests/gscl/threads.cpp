@@ -314,6 +314,36 @@ TEST(Thread, lines_ofStartStopFailureAndDestruction) {
   GSSetTraceRtn(trace);
 }
 
+/// Starts in its constructor.
+class Early : public Base {
+ public:
+  Early() : Base(0) { start(nullptr); }
+  void* run(void*) override { return nullptr; }
+};
+
+class Late : public Early {
+ public:
+  ~Late() override { join(nullptr); }
+  void* run(void*) override { return kResult; }
+};
+
+std::atomic<bool> constructed;
+
+TEST(Thread, run_isTheOneOfTheObjectAsTheThreadFindsIt) {
+  constructed = false;
+  const gscl_tracef_rtn before = GSSetTraceRtn([](int, char* text) {
+    while (std::string(text).starts_with("stub_run_thread") && !constructed) std::this_thread::yield();
+  });
+  GSSetDebugLevel(GSCL_TRC_API);
+  Late thread;
+  constructed = true;
+  void* result = nullptr;
+  EXPECT_EQ(thread.join(&result), 0);
+  EXPECT_EQ(result, kResult);
+  GSSetDebugLevel(0);
+  GSSetTraceRtn(before);
+}
+
 // The sanitizer does not know that a cancelled join has not joined.
 #if !ZN_THREAD_SANITIZER
 TEST(Thread, cancelledJoin_leavesTheThreadToBeJoined) {
