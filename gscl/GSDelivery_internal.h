@@ -35,15 +35,24 @@ class GSDelivery {
   GSSubscriber* subscriber() const;
 
   /// Reports the notification to the client's waiting threads, makes the callback, reports it again unless the
-  /// client is gone. False: it is.
+  /// client is gone. False: it is. What the callback throws goes on after that: whoever waits is told all the
+  /// same.
   template <class Notification, class Callback>
   bool deliver(const Notification* notification, int for_my_req, Callback callback) {
     void* notify = const_cast<Notification*>(notification);
     client_->setNotificationReceived(zelt_gscl::GS_TRIGGER_BEFORE_CALLBACK, notify, for_my_req);
-    callback();
-    if (client_ == nullptr) return false;
-    client_->setNotificationReceived(zelt_gscl::GS_TRIGGER_AFTER_CALLBACK, notify, for_my_req);
-    return true;
+    const auto reportAfter = [&] {
+      if (client_ == nullptr) return false;
+      client_->setNotificationReceived(zelt_gscl::GS_TRIGGER_AFTER_CALLBACK, notify, for_my_req);
+      return true;
+    };
+    try {
+      callback();
+    } catch (...) {
+      reportAfter();
+      throw;
+    }
+    return reportAfter();
   }
 
   /// The moves that more than one line of a routing function makes.

@@ -199,6 +199,13 @@ TEST_F(Waiting, CancelledWait_givesTheMutexBack) {
   EXPECT_EQ(waitFor(member, kMinute).rc, GS_WAITFOR_RECEIVED);
 }
 
+TEST_F(Waiting, CallbackThatThrows_endsTheWaitAllTheSame) {
+  member.joinGroup();
+  member.action = [] { throw 7; };
+  EXPECT_THROW(approve(WYX_JOIN), int);
+  EXPECT_EQ(waitFor(member, kPast).rc, GS_WAITFOR_RECEIVED);
+}
+
 TEST_F(Waiting, SequenceNumbers_areOfTheProcess) {
   static int last;
   GSSetTraceRtn([](int, char* text) { sscanf(text, "PassNotify (seq=%d", &last); });
