@@ -108,7 +108,7 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   /// On any other than the first and NOT_SUPPORTED the notification and protocol types in the outputs are -1.
   ///
   /// At most four threads per client have a request recorded; a fifth takes over the oldest answered record, else
-  /// the oldest. Cancellation point.
+  /// the oldest. A cancellation point while it sleeps.
   GSWaitForRC waitForNotification(GSWaitForTriggerType where, const timespec* abstime,
                                   wyx_notification_type_t* notify_type,
                                   wyx_notification_summary_t* notify_summary);

@@ -9,6 +9,7 @@
 #include "gscl/GSClient.h"
 #include "gscl/GSLockPrim.h"
 #include "gscl/GSString.h"
+#include "gscl/scopes_internal.h"
 
 namespace zelt_gscl_V1 {
 
@@ -45,9 +46,10 @@ struct GSxClientData {
   void ApplyNotificationToWaiters(GSClientType obj_type, int where, int for_my_req,
                                   wyx_notification_summary_t* sum);
   /// Waits until the block holds what is waited for, the client is idle, or the wait fails. The caller holds the
-  /// wait mutex; the block may be taken over by another thread meanwhile and is then looked at as it is.
+  /// wait mutex and holds cancellation off, which is lifted while it sleeps; the block may be taken over by
+  /// another thread meanwhile and is then looked at as it is.
   GSWaitForRC await(const waitfor_control_block_t& block, GSClient& client, int where_what,
-                    const timespec* abstime);
+                    const timespec* abstime, const gscl_internal::CancellationHold& hold);
 
   GSString _groupName;
   std::atomic<wyx_token_t> _token;

@@ -192,7 +192,7 @@ void GSxClientData::ApplyNotificationToWaiters(GSClientType obj_type, int where,
 }
 
 GSWaitForRC GSxClientData::await(const waitfor_control_block_t& block, GSClient& client, int where_what,
-                                 const timespec* abstime) {
+                                 const timespec* abstime, const gscl_internal::CancellationHold& hold) {
   const auto evaluate = [&] {
     const GSWaitForRC match = block.isAlreadySatisfied(client.type(), where_what);
     const bool hopeless = match == kNotYet && client.getClientState() == zelt_gscl::GS_IAM_IDLE;
@@ -200,7 +200,10 @@ GSWaitForRC GSxClientData::await(const waitfor_control_block_t& block, GSClient&
   };
   GSWaitForRC result = evaluate();
   while (result == kNotYet) {
-    const int error = _wait_cond.wait(&_wait_mutex, abstime);
+    const int error = [&] {
+      const gscl_internal::CancellationHold::Lifted lifted(hold);
+      return _wait_cond.wait(&_wait_mutex, abstime);
+    }();
     result = evaluate();
     if (result == kNotYet && error != 0) return waitError(error);
   }
@@ -264,6 +267,8 @@ GSWaitForRC GSClient::waitForNotification(GSWaitForTriggerType where_what_inp, c
     return zelt_gscl::GS_WAITFOR_NOT_SUPPORTED;
   }
 
+  // But for the sleep itself: a notification that is no longer recorded is one that the caller has been told of.
+  const gscl_internal::CancellationHold hold;
   GSxClientData& data = dataOf(_clData);
   wyx_notification_summary_t seen = {};
   seen.gs_notification_type = kNoNotification;
@@ -273,7 +278,7 @@ GSWaitForRC GSClient::waitForNotification(GSWaitForTriggerType where_what_inp, c
     MutexScope lock(data._wait_mutex);
     waitfor_control_block_t* block = data.find_wfc(pthread_self());
     if (block != nullptr) {
-      result = data.await(*block, *this, ww, abstime);
+      result = data.await(*block, *this, ww, abstime, hold);
       seen = block->summary;
     }
     if (result == zelt_gscl::GS_WAITFOR_RECEIVED) {

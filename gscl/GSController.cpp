@@ -95,6 +95,7 @@ GSController::~GSController() {
 }
 
 wyx_rc_t GSController::initialize() {
+  gscl_internal::CancellationHold hold;
   GS_TRACE(GSCL_TRC_API, "GSCntrl %x is being initialized\n", addressText(this));
   wyx_descriptor_t descriptor = -1;
   // Read through a volatile: the compiler takes for granted that `this` is not null.
@@ -114,6 +115,7 @@ wyx_rc_t GSController::initialize() {
 }
 
 wyx_rc_t GSController::quit() {
+  gscl_internal::CancellationHold hold;
   GS_TRACE(GSCL_TRC_API, "GSCntl %x is being quitted.\n", addressText(this));
   const wyx_rc_t rc = callBaseApi<&GSAPIRtnCollection::wyx_quit>();
   WriteScope lock(*this);

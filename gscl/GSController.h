@@ -49,8 +49,8 @@ struct GSxControllerData;
 /// process aborts with a message on standard error.
 ///
 /// Cancellation: dispatch(WYX_BLOCKING) is a cancellation point while it waits, and leaves nothing behind; the
-/// base API library runs the callbacks with cancellation disabled. A client's request and a destructor are none: a
-/// cancelled thread finishes them first.
+/// base API library runs the callbacks with cancellation disabled. initialize(), quit(), a change of responsiveness, a
+/// client's request and a destructor are none: a cancelled thread finishes them first.
 class ZN_GSCL_EXPORT GSController : public GSLockableObject {
  public:
   /// Becomes the current controller, whichever was current before, and reads the installed product version.

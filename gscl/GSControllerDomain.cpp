@@ -1,6 +1,7 @@
 // The third version of the controller and the operations on the whole domain.
 #include "gscl/GSControllerData_internal.h"
 #include "gscl/base_api_internal.h"
+#include "gscl/scopes_internal.h"
 #include "gscl/trace_text_internal.h"
 
 using gscl_internal::callBaseApi;
@@ -48,6 +49,7 @@ wyx_rc_t stub_send_domain_msg_to_gsd(wyx_priv_channel_msg_type_t type, void* dat
 }
 
 wyx_rc_t stub_change_responsiveness(const wyx_responsiveness_t* responsiveness) {
+  gscl_internal::CancellationHold hold;
   const wyx_rc_t rc = callBaseApi<&Api::wyx_change_responsiveness>(responsiveness);
   zelt_gscl_V1::GSController* controller = zelt_gscl_V1::GSController::theController();
   if (rc == WYX_OK && controller != nullptr && responsiveness != nullptr) {

@@ -15,6 +15,15 @@ class CancellationHold {
   CancellationHold(const CancellationHold&) = delete;
   CancellationHold& operator=(const CancellationHold&) = delete;
 
+  /// Within a hold: a wait in which the thread may be cancelled as it might before.
+  class Lifted {
+   public:
+    explicit Lifted(const CancellationHold& hold) { pthread_setcancelstate(hold.before_, nullptr); }
+    ~Lifted() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, nullptr); }
+    Lifted(const Lifted&) = delete;
+    Lifted& operator=(const Lifted&) = delete;
+  };
+
  private:
   int before_ = PTHREAD_CANCEL_ENABLE;
 };

@@ -142,7 +142,26 @@ TEST_F(Client, CancelledRequest_isFinishedFirst) {
   EXPECT_EQ(cancelled([&] { return member.goodbyeGroup(); }), WYX_OK);
   EXPECT_EQ(cancelled([&] { return watcher.subscribeGroup(); }), WYX_OK);
   EXPECT_EQ(cancelled([&] { return watcher.unsubscribeGroup(); }), WYX_OK);
+  EXPECT_EQ(cancelled([&] { return controller.initialize(); }), WYX_OK);
+  EXPECT_EQ(controller.getGSDescriptor(), 7);
+  EXPECT_EQ(cancelled([&] { return controller.quit(); }), WYX_OK);
+  EXPECT_EQ(controller.getGSDescriptor(), -1);
+  const wyx_responsiveness_t wanted = {WYX_PING_RESPONSIVENESS, 10, 5, nullptr, 0};
+  wyx_responsiveness_t held = {};
+  EXPECT_EQ(cancelled([&] { return stub_change_responsiveness(&wanted); }), WYX_OK);
+  controller.getResponsiveness(&held);
+  EXPECT_EQ(held.gs_responsiveness_interval, 10u);
   api.during = nullptr;
+  GSWaitForRC waited = GS_WAITFOR_ERROR;
+  EXPECT_EQ(cancelled([&] {
+              const wyx_rc_t answer = member.joinGroup();
+              approve(WYX_JOIN);
+              pthread_cancel(pthread_self());
+              waited = member.waitForNotification(GS_TRIGGER_AFTER_CALLBACK, nullptr, nullptr, nullptr);
+              return answer;
+            }),
+            WYX_OK);
+  EXPECT_EQ(waited, GS_WAITFOR_RECEIVED);
   EXPECT_EQ(member.joinGroup(), WYX_OK) << "no lock was left behind";
 }
 
