@@ -35,8 +35,8 @@ printf 'a\0\xffb' | "$gsctl" set crew - >/dev/null || die "bytes"
 "$gsctl" get crew | cmp - <(printf 'a\0\xffb') || die "other bytes"
 expect 0 '^a..b$' "$gsctl" get --show crew
 expect 0 '"length":4,"state_base64":"YQD/Yg=="' "$gsctl" get crew --json
-expect 1 'rejected: "not by [0-9]+/1"' "$gsctl" set crew no
-expect 1 '"outcome":"rejected".*"message":"not by ' "$gsctl" --json send crew no
+expect 1 'rejected by gsctl \(2/1\): "not by [0-9]+/1"' "$gsctl" set crew no
+expect 1 '"outcome":"rejected".*"by":\[\{"instance":2,"node":1,"name":"gsctl"\}\],"message":"not by ' "$gsctl" --json send crew no
 printf 'nonsense\nstate no\nsay hello\nstate yes\n' >&9
 expect 0 '' "$gsctl" wait crew --state yes
 await_text 'message 1/1 "hello"' ann.log

@@ -129,7 +129,8 @@ void Candidate::approved(const wyx_approved_notification_t& n) {
 
 void Candidate::rejected(const wyx_rejected_notification_t& n) {
   if (n.gs_protocol_type != WYX_JOIN || !is_me(n.gs_proposal->gs_changing_providers)) return;
-  throw Error(kRefused, "the members reject the join: " + in_quotes(bytes_of(n.gs_proposal->gs_provider_message)));
+  throw Error(kRefused,
+              "the members reject the join: " + gsctl::quoted(bytes_of(n.gs_proposal->gs_provider_message)));
 }
 
 void Candidate::announced(const wyx_announcement_notification_t& n) {

@@ -20,7 +20,7 @@ std::string to_line(const Change& change) {
   text += " " + change.what;
   if (!change.who.empty()) text += " " + to_text(change.who);
   if (!change.why.empty()) text += " (" + change.why + ")";
-  if (change.bytes) text += " " + in_quotes(*change.bytes);
+  if (change.bytes) text += " " + gsctl::quoted(*change.bytes);
   if (change.members) text += "; members: " + to_text(*change.members);
   return text;
 }

@@ -177,7 +177,7 @@ void Joined::rejected(const wyx_rejected_notification_t& n) {
   const std::string message = bytes_of(n.gs_proposal->gs_provider_message);
   if (!message.empty()) change.bytes = message;
   if (n.gs_protocol_type == WYX_JOIN && is_me(n.gs_proposal->gs_changing_providers)) {
-    throw Error(kRefused, "the members reject the join: " + in_quotes(message));
+    throw Error(kRefused, "the members reject the join: " + gsctl::quoted(message));
   }
   say(change);
   if (is_mine(*n.gs_proposal)) line_done();
@@ -237,7 +237,7 @@ wyx_rc_t Joined::obey(const std::string& line) {
     leave();
     return WYX_OK;
   }
-  complain(in_quotes(line) + ": say state TEXT, say TEXT, expel ID..., or leave");
+  complain(gsctl::quoted(line) + ": say state TEXT, say TEXT, expel ID..., or leave");
   line_done();
   return WYX_OK;
 }
@@ -266,7 +266,7 @@ void Joined::line_answered(wyx_rc_t rc) {
     pause_ = loop().after(pause_before(tries_), [this] { next_line(); });
     return;
   }
-  complain(in_quotes(lines_.front()) + ": " + explain(rc));
+  complain(gsctl::quoted(lines_.front()) + ": " + explain(rc));
   line_done();
 }
 

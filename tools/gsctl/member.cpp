@@ -3,12 +3,12 @@
 #include <algorithm>
 #include <random>
 
+#include "tools/gsctl/group_facts.h"
 #include "tools/gsctl/text.h"
 
 namespace gsctl {
 namespace {
 
-constexpr std::size_t kMaxGroupName = 32;
 constexpr int kTries = 100;
 constexpr short kMaxInstance = 32767;
 
@@ -25,7 +25,17 @@ wyx_rc_t Member::try_to_join(std::optional<short> instance) {
     setInstanceNumber(instance ? *instance : some_instance());
     rc = joinGroup();
   }
-  return rc;
+  return rc == WYX_BAD_GROUP_ATTRIBUTES && take_attributes(*this) ? joinGroup() : rc;
+}
+
+void Member::delayedErrorCb(const wyx_delayed_error_notification_t* n) {
+  const bool other = n->gs_protocol_type == WYX_JOIN && n->gs_delayed_return_code == WYX_BAD_GROUP_ATTRIBUTES;
+  if (other && !took_attributes_ && n->old_group_attributes != nullptr) {
+    took_attributes_ = true;
+    setGroupAttributes(n->old_group_attributes);
+    if (joinGroup() == WYX_OK) return;
+  }
+  loop_.guard([&] { refused(*n); });
 }
 
 void Member::ask_to_join(std::optional<short> instance) {
@@ -40,13 +50,6 @@ bool Member::is_me(const wyx_membership_t* members) {
 }
 
 void Member::asked(const wyx_n_phase_notification_t&) { vote(WYX_VOTE_APPROVE, WYX_NULL_VOTE, nullptr, nullptr); }
-
-void check_group(const std::string& group) {
-  if (group.empty()) throw Error(kWrongUse, "GROUP: a name is needed");
-  if (group.size() > kMaxGroupName) {
-    throw Error(kWrongUse, "GROUP: a name has at most " + std::to_string(kMaxGroupName) + " characters");
-  }
-}
 
 void require_group(Loop& loop, const std::string& group) {
   Subscription probe(loop, group, WYX_SUBSCRIBE_STATE, [](const auto&) {});

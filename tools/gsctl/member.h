@@ -17,7 +17,7 @@ class Member : public zelt_gscl_V1::GSProvider {
   Member(Loop& loop, const std::string& group, const std::string& name)
       : GSProvider(group.c_str(), 0, name.c_str()), loop_(loop) {}
 
-  /// Asks to join, as this instance or as one that is free. Throws Error: refused.
+  /// Asks to join, as this instance or as one that is free, with the group's attributes. Throws Error: refused.
   void ask_to_join(std::optional<short> instance = std::nullopt);
   /// The same, with the daemon's answer.
   wyx_rc_t try_to_join(std::optional<short> instance = std::nullopt);
@@ -50,15 +50,11 @@ class Member : public zelt_gscl_V1::GSProvider {
   void announcementCb(const wyx_announcement_notification_t* n) final {
     loop_.guard([&] { announced(*n); });
   }
-  void delayedErrorCb(const wyx_delayed_error_notification_t* n) final {
-    loop_.guard([&] { refused(*n); });
-  }
+  void delayedErrorCb(const wyx_delayed_error_notification_t* n) final;
 
   Loop& loop_;
+  bool took_attributes_ = false;  // of the group, after a join that had others
 };
-
-/// Throws Error: the name of a group is empty, or over what the library keeps.
-void check_group(const std::string& group);
 
 /// Throws Error: there is no such group.
 void require_group(Loop& loop, const std::string& group);

@@ -2,6 +2,7 @@
 
 #include <random>
 
+#include "tools/gsctl/group_facts.h"
 #include "tools/gsctl/output.h"
 #include "tools/gsctl/text.h"
 
@@ -13,18 +14,6 @@ using std::chrono::duration;
 constexpr double kFirstPause = 0.005;  // seconds, doubled with each collision
 constexpr double kLongestPause = 0.5;
 
-/// The voters whose votes are known, as the group collects them, to be a rejection.
-Members rejecters(const wyx_proposal_t& proposal) {
-  Members found;
-  for (const wyx_vote_results_t* votes : {proposal.gs_current_vote_results, proposal.gs_changing_vote_results}) {
-    for (unsigned i = 0; votes != nullptr && i < votes->gs_count; ++i) {
-      const wyx_vote_result_t& vote = *votes->gs_vote_results[i];
-      if (vote.gs_vote_value == WYX_VOTE_REJECT) found.push_back(vote.gs_voter);
-    }
-  }
-  return found;
-}
-
 std::string rejection_cause(unsigned summary) {
   if (summary & WYX_EXPLICIT_REJECT) return "vote";
   if (summary & WYX_TIME_LIMIT_EXCEEDED) return "time_limit";
@@ -35,7 +24,11 @@ class Proposer : public Member {
  public:
   Proposer(Loop& loop, const Proposal& proposal, const Settings& settings,
            const std::function<wyx_rc_t(Member&)>& submit)
-      : Member(loop, proposal.group, proposal.name), proposal_(proposal), settings_(settings), submit_(submit) {}
+      : Member(loop, proposal.group, proposal.name),
+        proposal_(proposal),
+        settings_(settings),
+        submit_(submit),
+        votes_(proposal.group) {}
 
   /// Whatever ended the command, nobody is to take its end for a failure.
   ~Proposer() override {
@@ -67,7 +60,7 @@ class Proposer : public Member {
   void rejected(const wyx_rejected_notification_t& n) override {
     if (n.gs_protocol_type == WYX_JOIN && is_me(n.gs_proposal->gs_changing_providers)) {
       throw Error(kRefused,
-                  "the members reject the join: " + in_quotes(bytes_of(n.gs_proposal->gs_provider_message)));
+                  "the members reject the join: " + gsctl::quoted(bytes_of(n.gs_proposal->gs_provider_message)));
     }
     if (!proposed_ || !is_mine(*n.gs_proposal)) return;
     tell_rejection(n);
@@ -110,21 +103,27 @@ class Proposer : public Member {
   }
 
   void tell_rejection(const wyx_rejected_notification_t& n) {
-    const Members by = rejecters(*n.gs_proposal);
+    const std::vector<Rejecter> by = votes_.rejecters(n.gs_event_seqnum);
     const std::string message = bytes_of(n.gs_proposal->gs_provider_message);
     const std::string cause = rejection_cause(static_cast<unsigned>(n.gs_summary_code));
     if (settings_.json) {
       Json object = record("rejected", n.gs_event_seqnum);
       object["cause"] = cause;
-      object["by"] = to_json(by);
+      object["by"] = Json::array();
+      for (const Rejecter& voter : by) {
+        object["by"].push_back(to_json(voter.id));
+        set_bytes(object["by"].back(), "name", voter.name);
+      }
       set_bytes(object, "message", message);
       print_json(object);
       return;
     }
     std::string text = "rejected";
-    if (!by.empty()) text += " by " + to_text(by);
+    for (const Rejecter& voter : by) {
+      text += (&voter == by.data() ? " by " : ", ") + voter.name + " (" + to_text(voter.id) + ")";
+    }
     if (cause != "vote") text += " (" + cause + ")";
-    complain(message.empty() ? text : text + ": " + in_quotes(message));
+    complain(message.empty() ? text : text + ": " + gsctl::quoted(message));
   }
 
   Json record(const char* what, std::uint64_t event) {
@@ -143,6 +142,7 @@ class Proposer : public Member {
   const Proposal& proposal_;
   const Settings& settings_;
   const std::function<wyx_rc_t(Member&)>& submit_;
+  VoteWatch votes_;
   bool proposed_ = false;  // and no outcome yet
   int attempts_ = 0;
   std::optional<Status> outcome_;

@@ -8,6 +8,7 @@
 namespace gsctl {
 namespace {
 
+constexpr std::size_t kMaxGroupName = 32;
 constexpr std::size_t kFailureId = 256;
 constexpr std::chrono::duration<double> kReopenPause(0.1);
 
@@ -104,6 +105,13 @@ Subscription::Subscription(Loop& loop, const std::string& group, int what, Chang
 
 void Subscription::subscribeCb(const wyx_subscription_notification_t* notification) {
   loop_.guard([&] { on_change_(*notification); });
+}
+
+void check_group(const std::string& group) {
+  if (group.empty()) throw Error(kWrongUse, "GROUP: a name is needed");
+  if (group.size() > kMaxGroupName) {
+    throw Error(kWrongUse, "GROUP: a name has at most " + std::to_string(kMaxGroupName) + " characters");
+  }
 }
 
 }  // namespace gsctl

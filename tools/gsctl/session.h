@@ -72,4 +72,7 @@ class Subscription : public zelt_gscl_V1::GSSubscriber {
   const Change on_change_;
 };
 
+/// Throws Error: the name of a group is empty, or over what the library keeps.
+void check_group(const std::string& group);
+
 }  // namespace gsctl

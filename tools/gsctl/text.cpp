@@ -92,7 +92,7 @@ void set_bytes(Json& object, const std::string& name, std::string_view bytes) {
   }
 }
 
-std::string in_quotes(std::string_view bytes) {
+std::string quoted(std::string_view bytes) {
   const std::string shown = "\"" + platform::printable(bytes.substr(0, kShownBytes)) + "\"";
   return bytes.size() <= kShownBytes ? shown : shown + "... (" + std::to_string(bytes.size()) + " bytes)";
 }

@@ -29,7 +29,7 @@ Json to_json(const Members& members);
 /// Sets object[name] where the bytes are UTF-8, else object[name + "_base64"].
 void set_bytes(Json& object, const std::string& name, std::string_view bytes);
 /// In quotation marks, for a line; what is long is cut and its length said.
-std::string in_quotes(std::string_view bytes);
+std::string quoted(std::string_view bytes);
 
 /// "INSTANCE/NODE", or "INSTANCE" on `this_node`. Throws Error: no such thing.
 wyx_provider_t id_from(const std::string& text, short this_node);
