@@ -151,11 +151,10 @@ TEST_P(ClientDispatch, RequestsOfSeveralThreadsAndOfCallbacks_allArriveInOrder) 
 
   for (const wyx_token_t token : tokens) {
     std::map<std::string, int> next;  // of the asked and the echoed
-    std::uint64_t seqnum = 0;
+    std::uint64_t seqnum = recorder().of(token).front().protocol().seqnum;
     for (const Seen& seen : recorder().of(token)) {
       const std::string kind = text_of(seen).starts_with("echo") ? "echo" : "ask";
-      if (seqnum != 0) EXPECT_EQ(seen.protocol().seqnum, seqnum + 1);
-      seqnum = seen.protocol().seqnum;
+      EXPECT_EQ(seen.protocol().seqnum, seqnum++);
       EXPECT_EQ(text_of(seen), kind + std::to_string(next[kind]++));
     }
   }
