@@ -189,7 +189,7 @@ void Candidate::hear(const KeeperNews& news) {
     case KeeperNews::kEnded:
       command_ended(news.value);
       break;
-    case KeeperNews::kTimeOver:
+    case KeeperNews::kOverdue:
       if (command_ == Command::kStopping) return command_ended(news.value);
       goodbyeGroup();  // it is not known any more whether this member leads
       be_out(kRefused, "was not responsive");

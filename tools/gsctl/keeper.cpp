@@ -200,7 +200,7 @@ void KeeperProcess::command_ended(int status) {
   command_ = -1;
   status_.reset();
   kill_at_.reset();
-  tell(over_ ? KeeperNews::kTimeOver : KeeperNews::kEnded, status);
+  tell(over_ ? KeeperNews::kOverdue : KeeperNews::kEnded, status);
 }
 
 void KeeperProcess::check_times() {
@@ -271,7 +271,7 @@ std::optional<KeeperNews> Keeper::news() {
     return KeeperNews{KeeperNews::kGone, 0};
   }
   if (news.kind == KeeperNews::kStarted) command_ = news.value;
-  if (news.kind == KeeperNews::kEnded || news.kind == KeeperNews::kTimeOver) command_ = -1;
+  if (news.kind == KeeperNews::kEnded || news.kind == KeeperNews::kOverdue) command_ = -1;
   return news;
 }
 

@@ -20,11 +20,11 @@ BootTime boot_time();
 /// What the keeper tells.
 struct KeeperNews {
   enum Kind : int {
-    kStarted,   // value: CMD's process
-    kNotRun,    // value: errno
-    kEnded,     // value: the status as shells have it; nothing that CMD started runs any more
-    kTimeOver,  // the same; the keeper killed it because the deadline passed
-    kGone,      // the keeper itself was killed
+    kStarted,  // value: CMD's process
+    kNotRun,   // value: errno
+    kEnded,    // value: the status as shells have it; nothing that CMD started runs any more
+    kOverdue,  // the same; the keeper killed it because the deadline passed
+    kGone,     // the keeper itself was killed
   } kind;
   int value;
 };
