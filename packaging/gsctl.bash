@@ -6,7 +6,7 @@ _gsctl() {
       --) COMPREPLY=($(compgen -cf -- "$word")); return ;; # CMD
       --endpoint | --timeout) ((i++)) ;;
       -*) ;;
-      *) command=${COMP_WORDS[i]}; break ;;
+      *) command=${command:-${COMP_WORDS[i]}} ;;
     esac
   done
   if [[ $word == -* ]]; then
