@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <set>
 
+#include "tools/gsctl/text.h"
+
 namespace gsctl {
 namespace {
 
@@ -124,7 +126,7 @@ void Teller::vote(const HappeningT& h) {
   const bool is_default = h.kind == Kind::DefaultVote;
   Phase& phase = protocol.phases.back();
   phase.waits.push_back({lane(*h.who, h.name), phase.from, h.time_us, !is_default, is_default ? h.what : ""});
-  const std::string message = h.message.empty() ? "" : " " + in_quotes(h.message);
+  const std::string message = h.message.empty() ? "" : " " + gsctl::quoted(h.message);
   note(h, is_default ? Mark::Shape::kDefault : shape_of_vote(h.what),
        (is_default ? "default: " + h.what : h.what) + message);
 }
