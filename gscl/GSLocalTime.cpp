@@ -1,12 +1,15 @@
+#include <sched.h>
 #include <stdint.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <time.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <chrono>
 
 #include "gscl/GSLocalTime_internal.h"
+#include "gscl/scopes_internal.h"
 
 namespace {
 
@@ -19,7 +22,7 @@ constexpr int kMinuteBits = 26;
 constexpr long kBias = 1 << (kOffsetBits - 1);  // keeps offsets positive; more than a day
 
 constinit std::atomic<uint64_t> known_offset{0};  // 0: nothing is known
-constinit std::atomic<bool> looking_up{false};
+constinit std::atomic<pid_t> looking_up{0};       // the process whose thread does it
 
 /// Minute and time zone of a look-up, above the bits of the offset.
 uint64_t stampOf(time_t now) {
@@ -46,13 +49,22 @@ long lookUpOffset(time_t now) {
 
 long offsetAt(time_t now) {
   const uint64_t stamp = stampOf(now);
-  const uint64_t known = known_offset.load();
-  if (known != 0 && known >> kOffsetBits == stamp >> kOffsetBits) return offsetIn(known);
-  if (looking_up.exchange(true) && known != 0) return offsetIn(known);
-  const long offset = lookUpOffset(now);
-  known_offset.store(stamp | static_cast<uint64_t>(offset + kBias));
-  looking_up.store(false);
-  return offset;
+  for (;;) {
+    const uint64_t known = known_offset.load();
+    if (known != 0 && known >> kOffsetBits == stamp >> kOffsetBits) return offsetIn(known);
+    const gscl_internal::CancellationHold hold;
+    const pid_t self = getpid();
+    pid_t other = 0;
+    if (looking_up.compare_exchange_strong(other, self)) {
+      const long offset = lookUpOffset(now);
+      known_offset.store(stamp | static_cast<uint64_t>(offset + kBias));
+      looking_up.store(0);
+      return offset;
+    }
+    if (known != 0) return offsetIn(known);
+    if (other != self) return 0;
+    sched_yield();  // the first look-up of all
+  }
 }
 
 }  // namespace
