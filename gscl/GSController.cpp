@@ -45,9 +45,11 @@ using WriteScope = gscl_internal::WriteScope<GSController>;
 
 // Compiled into callers and checked by them: objects and records have a fixed layout.
 static_assert(sizeof(GSController) == 24, "virtual table, lock, private record");
-static_assert(sizeof(GSxControllerData) == 72, "fields as listed, nothing between them");
+static_assert(sizeof(GSxControllerData) == 88, "fields as listed, nothing between them");
 static_assert(sizeof(std::atomic<wyx_descriptor_t>) == sizeof(wyx_descriptor_t), "");
 
+pthread_mutex_t GSxControllerData::_allMutex = PTHREAD_MUTEX_INITIALIZER;
+GSxControllerData* GSxControllerData::_all = nullptr;
 std::atomic<GSController*> GSxControllerData::_theController{nullptr};
 std::atomic<zelt_gscl_V3::GSController*> GSxControllerData::_theDomainController{nullptr};
 
@@ -57,6 +59,21 @@ GSxControllerData::~GSxControllerData() {
     pClientList = item->pNext;
     delete item;
   }
+}
+
+void GSxControllerData::enlist() {
+  pthread_mutex_lock(&_allMutex);
+  _next = _all;
+  _all = this;
+  pthread_mutex_unlock(&_allMutex);
+}
+
+void GSxControllerData::delist() {
+  pthread_mutex_lock(&_allMutex);
+  GSxControllerData** link = &_all;
+  while (*link != this) link = &(*link)->_next;
+  *link = _next;
+  pthread_mutex_unlock(&_allMutex);
 }
 
 GSClient* GSxControllerData::find(wyx_token_t token) const {
@@ -70,13 +87,13 @@ GSClient* GSxControllerData::find(wyx_token_t token) const {
 }
 
 GSController::GSController() : _ctrlData(nullptr) {
-  auto data = std::make_unique<GSxControllerData>();
+  auto data = std::make_unique<GSxControllerData>(this);
   _ctrlData = data.get();
   GS_TRACE(GSCL_TRC_API, "GSController %x is created.\n", addressText(this));
   GSxControllerData::_theDomainController.store(nullptr, std::memory_order_release);
   GSxControllerData::_theController.store(this, std::memory_order_release);
   zelt_vrmf_version.store(get_zelt_vrmf_version(), std::memory_order_relaxed);
-  data.release();
+  data.release()->enlist();
 }
 
 GSController::~GSController() {
@@ -85,6 +102,7 @@ GSController::~GSController() {
   if (gscl_internal::loadedBaseApi() != nullptr && _ctrlData != nullptr && getGSDescriptor() >= 0) {
     GSController::quit();
   }
+  _ctrlData->delist();
   {
     WriteScope lock(*this);
     delete _ctrlData;

@@ -78,7 +78,7 @@ bool GSDelivery::settlePins(const GSClient* client) {
 }
 
 void GSDelivery::retire(GSClient* client) {
-  if (GSController* controller = GSController::theController()) controller->removeClient(client);
+  GSxControllerData::forEach([client](GSController& controller) { controller.removeClient(client); });
   PinsScope scope;
   ++retiring;
   while (!settlePins(client)) pthread_cond_wait(&pin_released, &pins_mutex);

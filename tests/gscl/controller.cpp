@@ -84,6 +84,19 @@ TEST(Controller, TheNewest_isCurrent_andAnyEndLeavesNone) {
   EXPECT_EQ(provider.getClientState(), GS_IAM_JOINING);
 }
 
+TEST(Controller, ClientThatGoes_leavesTheRegistryThatItStandsIn) {
+  RecordingApi api(0);
+  GSController first;
+  const auto registry = [&] { return (*reinterpret_cast<void***>(reinterpret_cast<char*>(&first) + 16))[1]; };
+  {
+    const GSProvider provider("a", 1, nullptr);
+    EXPECT_NE(registry(), nullptr);
+    const GSController second;
+    EXPECT_NE(registry(), nullptr);
+  }
+  EXPECT_EQ(registry(), nullptr) << "with no controller current";
+}
+
 TEST(Controller, Initialize_handsOverOptionsAndCallbacksByTheInstalledVersion) {
   RecordingApi api(0);
   for (const auto& [version, count] :
