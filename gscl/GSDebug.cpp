@@ -170,7 +170,7 @@ GSTraceFn::GSTraceFn(const char* name) {
   dbg_trace_indent.fetch_add(1, std::memory_order_relaxed);
   last_trace_name = dbg_trace_name.exchange(name, std::memory_order_relaxed);
   try {
-    GS_DEBUG(GSCL_TRC_FUNC, "Entering....\n");
+    GSdebugf(GSCL_TRC_FUNC, "Entering....\n");
   } catch (...) {
     const Unwind unwind{last_trace_name};
     throw;
@@ -179,5 +179,5 @@ GSTraceFn::GSTraceFn(const char* name) {
 
 GSTraceFn::~GSTraceFn() noexcept(false) {
   const Unwind unwind{last_trace_name};
-  GS_DEBUG(GSCL_TRC_FUNC, "Leaving...\n");
+  GSdebugf(GSCL_TRC_FUNC, "Leaving...\n");
 }

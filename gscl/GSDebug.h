@@ -12,10 +12,10 @@
 // A message carries its own line end; none is added.
 //
 // Threads: every function here may be called from any thread at any time. The level word, the routines and the
-// function name and depth of GSTraceFn are one for the process. A standard routine takes no lock of this facility: it
-// hands its line to the system in one piece, of at most 4095 characters, and so may a process that was forked while
-// other threads were writing. Errors: what cannot be written is dropped. Only a failed allocation of the message's
-// buffer is thrown.
+// function name and depth of GSTraceFn are one for the process. A standard routine takes no lock of this facility:
+// it hands its line to the system in one piece, of at most 4095 characters, and so may a process that was forked
+// while other threads were writing. Errors: what cannot be written is dropped. Only a failed allocation of the
+// message's buffer is thrown.
 #ifndef GSCL_GSDEBUG_H
 #define GSCL_GSDEBUG_H
 
@@ -32,7 +32,9 @@ enum gscl_trace_level_t : int {
 
 /// Receives each formatted message of a channel, with the level that it was given. The text is the channel's and
 /// valid only during the call. It runs on the thread that writes the message, which may hold locks of the library
-/// then: it may write messages, but calls no client or controller. What it throws goes to the writer.
+/// then: it may write messages, but calls no client or controller. What it throws goes to the caller of GSdebugf
+/// and GStracef, and out of a GSTraceFn; out of the library's own lines nothing goes on, so that no operation is
+/// left half done.
 typedef void (*gscl_debugf_rtn)(int level, char* text);
 typedef void (*gscl_tracef_rtn)(int level, char* text);
 
@@ -70,10 +72,11 @@ ZN_GSCL_EXPORT void GStracef(int level, const char* format, ...) __attribute__((
 ZN_GSCL_EXPORT gscl_debugf_rtn GSSetDebugRtn(gscl_debugf_rtn rtn);
 ZN_GSCL_EXPORT gscl_tracef_rtn GSSetTraceRtn(gscl_tracef_rtn rtn);
 
-/// Closes the debug file and opens `path` for writing, truncated; a new file is writable by its owner alone. Null, or
-/// a path that cannot be opened, leaves none open, and the standard routines write to standard error. The file stays
-/// open until the next call, through dae_init too, and is not handed on to programs that are executed. The first
-/// test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call GSSetDebugLevel first.
+/// Closes the debug file and opens `path` for writing, truncated; a new file is writable by its owner alone. Null,
+/// or a path that cannot be opened, leaves none open, and the standard routines write to standard error. The file
+/// stays open until the next call, through dae_init too, and is not handed on to programs that are executed. The
+/// first test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call
+/// GSSetDebugLevel first.
 ///
 /// The descriptor, once there was one, belongs to the library for good and may change its number. Should the
 /// application close it, lines go to standard error, never to what takes its number over.

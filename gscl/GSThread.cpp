@@ -41,15 +41,6 @@ GSxThreadData& dataOf(void* innerData) { return *static_cast<GSxThreadData*>(inn
 unsigned low32(pthread_t id) { return static_cast<unsigned>(id); }
 unsigned low32(const void* p) { return static_cast<unsigned>(reinterpret_cast<uintptr_t>(p)); }
 
-// For lines where a failed allocation must not end the process: the line is dropped.
-template <class Write>
-void traceIfPossible(Write write) {
-  try {
-    write();
-  } catch (const std::bad_alloc&) {
-  }
-}
-
 // What a virtual call of `run` calls at this moment; null while the object's destruction is in the classes that
 // have none, in which a virtual call would end the process. The destructor of an object whose thread has just been
 // started changes the table meanwhile, and either answer is right then.
@@ -159,10 +150,8 @@ void GSThread::finish() {
   const gscl_internal::CancellationHold hold;
   GSxThreadData& data = dataOf(innerData);
   pthread_t tid = data.tid;
-  traceIfPossible([&] {
-    GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread this=%x tid=%x, self=%x", low32(this), low32(tid),
-             low32(pthread_self()));
-  });
+  GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread this=%x tid=%x, self=%x", low32(this), low32(tid),
+           low32(pthread_self()));
   const std::shared_ptr<ThreadControl> control = data.control;
   ThreadControl::Phase phase;
   {
@@ -189,16 +178,16 @@ void GSThread::letGo(pthread_t tid) {
     stopped = control.stopped;
   }
   if (!own && !stopped) {
-    traceIfPossible([&] { GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread stop (tid=%x)", low32(tid)); });
-    traceIfPossible([&] { stop(); });
+    GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread stop (tid=%x)", low32(tid));
+    stop();
   }
-  traceIfPossible([&] { GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread joining tid=%x", low32(tid)); });
+  GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread joining tid=%x", low32(tid));
   if (join(nullptr) == EDEADLK && own) {
     std::lock_guard<std::mutex> lock(control.mutex);
     control.phase = ThreadControl::kDetached;
     pthread_detach(tid);  // nobody can join it any more
   }
-  traceIfPossible([&] { GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread join done tid=%x", low32(tid)); });
+  GS_DEBUG(GSCL_TRC_DETAIL, "GSThread::~GSThread join done tid=%x", low32(tid));
 }
 
 pthread_t GSThread::start(void* args) {
@@ -251,7 +240,7 @@ void* GSThread::stub_create_run_me(void* argument) {
   const std::unique_ptr<Launch> launch(static_cast<Launch*>(argument));
   ThreadControl& control = *launch->control;
   const ThreadEnd end(control);
-  traceIfPossible([] { GS_TRACE(GSCL_TRC_API, "stub_run_thread tid=%d\n", static_cast<int>(pthread_self())); });
+  GS_TRACE(GSCL_TRC_API, "stub_run_thread tid=%d\n", static_cast<int>(pthread_self()));
   {
     std::lock_guard<std::mutex> lock(control.mutex);
     if (control.data == nullptr) return nullptr;

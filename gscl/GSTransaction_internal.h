@@ -6,7 +6,7 @@
 
 namespace zelt_gscl_V1 {
 
-/// end() is the regular end. Without it (a trace routine that throws) the lock is given back silently.
+/// end() is the regular end. Without it (the thread ends inside) the lock is given back silently.
 class GSTransaction {
  public:
   explicit GSTransaction(GSClient* client) : client_(client) { client_->beginTransaction(); }

@@ -9,8 +9,8 @@
 
 #include <atomic>
 
-#include "gscl/GSDebug.h"
 #include "gscl/scopes_internal.h"
+#include "gscl/trace.h"
 
 namespace zelt_gscl_V1 {
 
@@ -84,13 +84,11 @@ int KPLDriver::InitKPL(int syscall_restarts, const char* excl_file, int excl_id,
   const int code = dae_init(&parent, &err_detail);
   if (code != DAE_OK) {
     sema_key = derive_sem_key(excl_file, excl_id);
-    if (GSDebugging(GSCL_TRC_WARNING)) GStracef(GSCL_TRC_WARNING, "dae_init failed with sema_key=%x\n", sema_key);
+    GS_TRACE(GSCL_TRC_WARNING, "dae_init failed with sema_key=%x\n", sema_key);
     return kInitFailed + code;
   }
   _kpl_fd = request_descriptor;
-  if (GSDebugging(GSCL_TRC_WARNING)) {
-    GStracef(GSCL_TRC_WARNING, "dae_init inited fd=%d, sema_key=%x\n", _kpl_fd, sema_key);
-  }
+  GS_TRACE(GSCL_TRC_WARNING, "dae_init inited fd=%d, sema_key=%x\n", _kpl_fd, sema_key);
   return 0;
 }
 

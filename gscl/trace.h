@@ -1,9 +1,12 @@
 // Trace and debug lines of the library itself; not installed.
 //
 // GS_TRACE(level, format, args...) and GS_DEBUG(level, format, args...) do what GStracef and GSdebugf do, but
-// evaluate the arguments only when the line will be written: a line that is off costs one load and one test.
+// evaluate the arguments only when the line will be written: a line that is off costs one load and one test. They
+// throw nothing: a line stands in the middle of an operation, and that must not be left half done.
 #ifndef GSCL_TRACE_H
 #define GSCL_TRACE_H
+
+#include <cxxabi.h>
 
 #include <atomic>
 
@@ -27,18 +30,30 @@ inline bool may_be_on(int level) {
 inline bool trace_wanted(int level) { return may_be_on(level) && trace_wanted_slow(level); }
 inline bool debug_wanted(int level) { return may_be_on(level) && debug_wanted_slow(level); }
 
+/// Writes a line. What that throws, from an application's routine or for want of memory, is dropped with it; only
+/// the end of the thread goes on.
+template <class Write>
+void dropThrown(Write write) {
+  try {
+    write();
+  } catch (const abi::__forced_unwind&) {
+    throw;
+  } catch (...) {
+  }
+}
+
 }  // namespace zelt_gscl_trace
 
-#define GS_TRACE(level, ...)                               \
-  do {                                                     \
-    if (zelt_gscl_trace::trace_wanted(level)) [[unlikely]] \
-      GStracef(level, __VA_ARGS__);                        \
+#define GS_TRACE(level, ...)                                              \
+  do {                                                                    \
+    if (zelt_gscl_trace::trace_wanted(level)) [[unlikely]]                \
+      zelt_gscl_trace::dropThrown([&] { GStracef(level, __VA_ARGS__); }); \
   } while (false)
 
-#define GS_DEBUG(level, ...)                               \
-  do {                                                     \
-    if (zelt_gscl_trace::debug_wanted(level)) [[unlikely]] \
-      GSdebugf(level, __VA_ARGS__);                        \
+#define GS_DEBUG(level, ...)                                              \
+  do {                                                                    \
+    if (zelt_gscl_trace::debug_wanted(level)) [[unlikely]]                \
+      zelt_gscl_trace::dropThrown([&] { GSdebugf(level, __VA_ARGS__); }); \
   } while (false)
 
 #endif
