@@ -39,6 +39,18 @@ constexpr Name kRcNames[] = {
     {22, "WYX_INVALID_SOURCE_GROUP"},
 };
 
+// Those that no trace line names.
+constexpr Name kFurtherRcNames[] = {
+    {23, "WYX_UNKNOWN_PROVIDER"},           {24, "WYX_INVALID_DEACTIVATE_PHASE"},
+    {25, "WYX_PROVIDER_APPEARS_TWICE"},     {26, "WYX_BACKLEVEL_PROVIDERS"},
+    {27, "WYX_NULL_ADAPTER_INFO"},          {28, "WYX_ADAPTER_INFO_NOT_FOUND"},
+    {29, "WYX_ADAPTER_INFO_NOT_SENT"},      {30, "WYX_NOT_ADAPTER_GROUP"},
+    {31, "WYX_VOTE_VALUE_NOT_ALLOWED"},     {32, "WYX_BAD_INPUT_IP_FORMAT"},
+    {33, "WYX_NO_IPV4_ADDRESS_FOR_THE_ID"}, {34, "WYX_WRITE_SOCK_ERROR"},
+    {35, "WYX_BAD_QUORUM_MSG_SEQNUM"},      {36, "WYX_NOT_REGISTERED_FOR_SYNC_QUORUM"},
+    {37, "WYX_UNEXPECTED_QUORUM_RESP"},
+};
+
 constexpr Name kNotificationTypeNames[] = {
     {-1, "empty-notification"},           {0, "WYX_RESPONSIVENESS_NOTIFICATION"},
     {1, "WYX_QUERY_NOTIFICATION"},        {2, "WYX_DELAYED_ERROR_NOTIFICATION"},
@@ -201,6 +213,11 @@ namespace zelt_gscl {
 const char* gscl_rc_name(wyx_rc_t rc) {
   static thread_local FallbackText text;
   return name_or_number(kRcNames, rc, text, "rc_code[%d]");
+}
+
+const char* gscl_return_code_name(wyx_rc_t rc) {
+  const char* further = find_name(kFurtherRcNames, rc);
+  return further != nullptr ? further : gscl_rc_name(rc);
 }
 
 const char* gscl_notification_type_name(wyx_notification_type_t type) {

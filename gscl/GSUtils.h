@@ -24,8 +24,10 @@ typedef pthread_t gscl_thread_t;
 // a name, and ends with the thread. Values are compared whole: a combination of flags has a name only when it is
 // listed.
 
-/// Else "rc_code[%d]"; codes from 23 on have no name.
+/// As trace lines have it: else "rc_code[%d]"; codes from 23 on have no name.
 ZN_GSCL_EXPORT const char* gscl_rc_name(wyx_rc_t rc);
+/// All codes have their name; else "rc_code[%d]".
+ZN_GSCL_EXPORT const char* gscl_return_code_name(wyx_rc_t rc);
 /// -1 is "empty-notification"; else "notification-type[%d]".
 ZN_GSCL_EXPORT const char* gscl_notification_type_name(wyx_notification_type_t type);
 /// -1 is "empty-request"; else "request-type[%d]".
@@ -114,8 +116,8 @@ ZN_GSCL_EXPORT wyx_membership_t* gscl_clone_membership(const wyx_membership_t* m
 ZN_GSCL_EXPORT void gscl_delete_membership(wyx_membership_t* mbrship);
 ZN_GSCL_EXPORT timespec* GSGetAbsTime(timespec* abstime, int secs, int usecs);
 
-/// How trace lines name a client: "Prov[<group>,Id=<instance>/<node>,T=<token>]" or "Subs[G=<group>,T=<token>]", as
-/// it stands now. Allocates; build it only for a line that will be written.
+/// How trace lines name a client: "Prov[<group>,Id=<instance>/<node>,T=<token>]" or "Subs[G=<group>,T=<token>]",
+/// as it stands now. Allocates; build it only for a line that will be written.
 ZN_GSCL_EXPORT GSString getTraceIdStr(GSClient* client);
 
 }  // namespace zelt_gscl_V1

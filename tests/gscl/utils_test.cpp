@@ -28,6 +28,8 @@ std::string names(const char* (*name)(Code), std::vector<int> values) {
 // From the far end of the values, where a slip would show, those with a text of their own, and unknown ones.
 TEST(Names, wholeValuesAndNothingElse_areNamed) {
   EXPECT_EQ(names(gscl_rc_name, {22, 23, -7}), "23 WYX_INVALID_SOURCE_GROUP rc_code[23] rc_code[-7]");
+  EXPECT_EQ(names(gscl_return_code_name, {22, 23, 37, 38}),
+            "38 WYX_INVALID_SOURCE_GROUP WYX_UNKNOWN_PROVIDER WYX_UNEXPECTED_QUORUM_RESP rc_code[38]");
   EXPECT_EQ(names(gscl_notification_type_name, {WYX_MERGE_NOTIFICATION, INT_MIN}),
             "10 WYX_MERGE_NOTIFICATION notification-type[-2147483648]");
   EXPECT_EQ(names(gscl_request_type_name, {WYX_GROUP_ATTRIBUTE_CHANGE, -1}),
