@@ -42,22 +42,24 @@ struct GSxControllerData;
 ///
 /// Callbacks (the virtual functions below and those of the clients) run on the thread that called dispatch(),
 /// inside it, with no lock of the library held: they may issue requests, call dispatch() again, construct clients
-/// and destroy them, the one that the callback belongs to included. They must not wait for notifications.
+/// and destroy them, the one that the callback belongs to included. They must not wait for notifications, nor for
+/// a thread that destroys the client that they belong to. What a callback throws goes on out of dispatch(), after
+/// the notification has been reported to waiting threads.
 ///
 /// Errors: results are the base API's, passed on unchanged. WYX_NOT_SUPPORTED also stands for an operation that
 /// the base API library does not have. Fatal: the base API library or the product version cannot be had; the
 /// process aborts with a message on standard error.
 ///
 /// Cancellation: dispatch(WYX_BLOCKING) is a cancellation point while it waits, and leaves nothing behind; the
-/// base API library runs the callbacks with cancellation disabled. initialize(), quit(), a change of responsiveness, a
-/// client's request and a destructor are none: a cancelled thread finishes them first.
+/// base API library runs the callbacks with cancellation disabled. initialize(), quit(), a change of
+/// responsiveness, a client's request and a destructor are none: a cancelled thread finishes them first.
 class ZN_GSCL_EXPORT GSController : public GSLockableObject {
  public:
   /// Becomes the current controller, whichever was current before, and reads the installed product version.
   GSController();
 
   /// Quits the session when it is open (not through an override of quit()), forgets the registry, leaves no
-  /// current controller. Neither touches nor destroys the clients.
+  /// current controller. Neither touches nor destroys the clients. Like quit() it does not wake threads that wait.
   virtual ~GSController();
 
   GSController(const GSController&) = delete;
@@ -68,7 +70,8 @@ class ZN_GSCL_EXPORT GSController : public GSLockableObject {
   virtual wyx_rc_t initialize();
 
   /// Closes the session (wyx_quit), also when none is open, and sets the descriptor to -1 whatever the result,
-  /// which is the base API's. Takes the write lock after the call.
+  /// which is the base API's. Takes the write lock after the call. Clients keep their state and are told nothing;
+  /// a thread that waits for a notification without a limit sleeps for ever, through a later initialize(), too.
   virtual wyx_rc_t quit();
 
   /// The daemon asks whether the process is alive. The answer goes back to it; here WYX_CALLBACK_OK.
@@ -78,7 +81,8 @@ class ZN_GSCL_EXPORT GSController : public GSLockableObject {
   virtual void queryCb(const wyx_query_notification_t* notification);
 
   /// Delivers the notifications that are there (WYX_NON_BLOCKING) or waits for some first (WYX_BLOCKING), by
-  /// calling the callbacks on this thread (wyx_dispatch). The base API's result. Takes no lock.
+  /// calling the callbacks on this thread (wyx_dispatch). The base API's result. Takes no lock of the controller;
+  /// the routing does: called inside a signal handler it deadlocks with what the signal has interrupted.
   virtual wyx_rc_t dispatch(wyx_dispatch_flag_t flag);
 
   /// The controller constructed last, null when one has been destroyed since. Takes no lock.
@@ -211,9 +215,9 @@ class ZN_GSCL_EXPORT GSController : public zelt_gscl_V2::GSController {
   /// wyx_internal_send_domain_msg_to_gsd; `length` in bytes.
   wyx_rc_t sendDomainMsgToGSD(wyx_priv_channel_msg_type_t type, void* data, unsigned long length);
 
-  /// The pointer that the first version's function returns, as one to this version: null only when there is no current
-  /// controller. Where the current one may have been constructed as an older version, use nothing through it that
-  /// this class adds virtually.
+  /// The pointer that the first version's function returns, as one to this version: null only when there is no
+  /// current controller. Where the current one may have been constructed as an older version, use nothing through
+  /// it that this class adds virtually.
   static GSController* theController();
 };
 
