@@ -41,8 +41,9 @@ class GSTransaction;
 ///
 /// Threads: requests, getters and waits may be called from any thread. Callbacks run on the thread that calls
 /// dispatch(), with no lock held; they may issue requests and destroy clients, their own included, but must not
-/// wait on their own client. Lock order within a client: transaction lock, client lock, wait mutex; the
-/// controller's lock comes before all of them.
+/// wait on their own client, nor for a thread that destroys it: that one waits until the callback is over. Lock
+/// order within a client: transaction lock, client lock, wait mutex; the controller's lock comes before all of
+/// them.
 ///
 /// Lifetime: the application owns its clients. The destructor takes the client out of the registry and then waits
 /// until no other thread delivers a notification to it, so that the library never touches a client that is gone.
@@ -79,7 +80,8 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   GSClientState getOldClientState() const;
   wyx_token_t getToken() const;  ///< -1: none; no lock
 
-  /// Stores at most the first 32 characters; null: no name. Write lock. Not while another thread uses the name.
+  /// Stores at most the first 32 characters: longer names that begin alike become one group. Null: no name. Write
+  /// lock. Not while another thread uses the name.
   void setGroupName(const char* gname);
   /// The client's own copy, valid until the name is set again; null without a name. No lock.
   const char* getGroupName() const;
@@ -107,8 +109,15 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   /// GS_WAITFOR_EINVAL, _EPERM, _EFAULT, _EDEADLK   the wait itself failed
   /// On any other than the first and NOT_SUPPORTED the notification and protocol types in the outputs are -1.
   ///
-  /// At most four threads per client have a request recorded; a fifth takes over the oldest answered record, else
-  /// the oldest. A cancellation point while it sleeps.
+  /// At most four threads per client have a request recorded; the request of a fifth takes the oldest answered
+  /// record away, else the oldest. The thread that had it gets GS_WAITFOR_ERROR, or, when it is asleep, waits for
+  /// the other thread's notification instead of its own and may sleep on when that one takes it first: do not let
+  /// more than four threads request on one client, or give every wait a time.
+  ///
+  /// Neither GSController::quit() nor the destruction of the controller wakes anybody or makes a client idle, and
+  /// no notification of the session comes any more, not in a later one either: a wait without limit that is under
+  /// way then never ends, and one with a limit ends with GS_WAITFOR_PENDING. End the waits first (leave and wait
+  /// for it), or give them a time. A cancellation point while it sleeps.
   GSWaitForRC waitForNotification(GSWaitForTriggerType where, const timespec* abstime,
                                   wyx_notification_type_t* notify_type,
                                   wyx_notification_summary_t* notify_summary);

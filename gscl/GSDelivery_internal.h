@@ -65,8 +65,9 @@ class GSDelivery {
   /// The subscriber's membership after a notification: full list, joins or leaves, the first that is there.
   static void updateMembership(GSSubscriber* subscriber, const wyx_subscription_notification_t* notification);
 
-  /// Takes `client` out of the registry of whichever controller it stands in and returns when no other thread has it pinned and no delivery of this
-  /// thread will touch it again. Called by destructors; takes and holds no lock while it waits.
+  /// Takes `client` out of the registry of whichever controller it stands in and returns when no other thread has
+  /// it pinned and no delivery of this thread will touch it again. Called by destructors; takes and holds no lock
+  /// while it waits.
   static void retire(GSClient* client);
 
  private:

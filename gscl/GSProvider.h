@@ -12,8 +12,9 @@ namespace zelt_gscl_V1 {
 /// the callbacks; here they only write trace lines (in particular nPhaseCb casts no vote).
 ///
 /// States, threads, lifetime: see GSClient. Idle until joinGroup() is accepted, joined when the join is approved,
-/// idle again after a leave or goodbye, and it may then join again. Destroying a joined provider tells the daemon
-/// nothing: leave or say goodbye first.
+/// idle again after a leave or goodbye, and it may then join again. Neither joinGroup() on a joined provider nor
+/// its destruction tells the daemon that the member of before is gone: it stays in the group, without anybody who
+/// votes for it, until the session ends. Say goodbye, or leave and wait for the approval, first.
 ///
 /// Requests return the base API's synchronous result unchanged; what comes of the request is told by a callback,
 /// and to a thread that waits with waitForNotification. Each kind of request has one virtual form; the convenience
@@ -37,7 +38,8 @@ class ZN_GSCL_EXPORT GSProvider : public GSClient {
   virtual void announcementCb(const wyx_announcement_notification_t* notification);
   virtual void mergeCb(const wyx_merge_notification_t* notification);
 
-  /// Joins the group that the client is named after, with the attributes as set (wyx_join).
+  /// Joins the group that the client is named after, with the attributes as set (wyx_join). They must not be set
+  /// meanwhile: the request points at the provider's own gs_source_group_name.
   virtual wyx_rc_t joinGroup();
   /// Leaves at once, without a protocol (wyx_goodbye). WYX_NOT_OK when idle already.
   virtual wyx_rc_t goodbyeGroup();

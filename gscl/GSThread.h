@@ -70,8 +70,8 @@ class ZN_GSCL_EXPORT GSThread {
   /// or all bits set when it could not be created or the object's thread has not ended and was not stopped, or is
   /// detached. An earlier thread that was not joined is joined first, and if it was stopped, waited for. Throws
   /// when there is no memory.
-  /// `run` is called as a virtual function by the new thread: when a constructor starts it, classes derived from that
-  /// one may not be constructed yet, or just so. When the object is gone by then, nothing runs.
+  /// `run` is called as a virtual function by the new thread: when a constructor starts it, classes derived from
+  /// that one may not be constructed yet, or just so. When the object is gone by then, nothing runs.
   pthread_t start(void* args);
   /// Cancels the thread, without waiting for its end or releasing it: `join`, the next `start` and the destructor
   /// do that. Returns 0, -1 when the object is not running or the caller is its thread, else the error number of
