@@ -11,7 +11,7 @@ normal() {
   sed -E -e 's/"[a-z_]*ms":-?[0-9]+/"ms":N/g' -e 's/"(pid|uid)":[0-9]+/"\1":N/g' \
     -e 's/[0-9]{2}:[0-9]{2}:[0-9]{2}\.[0-9]{3}/TIME/g' -e 's/[0-9]{4}-[0-9]{2}-[0-9]{2}T[0-9:.]+Z/TIME/g' \
     -e 's/[0-9]+(\.[0-9]+)? (ms|s|min|h|µs)\b/SPAN/g' -e 's/gsd [0-9.]+/gsd VERSION/' -e 's/pid [0-9]+/pid N/g' \
-    -e 's/gsctl +[0-9]+ +[^ ]+/gsctl N USER/g' -e 's/[0-9]{6,}/N/g' -e 's/ +/ /g' -e 's/ $//' -e '/^$/d'
+    -e 's/gsctl +[0-9]+ +[^ ]+/gsctl N USER/g' -e 's/[0-9]{3,}/N/g' -e 's/ +/ /g' -e 's/ $//' -e '/^$/d'
 }
 
 # check COMMAND EXPECTED
