@@ -141,7 +141,6 @@ class Block {
   const Story& story_;
   const TimeScale& scale_;
   const Stretch& shown_;
-  const double left_;
   LabelRows group_labels_;
   std::vector<Row> rows_;
   double bar_ = 0;  // its upper edge
@@ -149,7 +148,7 @@ class Block {
 };
 
 Block::Block(const Story& story, const TimeScale& scale, const Stretch& shown, double left)
-    : story_(story), scale_(scale), shown_(shown), left_(left), group_labels_(left, scale.right(), kText) {
+    : story_(story), scale_(scale), shown_(shown), group_labels_(left, scale.right(), kText) {
   for (const Lane& lane : story.lanes) rows_.push_back({&lane, LabelRows(left, scale.right(), kText)});
   for (const Protocol& protocol : story.protocols) {
     if (!is_shown(protocol.from, protocol.to)) continue;
