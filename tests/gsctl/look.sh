@@ -127,7 +127,7 @@ wait $watching
 [ $? -eq 5 ] && [ "$(wc -l <lost)" -eq 1 ] || die "the loss is told in another way: $(cat lost)"
 printf 'expect tries again\n' >&8
 await_text '"change":"lost"' all.log
-start_gsd
+start_gsd 8>&- # else gsd keeps the terminal's input open
 await_text '"change":"found"' all.log
 printf 'gone tries again\ngone crew\nkeys q\nend 0\n' >&8
 exec 8>&-
