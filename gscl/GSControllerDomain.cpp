@@ -82,7 +82,8 @@ GSController::GSController(unsigned int version) : zelt_gscl_V2::GSController(ve
 GSController::~GSController() = default;
 
 GSController* GSController::theController() {
-  return static_cast<GSController*>(zelt_gscl_V1::GSController::theController());
+  // Only another type for the pointer: the object may be of an older version.
+  return reinterpret_cast<GSController*>(zelt_gscl_V1::GSController::theController());
 }
 
 wyx_rc_t GSController::changeResponsiveness(const wyx_responsiveness_t* responsiveness) {
