@@ -1,5 +1,9 @@
 # Sourced by the scripts beside it, with the folder of the programs as $1: a folder that goes away again, with a gsd of
 # its own; ends all that the script has started, however it ends.
+
+# The leak checker guesses where the thread-local memory of a loaded library is, and may crash at the end of a program
+# by looking there.
+export ASAN_OPTIONS="${ASAN_OPTIONS:+$ASAN_OPTIONS:}intercept_tls_get_addr=0"
 set -u
 bin=$(realpath "$1")
 here=$(mktemp -d)
