@@ -267,7 +267,7 @@ TEST(Debug, fileClosedByTheApplication_isNeverMistakenForWhatTakesItsNumber) {
 }
 
 TEST(Debug, childrenForkedWhileOthersWrite_writeTheirLinesToo) {
-  constexpr int kChildren = 300;
+  constexpr int kChildren = 100;
   const TempFile file("");
   const FreshOutput seen = in_fresh_process([&] {
     gscl_set_debug_file(file.path());

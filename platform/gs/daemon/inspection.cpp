@@ -71,7 +71,7 @@ void add_counts(const Facts& facts, List<inspect::CountT>& to) {
   add.gauge("members", totals.members, "Members of all groups");
   add.gauge("subscribers", totals.subscribers, "Subscribers of all groups");
   add.gauge("running_protocols", totals.running, "Protocols that wait for votes");
-  add.gauge("sessions", facts.sessions.size(), "Clients of this host that are connected");
+  add.gauge("sessions", facts.session_count, "Clients of this host that are connected");
   add.gauge("kept_bytes", facts.engine.kept_bytes(), "Memory that groups keep for their members", "bytes");
   add.gauge("waiting_bytes", facts.waiting_bytes, "What waits for clients to read it", "bytes");
   const Counters& counters = facts.counters;

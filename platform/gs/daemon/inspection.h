@@ -47,8 +47,9 @@ struct Facts {
   Time now{};
   Time started{};
   const Counters& counters;
-  std::size_t waiting_bytes = 0;        // for all clients
-  std::vector<SessionStatus> sessions;  // by number
+  std::size_t waiting_bytes = 0;  // for all clients
+  std::size_t session_count = 0;
+  std::vector<SessionStatus> sessions;  // by number, where the report names any
 };
 
 inspect::ReportT report(const inspect::AskT& ask, const Facts& facts);

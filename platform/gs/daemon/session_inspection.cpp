@@ -5,6 +5,13 @@
 #include "daemon/session_layer.h"
 
 namespace gs::daemon {
+namespace {
+
+bool names_sessions(inspect::What what) {
+  return what == inspect::What::Members || what == inspect::What::Subscribers || what == inspect::What::Sessions;
+}
+
+}  // namespace
 
 void SessionLayer::on_inspect(ConnectionId id, Connection& connection, const wire::Inspect& inspect) {
   std::string error;
@@ -27,7 +34,8 @@ inspect::ReportT SessionLayer::inspect(const inspect::AskT& ask) const {
                       .started = started_,
                       .counters = counters_,
                       .waiting_bytes = accounts_.waiting(),
-                      .sessions = session_statuses()});
+                      .session_count = sessions_.size(),
+                      .sessions = names_sessions(ask.what) ? session_statuses() : std::vector<SessionStatus>()});
 }
 
 std::vector<SessionStatus> SessionLayer::session_statuses() const {
@@ -68,10 +76,9 @@ void SessionLayer::feed_taps_soon() {
 void SessionLayer::feed_taps() {
   feed_taps_ = {};
   for (const ConnectionId id : taps_.ids()) feed_tap(id);
-  feed_taps_soon();
 }
 
-/// Only what it has room for; what it misses is counted.
+/// Only what it has room for; what it misses is counted, and told when it has taken something.
 void SessionLayer::feed_tap(ConnectionId id) {
   for (;;) {
     const Connection* connection = find(id);

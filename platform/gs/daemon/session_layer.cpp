@@ -86,6 +86,7 @@ void SessionLayer::flush(ConnectionId id, std::size_t share) {
   if (!handle(id, connection->out.flush(env_.transport, id, share))) return;
   if (connection->out.sent() != sent) connection->progressed = env_.now();
   if (!connection->out.empty()) env_.transport.wait_writable(id);
+  if (connection->channel == Channel::kTap) feed_taps_soon();
   watch_bound(id, *connection);
   note_freed();
 }

@@ -74,9 +74,8 @@ void Group::tell(Happening::Kind kind, const Run& run, const Surroundings& env, 
   Happening told = happening(kind, run);
   told.summary = summary;
   if (kind != Happening::Kind::kBegin) told.event_number = seqnum_;
-  const bool approved = kind == Happening::Kind::kApproved;
-  told.state = approved ? state_value_.bytes : run.proposed_state.bytes;
-  told.state_changed = approved && run.proposed_state;
+  told.state = run.proposed_state.bytes;
+  told.state_changed = kind == Happening::Kind::kApproved && run.proposed_state;
   told.message = run.voted_message ? run.voted_message.bytes : run.message.bytes;
   env.watch.observer->happened(told);
 }
