@@ -145,13 +145,24 @@ std::string explain(wyx_rc_t rc) {
 }
 
 std::string protocol_name(wyx_request_t protocol) {
-  constexpr std::string_view kPrefix = "WYX_";
-  std::string name = zelt_gscl::gscl_request_type_name(protocol);
-  if (name.starts_with(kPrefix)) name.erase(0, kPrefix.size());
-  for (char& c : name) {
-    if (c >= 'A' && c <= 'Z') c = static_cast<char>(c - 'A' + 'a');
+  switch (protocol) {
+    case WYX_JOIN:
+      return "join";
+    case WYX_LEAVE:
+      return "leave";
+    case WYX_FAILURE_LEAVE:
+      return "failure";
+    case WYX_EXPEL:
+      return "expel";
+    case WYX_STATE_VALUE_CHANGE:
+      return "state";
+    case WYX_PROVIDER_MESSAGE:
+      return "message";
+    case WYX_GROUP_ATTRIBUTE_CHANGE:
+      return "attributes";
+    default:
+      return zelt_gscl::gscl_request_type_name(protocol);
   }
-  return name;
 }
 
 std::string leave_reason(unsigned leave_codes) {

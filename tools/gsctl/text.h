@@ -41,7 +41,7 @@ std::string clock_text();
 
 /// What became of a request: a few words without capitals, and what to do where something can be done.
 std::string explain(wyx_rc_t rc);
-/// "join", "failure_leave", "state_value_change" ...: protocols, as JSON and the environment name them.
+/// "join", "failure", "state" ...: protocols, as the daemon's reports, JSON and the environment name them.
 std::string protocol_name(wyx_request_t protocol);
 /// Why a provider is gone: "left", "failed", "host_failed", "said_goodbye", "expelled", "gone".
 std::string leave_reason(unsigned leave_codes);
