@@ -14,6 +14,7 @@ namespace {
 constexpr std::chrono::milliseconds kFirstPause{250};
 constexpr std::chrono::milliseconds kLongestPause{10'000};
 constexpr timeval kUntilTaken = {0, 1'000};  // before what Corosync did not take is tried again
+constexpr int kManyJoins = 5'000;            // more than a membership takes to go
 constexpr Node kMaxNode = 32'767;
 constexpr cs_dispatch_flags_t kOne = CS_DISPATCH_ONE_NONBLOCKING;
 constexpr std::uint32_t kUnknown = UINT32_MAX;  // votes that nobody has
@@ -297,10 +298,23 @@ bool CorosyncLink::leave_group() {
   return false;
 }
 
+/// This process's last membership is not gone yet, or another one with its pid, in another container, is there.
+cs_error_t CorosyncLink::join_again() {
+  if (++refused_joins_ == kManyJoins) {
+    log_->error(
+        "Corosync says that process {} of this host is in the group already: two gsds in two containers? Run one "
+        "on "
+        "a host",
+        getpid());
+  }
+  return CS_ERR_TRY_AGAIN;
+}
+
 cs_error_t CorosyncLink::run(const Task& task) {
   if (std::holds_alternative<Join>(task)) {
     const cs_error_t error = cpg_join(cpg_, &name_);
-    return error == CS_ERR_EXIST ? CS_ERR_TRY_AGAIN : error;  // this process's last membership is not gone yet
+    if (error != CS_ERR_EXIST) refused_joins_ = 0;
+    return error == CS_ERR_EXIST ? join_again() : error;
   }
   const auto& message = std::get<std::vector<std::byte>>(task);
   const iovec bytes = {const_cast<std::byte*>(message.data()), message.size()};

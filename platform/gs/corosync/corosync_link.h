@@ -100,6 +100,7 @@ class CorosyncLink {
   void break_later(const std::string& why);
   void lose_broken() { lose(broken_); }
   bool leave_group();
+  cs_error_t join_again();
   cs_error_t run(const Task& task);
   void on_quorum(bool quorate, const quorum_ring_id& ring, std::span<const std::uint32_t> members);
 
@@ -126,6 +127,7 @@ class CorosyncLink {
   EventPtr connect_later_;
   std::deque<Task> tasks_;
   std::size_t unsent_ = 0;  // bytes of them
+  int refused_joins_ = 0;   // since one was taken
   std::chrono::milliseconds pause_;
 };
 
