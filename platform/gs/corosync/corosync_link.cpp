@@ -14,7 +14,7 @@ namespace {
 constexpr std::chrono::milliseconds kFirstPause{250};
 constexpr std::chrono::milliseconds kLongestPause{10'000};
 constexpr timeval kUntilTaken = {0, 1'000};  // before what Corosync did not take is tried again
-constexpr int kManyJoins = 5'000;            // more than a membership takes to go
+constexpr int kManyJoins = 1'000;            // more than a membership takes to go
 constexpr Node kMaxNode = 32'767;
 constexpr cs_dispatch_flags_t kOne = CS_DISPATCH_ONE_NONBLOCKING;
 constexpr std::uint32_t kUnknown = UINT32_MAX;  // votes that nobody has
