@@ -9,12 +9,14 @@
 
 #include "gscl/GSDebugFile_internal.h"
 #include "gscl/GSLocalTime_internal.h"
+#include "gscl/GSLocalVar.h"
 #include "gscl/GSUtils.h"
 #include "gscl/trace.h"
 
 namespace {
 
 using gscl_internal::ForkableGate;
+using zelt_gscl_V1::GSLocalVar;
 
 constexpr unsigned int kMessageBytes = 2048;
 constexpr int kMaxIndentation = 30;
@@ -84,7 +86,7 @@ struct EndOfArguments {
 template <class Routine>
 void write_message(Routine& variable, int level, const char* format, va_list args) {
   if (routine(variable) == nullptr || GSDebugging(level) == 0) return;
-  char text[kMessageBytes];  // not from the heap, whose locks a forked child may wait for
+  GSLocalVar<char> text(kMessageBytes);
   text[0] = '\0';
   vsnprintf(text, kMessageBytes, format, args);
   const Routine write = routine(variable);

@@ -14,7 +14,8 @@
 // Threads: every function here may be called from any thread at any time. The level word, the routines and the
 // function name and depth of GSTraceFn are one for the process. A standard routine takes no lock of this facility:
 // it hands its line to the system in one piece, of at most 4095 characters, and so may a process that was forked
-// while other threads were writing: nothing here takes memory. Errors: what cannot be written is dropped.
+// while other threads were writing. Errors: what cannot be written is dropped. Only a failed allocation of the
+// message's buffer is thrown.
 #ifndef GSCL_GSDEBUG_H
 #define GSCL_GSDEBUG_H
 
