@@ -37,7 +37,9 @@ on who is in and on a shared state value, send each other messages in one
 order, and are told when one of them dies.
 .
 This package has the C++ library with its headers, the base API library, the
-daemon gsd, and kplmstr with kplctl, which start, watch and ask daemons.")
+daemon gsd, the command gsctl, which shows and changes groups and runs a
+program in one place at a time, and kplmstr with kplctl, which start, watch
+and ask daemons.")
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION net)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)

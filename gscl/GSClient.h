@@ -115,9 +115,12 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   /// more than four threads request on one client, or give every wait a time.
   ///
   /// Neither GSController::quit() nor the destruction of the controller wakes anybody or makes a client idle, and
-  /// no notification of the session comes any more, not in a later one either: a wait without limit that is under
-  /// way then never ends, and one with a limit ends with GS_WAITFOR_PENDING. End the waits first (leave and wait
-  /// for it), or give them a time. A cancellation point while it sleeps.
+  /// no notification of the session comes any more: a wait without limit, under way then or begun later, sleeps
+  /// on, also past a new initialize(); one with a limit ends with GS_WAITFOR_PENDING. If the client is used again
+  /// meanwhile, the sleeper is woken by the answer to another thread's request and reports that one as its own: do
+  /// not use a client again while a thread waits on it. End the waits first (leave and wait for it), or give them a
+  /// time. goodbyeGroup() and unsubscribeGroup() make the client idle and wake nobody either:
+  /// GS_WAITFOR_NOT_A_MEMBER comes at the deadline or the next wake-up. A cancellation point while it sleeps.
   GSWaitForRC waitForNotification(GSWaitForTriggerType where, const timespec* abstime,
                                   wyx_notification_type_t* notify_type,
                                   wyx_notification_summary_t* notify_summary);

@@ -33,7 +33,7 @@ struct GSxControllerData;
 ///
 /// Threads: every operation may be called from any thread. While a controller is destroyed no thread may be inside
 /// dispatch() or any other operation of it or of a client. The controller's lock is taken before a client's, never
-/// the reverse.
+/// the reverse. A client's destructor takes the lock of each controller: destroy none while holding one.
 ///
 /// Forks: the session stays the parent's. In the child every operation is answered as without a session, quit()
 /// and the destructors of controller and clients reach nothing of the parent's, and initialize() opens a session
@@ -71,7 +71,7 @@ class ZN_GSCL_EXPORT GSController : public GSLockableObject {
 
   /// Closes the session (wyx_quit), also when none is open, and sets the descriptor to -1 whatever the result,
   /// which is the base API's. Takes the write lock after the call. Clients keep their state and are told nothing;
-  /// a thread that waits for a notification without a limit sleeps for ever, through a later initialize(), too.
+  /// wakes no thread that waits for a notification: see GSClient::waitForNotification.
   virtual wyx_rc_t quit();
 
   /// The daemon asks whether the process is alive. The answer goes back to it; here WYX_CALLBACK_OK.

@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <exception>
 
 #include "gscl/GSDebugFile_internal.h"
 #include "gscl/GSLocalTime_internal.h"
@@ -179,5 +180,6 @@ GSTraceFn::GSTraceFn(const char* name) {
 
 GSTraceFn::~GSTraceFn() noexcept(false) {
   const Unwind unwind{last_trace_name};
-  GSdebugf(GSCL_TRC_FUNC, "Leaving...\n");
+  const auto leave = [] { GSdebugf(GSCL_TRC_FUNC, "Leaving...\n"); };
+  std::uncaught_exceptions() == 0 ? leave() : zelt_gscl_trace::dropThrown(leave);
 }

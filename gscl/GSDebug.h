@@ -15,7 +15,8 @@
 // function name and depth of GSTraceFn are one for the process. A standard routine takes no lock of this facility:
 // it hands its line to the system in one piece, of at most 4095 characters, and so may a process that was forked
 // while other threads were writing. Errors: what cannot be written is dropped. Only a failed allocation of the
-// message's buffer is thrown.
+// message's buffer is thrown. A child that is forked while another thread looks up the time zone keeps the offset
+// that was known then, UTC before the first line.
 #ifndef GSCL_GSDEBUG_H
 #define GSCL_GSDEBUG_H
 
@@ -74,7 +75,8 @@ ZN_GSCL_EXPORT gscl_tracef_rtn GSSetTraceRtn(gscl_tracef_rtn rtn);
 
 /// Closes the debug file and opens `path` for writing, truncated; a new file is writable by its owner alone. Null,
 /// or a path that cannot be opened, leaves none open, and the standard routines write to standard error. The file
-/// stays open until the next call, through dae_init too, and is not handed on to programs that are executed. The
+/// stays open until the next call, through dae_init too (which moves it above the descriptors that it closes, or,
+/// where the hard limit leaves no number there, spares it), and is not handed on to programs that are executed. The
 /// first test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call
 /// GSSetDebugLevel first.
 ///
@@ -87,7 +89,8 @@ ZN_GSCL_EXPORT void gscl_set_debug_file(const char* path);
 ///
 /// To be created on the stack. Name and depth belong to the process: objects of several threads at the same time
 /// share them. Depth counts also when nothing is written. When writing fails with an exception (no memory, or a
-/// routine that throws) name and depth are put back before it goes on.
+/// routine that throws) name and depth are put back before it goes on; what is thrown while another exception leaves
+/// the function is dropped.
 class ZN_GSCL_EXPORT GSTraceFn {
  public:
   /// `name` is not copied; it outlives the object (a literal).

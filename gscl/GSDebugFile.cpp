@@ -14,9 +14,9 @@ namespace {
 
 /// The descriptor that belongs to the debug file, as one word, which writers read without a lock.
 ///
-/// Once there was a file its number is kept, on /dev/null while there is none, and another file takes it over in
-/// one step: a writer that has just read the word never meets a number that has become somebody else's. The
-/// application may close it all the same; that is what the mark is for.
+/// Once there was a file its number is kept, on something that takes no bytes while there is none, and another
+/// file takes it over in one step: a writer that has just read the word never meets a number that has become
+/// somebody else's. The application may close it all the same; that is what the mark is for.
 struct Place {
   int32_t number = -1;  // -1: none
   uint32_t mark = 0;    // of the file that the number leads to; see markOf
@@ -36,12 +36,17 @@ constexpr uint32_t kAnyFile = 0;  // the number is just being given another file
 constinit std::atomic<uint64_t> debug_place{0};
 constinit std::atomic<pid_t> setting{0};  // gate of those who change it
 
-/// Tells files apart. 0: the number is not open.
+/// Tells files apart, also one from its successor with the same inode. 0: the number is not open.
 uint32_t markOf(int number) {
-  struct stat file;
-  if (fstat(number, &file) != 0) return 0;
-  const uint64_t mixed = (file.st_dev * 0x9e3779b97f4a7c15 ^ file.st_ino) * 0xff51afd7ed558ccd;
-  return static_cast<uint32_t>(mixed >> 32) | 1;
+  struct statx file;
+  if (statx(number, "", AT_EMPTY_PATH, STATX_INO | STATX_BTIME, &file) != 0) return 0;
+  uint64_t mixed = 0;
+  for (const uint64_t part : {uint64_t{file.stx_dev_major}, uint64_t{file.stx_dev_minor}, uint64_t{file.stx_ino},
+                              static_cast<uint64_t>(file.stx_btime.tv_sec), uint64_t{file.stx_btime.tv_nsec}}) {
+    mixed = (mixed ^ part) * 0xff51afd7ed558ccd;
+    mixed ^= mixed >> 32;
+  }
+  return static_cast<uint32_t>(mixed) | 1;
 }
 
 bool isOurs(const Place& place) {
@@ -68,26 +73,6 @@ int openFile(const char* path) {
   return higher;
 }
 
-/// Takes over `file`; -1: none. The caller is inside the gate.
-void replaceFile(int file) {
-  const Place before = Place::of(debug_place.load());
-  if (!isOurs(before)) {
-    debug_place.store(file < 0 ? 0 : Place{file, markOf(file), true}.word());
-    return;
-  }
-  const int next = file >= 0 ? file : open("/dev/null", O_WRONLY | O_CLOEXEC);
-  debug_place.store(Place{before.number, kAnyFile, before.in_use && file >= 0}.word());
-  if (next < 0) {
-    close(before.number);
-    debug_place.store(0);
-    return;
-  }
-  while (dup3(next, before.number, O_CLOEXEC) < 0 && (errno == EINTR || errno == EBUSY)) {
-  }
-  close(next);
-  debug_place.store(Place{before.number, markOf(before.number), file >= 0}.word());
-}
-
 /// While it lives a descriptor may have the number `wanted`, if the system lets it.
 class RaisedLimit {
  public:
@@ -108,6 +93,43 @@ class RaisedLimit {
   rlimit before_ = {};
   bool raised_ = false;
 };
+
+/// A file of its own that takes no bytes; -1: there are no descriptors.
+int openNothing() {
+  int ends[2];
+  if (pipe2(ends, O_CLOEXEC) != 0) return -1;
+  close(ends[1]);
+  return ends[0];
+}
+
+/// Whether `number`, which may be above the limit, leads to what `next` leads to now.
+bool takesOver(int number, int next) {
+  if (next < 0) return false;
+  const RaisedLimit raised(number);
+  int taken;
+  do {
+    taken = dup3(next, number, O_CLOEXEC);
+  } while (taken < 0 && (errno == EINTR || errno == EBUSY));
+  return taken >= 0;
+}
+
+/// Takes over `file`; -1: none. The caller is inside the gate.
+void replaceFile(int file) {
+  const Place before = Place::of(debug_place.load());
+  if (!isOurs(before)) {
+    debug_place.store(file < 0 ? 0 : Place{file, markOf(file), true}.word());
+    return;
+  }
+  const int next = file >= 0 ? file : openNothing();
+  debug_place.store(Place{before.number, kAnyFile, before.in_use && file >= 0}.word());
+  if (takesOver(before.number, next)) {
+    close(next);
+    debug_place.store(Place{before.number, markOf(before.number), file >= 0}.word());
+  } else {
+    debug_place.store(next < 0 ? 0 : Place{next, markOf(next), file >= 0}.word());
+    close(before.number);
+  }
+}
 
 }  // namespace
 

@@ -23,7 +23,8 @@ namespace zelt_gscl_V1 {
 /// transaction lock around the base API call (joinGroup the controller's write lock before it, vote none).
 class ZN_GSCL_EXPORT GSProvider : public GSClient {
  public:
-  /// `instance` tells the providers of one group on one node apart. `locname` null: "<gname>_<instance>".
+  /// `gname` is cut at 32 characters: see setGroupName. `instance` tells the providers of one group on one node
+  /// apart. `locname` null: "<gname>_<instance>".
   GSProvider(const char* gname, short instance, const char* locname);
   virtual ~GSProvider();
 

@@ -17,14 +17,16 @@ namespace zelt_gscl_V1 {
 /// notification.
 class ZN_GSCL_EXPORT GSSubscriber : public GSClient {
  public:
-  /// `how` says what to be told of: flags of wyx_subscription_ctrl_t.
+  /// `gname` is cut at 32 characters: see setGroupName. `how` says what to be told of: flags of
+  /// wyx_subscription_ctrl_t.
   GSSubscriber(const char* gname, wyx_subscription_ctrl_t how);
   /// Unsubscribes first; the result is dropped.
   virtual ~GSSubscriber();
 
   virtual GSClientType type();
 
-  /// wyx_subscribe; its result. Holds the controller's write lock and the client's transaction lock across the
+  /// wyx_subscribe; its result. When subscribed already, unsubscribe first: a second subscription takes the place of
+  /// the first, which goes on in the daemon, reaching nobody, until the session ends. Holds the controller's write lock and the client's transaction lock across the
   /// call.
   virtual wyx_rc_t subscribeGroup();
   /// wyx_unsubscribe; its result, or WYX_BAD_MEMBER_TOKEN when neither subscribing nor subscribed. Holds the

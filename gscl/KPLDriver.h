@@ -116,7 +116,7 @@ class ZN_GSCL_EXPORT KPLDriver {
   int _stopCode;   ///< read without the lock; changes from 0 by one atomic step, back to 0 under _stopLocker
   key_t sema_key;  ///< of the single-instance lock, after a failed InitKPL; else -1
   dae_error_detail_t err_detail;
-  GSString _stopMsg;  ///< guarded by _stopLocker
+  GSString _stopMsg;  ///< guarded by _stopLocker; empty where the code came from stopCancel: see getStopMsg
   GSRWLock _stopLocker;
 
   static KPLDriver* _theKPLDriver;

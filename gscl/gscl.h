@@ -2,7 +2,9 @@
 //
 // Namespaces. zelt_gscl_V1 has all classes; zelt_gscl_V2 has later versions of GSController and GSThread,
 // zelt_gscl_V3 one of GSController; zelt_gscl has enumerations and functions. Write `using namespace
-// zelt_gscl_V1;` and name the rest in full. Under two such lines these are ambiguous:
+// zelt_gscl_V1;` and name the rest in full; also, since the namespace of their arguments is looked into as well,
+// zelt_gscl::gscl_GSClientStateName, zelt_gscl::gscl_GSClientTypeName and zelt_gscl::gscl_GSWaitForRCName.
+// Under two such lines these are ambiguous:
 //   zelt_gscl and zelt_gscl_V1: GSGetAbsTime and what both have of gscl_... (names of codes, membership records),
 //     but no type and no value
 //   any two of the versions: GSController; zelt_gscl_V1 and zelt_gscl_V2: GSThread

@@ -6,6 +6,7 @@
 #include <errno.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 
 #include <map>
@@ -96,6 +97,11 @@ void obey(const std::string& command) {
   if (command == "again") report(start());
   if (command == "fork") run_child();
   if (command == "reap") check_reaper();
+  if (command == "trace elsewhere") {
+    gscl_set_debug_file((options["trace"] + ".elsewhere").c_str());
+    GStracef(0, "elsewhere\n");
+    report("traced");
+  }
   if (command == "exit") exit(0);
   if (command == "crash") kill(getpid(), SIGKILL);
 }
@@ -111,6 +117,12 @@ int main(int argc, char** argv) {
   }
   apply_options();
   if (options.contains("trace")) gscl_set_debug_file(options["trace"].c_str());
+  if (options.contains("limit")) {
+    rlimit limit;
+    getrlimit(RLIMIT_NOFILE, &limit);
+    limit.rlim_cur = static_cast<rlim_t>(number_in("limit", 0));
+    setrlimit(RLIMIT_NOFILE, &limit);
+  }
   const std::string result = start();
   const Datagram commands;  // made here, since start-up closes descriptors
   GStracef(0, "started\n");
