@@ -118,8 +118,8 @@ class ZN_GSCL_EXPORT GSClient : public GSLockableObject {
   /// no notification of the session comes any more: a wait without limit, under way then or begun later, sleeps
   /// on, also past a new initialize(); one with a limit ends with GS_WAITFOR_PENDING. If the client is used again
   /// meanwhile, the sleeper is woken by the answer to another thread's request and reports that one as its own: do
-  /// not use a client again while a thread waits on it. End the waits first (leave and wait for it), or give them a
-  /// time. goodbyeGroup() and unsubscribeGroup() make the client idle and wake nobody either:
+  /// not use a client again while a thread waits on it. End the waits first (leave and wait for it), or give them
+  /// a time. goodbyeGroup() and unsubscribeGroup() make the client idle and wake nobody either:
   /// GS_WAITFOR_NOT_A_MEMBER comes at the deadline or the next wake-up. A cancellation point while it sleeps.
   GSWaitForRC waitForNotification(GSWaitForTriggerType where, const timespec* abstime,
                                   wyx_notification_type_t* notify_type,

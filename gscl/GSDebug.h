@@ -76,8 +76,8 @@ ZN_GSCL_EXPORT gscl_tracef_rtn GSSetTraceRtn(gscl_tracef_rtn rtn);
 /// Closes the debug file and opens `path` for writing, truncated; a new file is writable by its owner alone. Null,
 /// or a path that cannot be opened, leaves none open, and the standard routines write to standard error. The file
 /// stays open until the next call, through dae_init too (which moves it above the descriptors that it closes, or,
-/// where the hard limit leaves no number there, spares it), and is not handed on to programs that are executed. The
-/// first test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call
+/// where the hard limit leaves no number there, spares it), and is not handed on to programs that are executed.
+/// The first test of a level does the same with GSCL_DBGFILE; to keep a file given here before that, call
 /// GSSetDebugLevel first.
 ///
 /// The descriptor, once there was one, belongs to the library for good and may change its number. Should the
@@ -89,8 +89,8 @@ ZN_GSCL_EXPORT void gscl_set_debug_file(const char* path);
 ///
 /// To be created on the stack. Name and depth belong to the process: objects of several threads at the same time
 /// share them. Depth counts also when nothing is written. When writing fails with an exception (no memory, or a
-/// routine that throws) name and depth are put back before it goes on; what is thrown while another exception leaves
-/// the function is dropped.
+/// routine that throws) name and depth are put back before it goes on; what is thrown while another exception
+/// leaves the function is dropped.
 class ZN_GSCL_EXPORT GSTraceFn {
  public:
   /// `name` is not copied; it outlives the object (a literal).

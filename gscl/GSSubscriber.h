@@ -25,9 +25,9 @@ class ZN_GSCL_EXPORT GSSubscriber : public GSClient {
 
   virtual GSClientType type();
 
-  /// wyx_subscribe; its result. When subscribed already, unsubscribe first: a second subscription takes the place of
-  /// the first, which goes on in the daemon, reaching nobody, until the session ends. Holds the controller's write lock and the client's transaction lock across the
-  /// call.
+  /// wyx_subscribe; its result. When subscribed already, unsubscribe first: a second subscription takes the place
+  /// of the first, which goes on in the daemon, reaching nobody, until the session ends. Holds the controller's
+  /// write lock and the client's transaction lock across the call.
   virtual wyx_rc_t subscribeGroup();
   /// wyx_unsubscribe; its result, or WYX_BAD_MEMBER_TOKEN when neither subscribing nor subscribed. Holds the
   /// client's transaction lock across the call.
