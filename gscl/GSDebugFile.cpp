@@ -64,9 +64,9 @@ int outputDescriptor() {
 }
 
 /// Not as one of the standard descriptors, to which others write, and never writable by everybody: a daemon's mask
-/// is 0.
+/// is 0. A line that is late, still on its way when the file is opened again and truncated, goes to its end.
 int openFile(const char* path) {
-  const int number = open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOCTTY, 0644);
+  const int number = open(path, O_WRONLY | O_CREAT | O_TRUNC | O_APPEND | O_CLOEXEC | O_NOCTTY, 0644);
   if (number < 0 || number > STDERR_FILENO) return number;
   const int higher = fcntl(number, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
   close(number);
