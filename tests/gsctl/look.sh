@@ -19,6 +19,8 @@ start_gsd
 [ "$(gsctl status | wc -l)" -eq 5 ] || die "status is not five lines"
 line 1 "there is no group 'crew'" gsctl members crew
 line 1 'a terminal is needed' gsctl top
+line 2 'nan is no number' gsctl groups --watch --interval nan
+line 1 'Bad file descriptor' eval 'gsctl groups >&-'
 
 # Who is waited for: ben votes when there is a file, once for each of two phases.
 gsctl record --all -o crew.record >record.log &
@@ -77,7 +79,7 @@ await gsctl wait crew --state ready --timeout 1
 kill -KILL $ben
 await_text '"failure"' crew.record
 await_text '"change":"left".*"why":"failed"' all.log
-has '"change":"state","event":[0-9]*,.*"value":"ready"' all.log || die "no state in what watch says of all"
+has '"change":"state","event":[0-9]*,"who":\[{"instance":1,.*"value":"ready"' all.log || die "no state in what watch says of all"
 await gsctl wait crew --leader --timeout 1
 kill -INT $recorder
 wait $recorder || die "record ends with status $?"
@@ -96,6 +98,8 @@ line 1 'is empty' gsctl chart empty
 line 1 'no recording of gsctl: line 1' gsctl chart ann.log
 sed 's/"version":1/"version":2/' crew.record >later
 line 1 'of version 2' gsctl chart later
+sed 's/"group":"crew"/"group_base64":"Y3Jldw=="/' crew.record >encoded
+cmp <(gsctl chart encoded --group crew) <(gsctl chart crew.record --group crew) || die "a name in base 64"
 sed '2s/"time_us":[0-9]*/"time_us":"noon"/' crew.record >wrong
 line 1 "line 2: 'time_us' is no number" gsctl chart wrong
 head -c -20 crew.record >cut

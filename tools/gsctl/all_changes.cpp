@@ -76,6 +76,7 @@ void AllChanges::take(const inspect::HappeningT& h) {
   const bool ended = is_departure(h.protocol) && h.members == 0;
   if (h.state_changed && !ended) {
     Change state{h.group, "state", h.event_number, {}, "", {}, {}};
+    if (h.who) state.who = {provider_of(*h.who)};
     if (h.state.size() == h.state_size) state.bytes = h.state;  // else it is not for this user
     say_(state);
   }

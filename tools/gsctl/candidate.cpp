@@ -5,6 +5,7 @@
 #include <cstring>
 #include <filesystem>
 
+#include "common/command_line.h"
 #include "tools/gsctl/keeper.h"
 #include "tools/gsctl/member.h"
 #include "tools/gsctl/output.h"
@@ -282,7 +283,9 @@ void Candidate::report(const char* change, const Json& more, const std::string& 
     return;
   }
   if (output_gone_) return;
-  Json object = {{"time", now_text()}, {"group", candidacy_.group}, {"change", change}};
+  Json object = {{"time", now_text()}};
+  set_bytes(object, "group", candidacy_.group);
+  object["change"] = change;
   object.update(more);
   try {
     print_json(object);
@@ -302,7 +305,7 @@ void add_candidacy_options(CLI::App& command, Candidacy& candidacy) {
   command.add_option("--grace", candidacy.grace, "From SIGTERM to SIGKILL, where CMD has to end")
       ->capture_default_str()
       ->type_name("SECONDS")
-      ->check(CLI::Range(0.0, 1e6));
+      ->check(platform::between(0.0, 1e6));
   command
       .add_option("--responsive", candidacy.responsive,
                   "Have the group expel this candidate when it hangs for so long, and CMD killed")

@@ -5,7 +5,9 @@
 namespace gsctl {
 
 Json to_json(const Change& change) {
-  Json object = {{"time", now_text()}, {"group", change.group}, {"change", change.what}};
+  Json object = {{"time", now_text()}};
+  set_bytes(object, "group", change.group);
+  object["change"] = change.what;
   if (change.event) object["event"] = *change.event;
   if (!change.who.empty()) object["who"] = to_json(change.who);
   if (!change.why.empty()) object["why"] = change.why;

@@ -3,6 +3,7 @@
 #include <cstring>
 #include <fstream>
 
+#include "common/command_line.h"
 #include "tools/gsctl/chart_drawing.h"
 #include "tools/gsctl/command.h"
 #include "tools/gsctl/output.h"
@@ -67,12 +68,16 @@ Run add_chart(CLI::App& command) {
       ->type_name("OUT.svg");
   command.add_option("--from", options->from, "Only from there on, counted from the recording's begin")
       ->type_name("SECONDS")
-      ->check(CLI::Range(0.0, kLongest));
+      ->check(platform::between(0.0, kLongest));
   command.add_option("--to", options->to, "Only up to there")
       ->type_name("SECONDS")
-      ->check(CLI::Range(0.0, kLongest));
+      ->check(platform::between(0.0, kLongest));
   command.add_option("--group", options->groups, "Only this one; may be given again")->type_name("GROUP");
-  return [options](const Settings&) { return chart(*options); };
+  return [options](const Settings& settings) {
+    if (settings.json) throw Error(kWrongUse, "a picture is no JSON: the recording is");
+    if (options->to && *options->to < options->from) throw Error(kWrongUse, "--to is before --from");
+    return chart(*options);
+  };
 }
 
 }  // namespace gsctl

@@ -17,7 +17,10 @@ struct Options {
 void print(const Options& options, const Settings& settings, const wyx_subscription_notification_t& n) {
   const std::string value = bytes_of(n.gs_state_value);
   if (settings.json) {
-    Json object = {{"group", options.group}, {"event", n.gs_event_seqnum}, {"length", value.size()}};
+    Json object = Json::object();
+    set_bytes(object, "group", options.group);
+    object["event"] = n.gs_event_seqnum;
+    object["length"] = value.size();
     set_bytes(object, "state", value);
     print_json(object);
   } else if (options.show) {

@@ -288,6 +288,7 @@ int join(const Options& asked, const Settings& settings) {
   end_when_lost(session, "the daemon went away, and the membership with it");
   Joined member(loop, options, settings);
   const auto interrupts = on_interrupt(loop, [&](int) { member.leave(); });
+  const auto reader = when_unread(loop, [&] { member.leave(); });
   member.until_joined(end_in_time(loop, settings, "time is over: the join is not approved yet"));
   member.ask_to_join(options.instance);
   loop.run();

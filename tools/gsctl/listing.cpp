@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include "common/command_line.h"
 #include "common/printable.h"
 #include "tools/gsctl/loop.h"
 #include "tools/gsctl/output.h"
@@ -45,7 +46,7 @@ void add_repetition(CLI::App& command, Repetition& repetition) {
   command.add_option("--interval", repetition.interval, "Between two times of --watch")
       ->capture_default_str()
       ->type_name("SECONDS")
-      ->check(CLI::Range(kShortest, kLongest));
+      ->check(platform::between(kShortest, kLongest));
 }
 
 int print_listing(const Settings& settings, const Repetition& repetition, const Look& look) {

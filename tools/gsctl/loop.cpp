@@ -1,5 +1,8 @@
 #include "tools/gsctl/loop.h"
 
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <cmath>
 #include <csignal>
 #include <utility>
@@ -85,6 +88,13 @@ std::vector<Loop::Handle> on_interrupt(Loop& loop, std::function<void(int signal
     handles.push_back(loop.on_signal(number, [callback, number] { callback(number); }));
   }
   return handles;
+}
+
+/// A pipe is readable at its writing end when nobody reads it any more.
+Loop::Handle when_unread(Loop& loop, Loop::Callback callback) {
+  struct stat output {};
+  if (fstat(STDOUT_FILENO, &output) != 0 || !S_ISFIFO(output.st_mode)) return nullptr;
+  return loop.on_readable(STDOUT_FILENO, std::move(callback));
 }
 
 }  // namespace gsctl

@@ -58,6 +58,9 @@ class Loop {
   std::exception_ptr error_;
 };
 
+/// Calls `callback` when standard output is a pipe that nobody reads any more; null where it is none.
+[[nodiscard]] Loop::Handle when_unread(Loop& loop, Loop::Callback callback);
+
 /// SIGINT, SIGTERM and SIGHUP (unless it was ignored from the start, as nohup has it) call `callback` with the
 /// number instead of ending the process.
 std::vector<Loop::Handle> on_interrupt(Loop& loop, std::function<void(int signal)> callback);

@@ -1,4 +1,7 @@
 // gsctl: looks at groups, changes them, and runs programs by what they decide.
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <csignal>
 #include <cstdlib>
 
@@ -24,7 +27,7 @@ void add_common(CLI::App& app, Settings& settings) {
       ->type_name("PATH");
   app.add_option("--timeout", settings.timeout, "Give up after so long, with status 4")
       ->type_name("SECONDS")
-      ->check(CLI::Range(0.001, kMaxTimeout));
+      ->check(platform::between(0.001, kMaxTimeout));
 }
 
 /// Programs that gsctl runs inherit it, and so reach the same daemon.
@@ -56,9 +59,20 @@ int run(int argc, char** argv) {
   return chosen(settings);
 }
 
+/// What is opened later must not be taken for standard input or output: a closed one reads as empty and refuses
+/// what is written.
+void occupy_standard_descriptors() {
+  while (true) {
+    const int number = open("/dev/null", O_RDONLY);
+    if (number < 0) return;
+    if (number > STDERR_FILENO) return void(close(number));
+  }
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
+  occupy_standard_descriptors();
   signal(SIGPIPE, SIG_IGN);
   try {
     return run(argc, argv);

@@ -127,8 +127,13 @@ class Proposer : public Member {
   }
 
   Json record(const char* what, std::uint64_t event) {
-    return {{"time", now_text()}, {"group", proposal_.group},   {"outcome", what},
-            {"event", event},     {"member", to_json(getId())}, {"attempts", attempts_}};
+    Json object = {{"time", now_text()}};
+    set_bytes(object, "group", proposal_.group);
+    object["outcome"] = what;
+    object["event"] = event;
+    object["member"] = to_json(getId());
+    object["attempts"] = attempts_;
+    return object;
   }
 
   /// Out of the group in order, so that nobody takes it for a failure.

@@ -26,9 +26,13 @@ const Json* find(const Json& object, const std::string& field) {
 
 std::string text_of(const Json& object, const std::string& field) {
   const Json* value = find(object, field);
-  if (value == nullptr) return "";
-  if (!value->is_string()) throw Foreign{"'" + field + "' is no text"};
-  return value->get<std::string>();
+  const Json* encoded = find(object, field + "_base64");
+  if (value == nullptr && encoded == nullptr) return "";
+  if (!(value != nullptr ? value : encoded)->is_string()) throw Foreign{"'" + field + "' is no text"};
+  if (value != nullptr) return value->get<std::string>();
+  const auto bytes = from_base64(encoded->get<std::string>());
+  if (!bytes) throw Foreign{"'" + field + "_base64' is no base 64"};
+  return *bytes;
 }
 
 template <typename Number>

@@ -76,6 +76,8 @@ std::string openmetrics(const inspect::DaemonT& daemon) {
 
 int run(const Options& options, const Settings& settings) {
   if (!options.openmetrics) return print_listing(settings, options.repetition, stats);
+  if (settings.json || options.repetition.watch)
+    throw Error(kWrongUse, "--openmetrics goes without --json and --watch");
   print_raw(platform::printable(openmetrics(connected(settings).daemon()), "\n"));
   return kDone;
 }

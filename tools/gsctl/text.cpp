@@ -84,6 +84,23 @@ Json to_json(const Members& members) {
   return list;
 }
 
+std::optional<std::string> from_base64(std::string_view text) {
+  std::string bytes;
+  if (text.size() % 4 != 0) return std::nullopt;
+  for (; !text.empty(); text.remove_prefix(4)) {
+    const std::size_t digits = text.size() > 4 ? 4 : text.substr(0, 4).find_last_not_of('=') + 1;
+    unsigned four = 0;
+    for (std::size_t k = 0; k < 4; ++k) {
+      const std::size_t value = k < digits ? kBase64.find(text[k]) : 0;
+      if (value == kBase64.npos) return std::nullopt;
+      four = four << 6 | static_cast<unsigned>(value);
+    }
+    if (digits < 2) return std::nullopt;
+    for (std::size_t k = 0; k + 1 < digits; ++k) bytes += static_cast<char>(four >> (16 - 8 * k) & 255);
+  }
+  return bytes;
+}
+
 void set_bytes(Json& object, const std::string& name, std::string_view bytes) {
   if (platform::utf8_length(bytes) == bytes.size()) {
     object[name] = std::string(bytes);
@@ -138,7 +155,7 @@ std::string explain(wyx_rc_t rc) {
     case WYX_VOTE_NOT_EXPECTED:
       return "too late: the vote is over";
     case WYX_BAD_PARAMETER:
-      return "a name or value that the daemon does not take: values are at most 64 KiB";
+      return "a name, value or list that the daemon does not take: values are at most 64 KiB, lists 4,096 ids";
     default:
       return std::string("refused with ") + zelt_gscl::gscl_rc_name(rc);
   }

@@ -26,6 +26,8 @@ std::string to_text(const Members& members);
 Json to_json(const wyx_provider_t& id);
 Json to_json(const Members& members);
 
+/// What this is the base 64 of; nothing where it is none.
+std::optional<std::string> from_base64(std::string_view text);
 /// Sets object[name] where the bytes are UTF-8, else object[name + "_base64"].
 void set_bytes(Json& object, const std::string& name, std::string_view bytes);
 /// In quotation marks, for a line; what is long is cut and its length said.

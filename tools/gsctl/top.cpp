@@ -4,6 +4,7 @@
 
 #include <csignal>
 
+#include "common/command_line.h"
 #include "tools/gsctl/screen.h"
 #include "tools/gsctl/session.h"
 #include "tools/gsctl/top_view.h"
@@ -90,7 +91,7 @@ Run add_top(CLI::App& command) {
   command.add_option("--interval", *interval, "Between two looks")
       ->capture_default_str()
       ->type_name("SECONDS")
-      ->check(CLI::Range(kShortest, kLongest));
+      ->check(platform::between(kShortest, kLongest));
   return [interval](const Settings& settings) {
     if (settings.json) throw Error(kWrongUse, "top is for people: gsctl groups --watch --json is for scripts");
     return Top(*interval).run(settings);

@@ -55,7 +55,8 @@ class Wait {
 
   void done() {
     if (settings_.json) {
-      Json object = {{"time", now_text()}, {"group", options_.group}};
+      Json object = {{"time", now_text()}};
+      set_bytes(object, "group", options_.group);
       if (event_) object["event"] = *event_;
       object["members"] = to_json(options_.gone ? Members() : members_);
       print_json(object);
@@ -76,8 +77,6 @@ class Wait {
 
 int wait(const Options& options, const Settings& settings) {
   check_group(options.group);
-  if (options.members && *options.members == 0)
-    throw Error(kWrongUse, "--members: at least 1; for none, use --gone");
   Loop loop;
   Session session(loop);
   session.open();
@@ -95,7 +94,9 @@ Run add_wait(CLI::App& command) {
   auto options = std::make_shared<Options>();
   command.add_option("GROUP", options->group, "Its name")->type_name("")->required();
   CLI::Option_group* until = command.add_option_group("Until");
-  until->add_option("--members", options->members, "It has so many members, or more")->type_name("N");
+  until->add_option("--members", options->members, "It has so many members, or more; for none, --gone")
+      ->type_name("N")
+      ->check(CLI::Range(1, 1'000'000));
   until->add_option("--state", options->state, "Its state value is this")->type_name("TEXT");
   until->add_flag("--gone", options->gone, "There is no such group");
   until->add_flag("--leader", options->leader, "It has an oldest member, whose id is printed");

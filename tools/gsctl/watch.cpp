@@ -1,7 +1,4 @@
 // gsctl watch: a line, and if wanted a program, for each change of groups.
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <list>
 
 #include "tools/gsctl/all_changes.h"
@@ -21,12 +18,7 @@ struct Options {
   std::string command;
 };
 
-/// A pipe is readable at its writing end when nobody reads it any more.
-Loop::Handle end_with_reader(Loop& loop) {
-  struct stat output {};
-  if (fstat(STDOUT_FILENO, &output) != 0 || !S_ISFIFO(output.st_mode)) return nullptr;
-  return loop.on_readable(STDOUT_FILENO, [] { throw OutputGone(); });
-}
+[[noreturn]] void end_unread() { throw OutputGone(); }
 
 class Watch {
  public:
@@ -63,7 +55,7 @@ void Watch::begin() {
       subscribe();
     });
   });
-  reader_ = end_with_reader(loop_);
+  reader_ = when_unread(loop_, end_unread);
   subscribe();
 }
 
@@ -142,7 +134,7 @@ void watch_all(const Options& options, const Settings& settings) {
     print(change, settings.json);
     if (!options.command.empty()) jobs.add(job_of(change, options.command));
   });
-  const auto reader = end_with_reader(loop);
+  const auto reader = when_unread(loop, end_unread);
   run(loop, settings);
 }
 

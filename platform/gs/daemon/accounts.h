@@ -61,6 +61,7 @@ class Accounts {
   Accounts& operator=(const Accounts&) = delete;
 
   void set_limits(const ClientLimits& limits) { limits_ = limits; }
+  const ClientLimits& limits() const { return limits_; }
 
   /// Why a connection that is counted already cannot stay; null: it can.
   const char* problem_with_connection(const Account& account) const;

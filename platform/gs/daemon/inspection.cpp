@@ -11,7 +11,7 @@ namespace {
 
 constexpr std::size_t kGroupsAtOnce = 256;
 constexpr std::size_t kEntriesAtOnce = 1024;
-constexpr std::size_t kContentsAtOnce = 512 * 1024;  // bytes of state values
+constexpr std::size_t kContentsAtOnce = 512 * 1024;  // bytes of state values, members and voters
 
 using inspect::ReportT;
 template <typename T>
@@ -126,17 +126,20 @@ std::unique_ptr<inspect::AttributesT> attributes_of(const GroupAttributes& from)
   return to;
 }
 
-List<inspect::VoterT> voters_of(const std::vector<MissingVoter>& from) {
+/// What is too much for one page is left without a name: a report must not become more than its reader takes.
+List<inspect::VoterT> voters_of(const std::vector<MissingVoter>& from, std::size_t& page) {
   List<inspect::VoterT> voters;
   for (const MissingVoter& voter : from) {
     voters.push_back(std::make_unique<inspect::VoterT>());
     voters.back()->id = std::make_unique<inspect::Id>(id_of(voter.id));
-    voters.back()->name = voter.local_name;
+    if (page < kContentsAtOnce) voters.back()->name = voter.local_name;
+    page += sizeof(inspect::VoterT) + voters.back()->name.size();
   }
   return voters;
 }
 
-std::unique_ptr<inspect::ProtocolT> protocol_of(const ProtocolStatus& from, const Facts& facts) {
+std::unique_ptr<inspect::ProtocolT> protocol_of(const ProtocolStatus& from, const Facts& facts,
+                                                std::size_t& page) {
   auto to = std::make_unique<inspect::ProtocolT>();
   to->kind = from.kind;
   to->number = from.number;
@@ -146,24 +149,26 @@ std::unique_ptr<inspect::ProtocolT> protocol_of(const ProtocolStatus& from, cons
   to->time_limit = from.terms.time_limit;
   to->age_ms = age(from.since, facts);
   to->phase_age_ms = age(from.phase_since, facts);
-  to->voted = voters_of(from.voted);
-  to->missing = voters_of(from.missing);
+  to->missing = voters_of(from.missing, page);
+  to->voted = voters_of(from.voted, page);
   to->changing = ids_of(from.changing);
   return to;
 }
 
-std::unique_ptr<inspect::GroupT> group_of(const GroupStatus& from, const Facts& facts, bool contents) {
+std::unique_ptr<inspect::GroupT> group_of(const GroupStatus& from, const Facts& facts, bool contents,
+                                          std::size_t& page) {
   auto to = std::make_unique<inspect::GroupT>();
   to->name = from.name;
   if (from.attributes) to->attributes = attributes_of(*from.attributes);
   to->members = ids_of(from.members);
   to->state_size = from.state->size();
   if (contents) to->state = *from.state;
+  page += to->state.size() + to->members.size() * sizeof(inspect::Id);
   to->event_number = from.seqnum;
   to->age_ms = age(from.since, facts);
   to->subscribers = from.subscribers;
   to->waiting = from.waiting;
-  if (from.running) to->running = protocol_of(*from.running, facts);
+  if (from.running) to->running = protocol_of(*from.running, facts, page);
   return to;
 }
 
@@ -205,11 +210,10 @@ class WantedGroups {
 
 void report_groups(const inspect::AskT& ask, const Facts& facts, ReportT& report) {
   WantedGroups wanted(ask, facts.engine);
-  std::size_t contents = 0;
+  std::size_t page = 0;
   while (const auto group = wanted.next()) {
-    report.groups.push_back(group_of(*group, facts, ask.contents));
-    contents += ask.contents ? group->state->size() : 0;
-    if (report.groups.size() < kGroupsAtOnce && contents < kContentsAtOnce) continue;
+    report.groups.push_back(group_of(*group, facts, ask.contents, page));
+    if (report.groups.size() < kGroupsAtOnce && page < kContentsAtOnce) continue;
     report.more = true;
     report.next_group = wanted.after();
     return;

@@ -78,12 +78,17 @@ void SessionLayer::feed_taps() {
   for (const ConnectionId id : taps_.ids()) feed_tap(id);
 }
 
+/// With so much for each, all taps together bring no user near the bound over which connections are closed.
+std::size_t SessionLayer::tap_bound() const {
+  return std::min(kTapBound, accounts_.limits().user_queue_bound / (2 * Taps::kMost));
+}
+
 /// Only what it has room for; what it misses is counted, and told when it has taken something.
 void SessionLayer::feed_tap(ConnectionId id) {
   for (;;) {
     const Connection* connection = find(id);
     if (connection == nullptr) return;
-    if (connection->out.bytes() > kTapBound) return void(counters_.missed += taps_.drop(id));
+    if (connection->out.bytes() > tap_bound()) return void(counters_.missed += taps_.drop(id));
     const inspect::ReportT report = taps_.take(id);
     if (report.happenings.empty() && report.missed == 0) return;
     send(id, wire::Report{inspect::write(report)});

@@ -202,6 +202,7 @@ class SessionLayer : private PingSink, private Replica {
   void begin_tap(ConnectionId id, Connection& connection, const inspect::AskT& ask);
   void remove_tap(ConnectionId id);
   void feed_taps_soon();
+  std::size_t tap_bound() const;
   void feed_taps();
   void feed_tap(ConnectionId id);
   std::vector<SessionStatus> session_statuses() const;
