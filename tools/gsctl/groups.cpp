@@ -5,17 +5,22 @@
 namespace gsctl {
 namespace {
 
-Listing groups(gs::inspect::Inspector& inspector) {
-  Listing listing;
+platform::Row row_of(const inspect::GroupT& group) {
+  return {group.name,
+          std::to_string(group.members.size()),
+          std::to_string(group.subscribers),
+          std::to_string(group.waiting),
+          size_text(group.state_size),
+          std::to_string(group.event_number),
+          duration_text(group.age_ms),
+          to_text(group.running),
+          group.running ? to_text(group.running->missing) : "-"};
+}
+
+void groups(gs::inspect::Inspector& inspector, Listing& listing) {
   listing.rows = {{"Group", "Members", "Subscribers", "Waiting", "State", "Event", "Age", "Runs", "Waits for"}};
-  for (const auto& group : inspector.groups()) {
-    listing.rows.push_back({group->name, std::to_string(group->members.size()), std::to_string(group->subscribers),
-                            std::to_string(group->waiting), size_text(group->state_size),
-                            std::to_string(group->event_number), duration_text(group->age_ms),
-                            to_text(group->running), group->running ? to_text(group->running->missing) : "-"});
-    listing.objects.push_back(to_json(*group));
-  }
-  return listing;
+  for (const auto& group : listing.for_scripts ? inspector.groups() : inspector.groups_in_brief())
+    listing.add([&] { return row_of(*group); }, [&] { return to_json(*group); });
 }
 
 }  // namespace

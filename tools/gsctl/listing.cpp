@@ -37,6 +37,12 @@ void print_again(Listing listing, const Settings& settings, bool first) {
   print(listing, settings);
 }
 
+Listing seen(const Look& look, gs::inspect::Inspector& inspector, const Settings& settings) {
+  Listing listing{settings.json};
+  look(inspector, listing);
+  return listing;
+}
+
 }  // namespace
 
 void add_repetition(CLI::App& command, Repetition& repetition) {
@@ -52,7 +58,7 @@ void add_repetition(CLI::App& command, Repetition& repetition) {
 int print_listing(const Settings& settings, const Repetition& repetition, const Look& look) {
   gs::inspect::Inspector inspector = connected(settings);
   if (!repetition.watch) {
-    print(look(inspector), settings);
+    print(seen(look, inspector, settings), settings);
     return kDone;
   }
   Loop loop;
@@ -60,7 +66,7 @@ int print_listing(const Settings& settings, const Repetition& repetition, const 
   Loop::Handle next;
   bool first = true;
   const std::function<void()> show = [&] {
-    print_again(look(inspector), settings, first);
+    print_again(seen(look, inspector, settings), settings, first);
     first = false;
     next = loop.after(std::chrono::duration<double>(repetition.interval), show);
   };

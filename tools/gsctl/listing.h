@@ -10,10 +10,17 @@
 
 namespace gsctl {
 
-/// The same for people and for scripts.
+/// A table for people, or objects for scripts.
 struct Listing {
-  std::vector<platform::Row> rows;  // the headings first
-  std::vector<Json> objects;
+  bool for_scripts = false;
+  std::vector<platform::Row> rows = {};  // the headings first
+  std::vector<Json> objects = {};
+
+  /// What `row` makes, or what `object` does.
+  template <typename MakeRow, typename MakeObject>
+  void add(const MakeRow& row, const MakeObject& object) {
+    for_scripts ? objects.push_back(object()) : rows.push_back(row());
+  }
 };
 
 struct Repetition {
@@ -24,7 +31,8 @@ struct Repetition {
 /// --watch and --interval.
 void add_repetition(CLI::App& command, Repetition& repetition);
 
-using Look = std::function<Listing(gs::inspect::Inspector&)>;
+/// Fills the listing.
+using Look = std::function<void(gs::inspect::Inspector&, Listing&)>;
 
 /// Prints what `look` makes of the daemon.
 int print_listing(const Settings& settings, const Repetition& repetition, const Look& look);

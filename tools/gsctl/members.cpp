@@ -28,24 +28,31 @@ std::string vote_of(const inspect::GroupT& group, const inspect::MemberT& member
 void add(Listing& listing, const inspect::GroupT& group, const inspect::MemberT& member) {
   const std::string vote = vote_of(group, member);
   const inspect::ProcessT* process = member.process.get();
-  listing.rows.push_back({to_text(member.id), member.name.empty() ? "-" : member.name, member.state,
-                          process ? process->program : "-", process ? std::to_string(process->pid) : "-",
-                          process ? user_text(process->uid) : "-", duration_text(member.age_ms), vote,
-                          member.responsive ? "yes" : "no"});
-  Json object = to_json(member);
-  object["vote"] = vote == "-" ? Json(nullptr) : Json(vote);
-  listing.objects.push_back(std::move(object));
+  const auto row = [&]() -> platform::Row {
+    return {to_text(member.id),
+            member.name.empty() ? "-" : member.name,
+            member.state,
+            process ? process->program : "-",
+            process ? std::to_string(process->pid) : "-",
+            process ? user_text(process->uid) : "-",
+            duration_text(member.age_ms),
+            vote,
+            member.responsive ? "yes" : "no"};
+  };
+  listing.add(row, [&] {
+    Json object = to_json(member);
+    object["vote"] = vote == "-" ? Json(nullptr) : Json(vote);
+    return object;
+  });
 }
 
-Listing members(gs::inspect::Inspector& inspector, const std::string& name) {
+void members(gs::inspect::Inspector& inspector, const std::string& name, Listing& listing) {
   const auto group = inspector.groups({name});
   if (group.empty()) {
     throw Error(kRefused, "there is no group '" + name + "': gsctl groups lists those that there are");
   }
-  Listing listing;
   listing.rows = {{"Member", "Name", "State", "Program", "PID", "User", "Age", "Vote", "Responsive"}};
   for (const auto& member : inspector.members(name)) add(listing, *group.front(), *member);
-  return listing;
 }
 
 }  // namespace
@@ -56,8 +63,9 @@ Run add_members(CLI::App& command) {
   add_repetition(command, options->repetition);
   return [options](const Settings& settings) {
     check_group(options->group);
-    return print_listing(settings, options->repetition,
-                         [&](gs::inspect::Inspector& inspector) { return members(inspector, options->group); });
+    return print_listing(settings, options->repetition, [&](gs::inspect::Inspector& inspector, Listing& listing) {
+      members(inspector, options->group, listing);
+    });
   };
 }
 

@@ -5,17 +5,17 @@
 namespace gsctl {
 namespace {
 
-Listing nodes(gs::inspect::Inspector& inspector) {
-  Listing listing;
+void nodes(gs::inspect::Inspector& inspector, Listing& listing) {
   listing.rows = {{"Node", "Epoch", "Here", "Master", "Adapters"}};
   for (const auto& node : inspector.nodes()) {
-    std::string adapters;
-    for (const std::string& adapter : node->adapters) adapters += (adapters.empty() ? "" : ", ") + adapter;
-    listing.rows.push_back({std::to_string(node->number), std::to_string(node->epoch), node->here ? "yes" : "no",
-                            node->master ? "yes" : "no", adapters.empty() ? "-" : adapters});
-    listing.objects.push_back(to_json(*node));
+    const auto row = [&]() -> platform::Row {
+      std::string adapters;
+      for (const std::string& adapter : node->adapters) adapters += (adapters.empty() ? "" : ", ") + adapter;
+      return {std::to_string(node->number), std::to_string(node->epoch), node->here ? "yes" : "no",
+              node->master ? "yes" : "no", adapters.empty() ? "-" : adapters};
+    };
+    listing.add(row, [&] { return to_json(*node); });
   }
-  return listing;
 }
 
 }  // namespace

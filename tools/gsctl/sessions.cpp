@@ -5,20 +5,25 @@
 namespace gsctl {
 namespace {
 
-Listing sessions(gs::inspect::Inspector& inspector) {
-  Listing listing;
+void sessions(gs::inspect::Inspector& inspector, Listing& listing) {
   listing.rows = {
       {"Session", "Program", "PID", "User", "Members", "Subscribers", "To read", "Answers", "Age", "Responsive"}};
   for (const auto& session : inspector.sessions()) {
-    const inspect::ProcessT* process = session->process.get();
-    listing.rows.push_back({std::to_string(session->number), process ? process->program : "-",
-                            process ? std::to_string(process->pid) : "-", process ? user_text(process->uid) : "-",
-                            std::to_string(session->providers), std::to_string(session->subscribers),
-                            size_text(session->notification_bytes), size_text(session->answer_bytes),
-                            duration_text(session->age_ms), session->responsive ? "yes" : "no"});
-    listing.objects.push_back(to_json(*session));
+    const auto row = [&]() -> platform::Row {
+      const inspect::ProcessT* process = session->process.get();
+      return {std::to_string(session->number),
+              process ? process->program : "-",
+              process ? std::to_string(process->pid) : "-",
+              process ? user_text(process->uid) : "-",
+              std::to_string(session->providers),
+              std::to_string(session->subscribers),
+              size_text(session->notification_bytes),
+              size_text(session->answer_bytes),
+              duration_text(session->age_ms),
+              session->responsive ? "yes" : "no"};
+    };
+    listing.add(row, [&] { return to_json(*session); });
   }
-  return listing;
 }
 
 }  // namespace

@@ -12,15 +12,15 @@ struct Options {
   Repetition repetition;
 };
 
-Listing stats(gs::inspect::Inspector& inspector) {
-  Listing listing;
+void stats(gs::inspect::Inspector& inspector, Listing& listing) {
   listing.rows = {{"Name", "Value", "Unit", "Type", "What it counts"}};
   for (const auto& count : inspector.daemon().counts) {
-    listing.rows.push_back({count->name, std::to_string(count->value), count->unit.empty() ? "-" : count->unit,
-                            count->gauge ? "gauge" : "counter", count->help});
-    listing.objects.push_back(to_json(*count));
+    const auto row = [&]() -> platform::Row {
+      return {count->name, std::to_string(count->value), count->unit.empty() ? "-" : count->unit,
+              count->gauge ? "gauge" : "counter", count->help};
+    };
+    listing.add(row, [&] { return to_json(*count); });
   }
-  return listing;
 }
 
 /// A name may have letters, digits and underscores only.

@@ -37,6 +37,7 @@ void TopSource::begin() {
   asks_ = {};
   asks_.push_back(question(inspect::What::Daemon));
   asks_.push_back(question(inspect::What::Groups));
+  asks_.back().brief = true;
   if (wanted.sessions) asks_.push_back(question(inspect::What::Sessions));
   if (!wanted.members_of.empty()) {
     asks_.push_back(question(inspect::What::Members));

@@ -155,14 +155,14 @@ std::unique_ptr<inspect::ProtocolT> protocol_of(const ProtocolStatus& from, cons
   return to;
 }
 
-std::unique_ptr<inspect::GroupT> group_of(const GroupStatus& from, const Facts& facts, bool contents,
+std::unique_ptr<inspect::GroupT> group_of(const GroupStatus& from, const Facts& facts, const inspect::AskT& ask,
                                           std::size_t& page) {
   auto to = std::make_unique<inspect::GroupT>();
   to->name = from.name;
-  if (from.attributes) to->attributes = attributes_of(*from.attributes);
+  if (from.attributes && !ask.brief) to->attributes = attributes_of(*from.attributes);
   to->members = ids_of(from.members);
   to->state_size = from.state->size();
-  if (contents) to->state = *from.state;
+  if (ask.contents) to->state = *from.state;
   page += to->state.size() + to->members.size() * sizeof(inspect::Id);
   to->event_number = from.seqnum;
   to->age_ms = age(from.since, facts);
@@ -212,7 +212,7 @@ void report_groups(const inspect::AskT& ask, const Facts& facts, ReportT& report
   WantedGroups wanted(ask, facts.engine);
   std::size_t page = 0;
   while (const auto group = wanted.next()) {
-    report.groups.push_back(group_of(*group, facts, ask.contents, page));
+    report.groups.push_back(group_of(*group, facts, ask, page));
     if (report.groups.size() < kGroupsAtOnce && page < kContentsAtOnce) continue;
     report.more = true;
     report.next_group = wanted.after();

@@ -118,6 +118,13 @@ DaemonT Inspector::daemon() {
   return report.daemon ? *report.daemon : DaemonT();
 }
 
+Inspector::List<GroupT> Inspector::groups_in_brief() {
+  AskT ask;
+  ask.what = What::Groups;
+  ask.brief = true;
+  return all(std::move(ask), &ReportT::groups);
+}
+
 Inspector::List<GroupT> Inspector::groups(const std::vector<std::string>& names, bool contents) {
   AskT ask;
   ask.what = What::Groups;

@@ -44,6 +44,8 @@ class Inspector {
   // Lists are asked for in pages: each is as it was when its page was made.
   /// By name; of `names` those that are there, all where there are none. `contents`: their state values too.
   List<GroupT> groups(const std::vector<std::string>& names = {}, bool contents = false);
+  /// All of them, without their attributes.
+  List<GroupT> groups_in_brief();
   /// Oldest first, those who join last. Empty: the group is not there.
   List<MemberT> members(const std::string& group);
   List<SubscriberT> subscribers(const std::vector<std::string>& groups = {});
