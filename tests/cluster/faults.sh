@@ -90,6 +90,9 @@ start_daemon $here $far
 join $here $far
 tell 1 "state red"
 heard 'the state is "red"' $here $far
+"$cluster" on "$n" "$bin/gsctl" watch crew >watch.log 2>>errors.log &
+watch=$!
+await ' now "red"' watch.log
 
 # Cut off: the others go on; who has no quorum is told, and not that the others have failed.
 "$cluster" cut "${far// /,}"
@@ -101,6 +104,10 @@ tell 1 "state blue"
 heard 'the state is "blue"' $here
 "$cluster" heal
 await_serving $far
+await ' now "blue"' watch.log
+[ "$(grep -o ' \(now\|lost\|found\|left\) ' watch.log | tr -d '\n')" = " now  lost  found  now " ] ||
+  die "who watches a host without quorum is told otherwise: $(cat watch.log)"
+kill $watch
 join $far
 
 # A daemon that hangs is left out as soon as something waits for it; awake again, it tells its clients and comes back.

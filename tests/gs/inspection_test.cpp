@@ -115,7 +115,7 @@ TEST_F(Inspection, LongLists_ComeInPagesThatLeaveOutNothing) {
 }
 
 TEST_F(Inspection, TapThatDoesNotRead_MissesWhatItIsToldTheNumberOf_AndNobodyFeelsIt) {
-  Asker slow(daemon), other(daemon);
+  Asker slow(daemon), other(daemon), approvals(daemon);
   MemoryClient member(daemon);
   inspect::AskT tap;
   tap.what = What::Tap;
@@ -124,9 +124,13 @@ TEST_F(Inspection, TapThatDoesNotRead_MissesWhatItIsToldTheNumberOf_AndNobodyFee
   slow.ask(tap);
   tap.groups = {"other"};
   other.ask(tap);
+  tap.groups = {};
+  tap.kinds = {Kind::Approved, static_cast<Kind>(200)};
+  approvals.ask(tap);
   ASSERT_EQ(member.join(1, 1), WYX_OK);
   daemon.pass(1s);
   EXPECT_EQ(slow.happened(), "Request group;Begin group;Approved group;");
+  EXPECT_EQ(approvals.happened(), "Approved group;");
 
   daemon.transport.wires.at(slow.id).full = true;
   const int changes = 100;
@@ -148,6 +152,8 @@ TEST_F(Inspection, TapThatDoesNotRead_MissesWhatItIsToldTheNumberOf_AndNobodyFee
   EXPECT_EQ(other.happened(), "");
   daemon.say(slow.id, wire::Inspect{inspect::write(tap)});
   EXPECT_TRUE(daemon.closed(slow.id));
+  daemon.ordering.fail("an event could not be applied");
+  EXPECT_TRUE(daemon.closed(approvals.id)) << "what it has seen does not go on";
 }
 
 TEST_F(Inspection, QuestionWhosePartsAreTheSameBytes_IsMalformed) {

@@ -41,7 +41,7 @@ printf 'nonsense\nstate no\nsay hello\nstate yes\n' >&9
 expect 0 '' "$gsctl" wait crew --state yes
 await_text 'message 1/1 "hello"' ann.log
 has '"nonsense": say state TEXT' ann.log && has 'rejected 1/1 .*"not by 1/1"' ann.log || die "orders"
-await_text '^state [0-9]+ \[\] \[\]  yes$' exec.log
+await_text '^state [0-9]+ \[1/1\] \[\]  yes$' exec.log
 
 # Out of the group in each way, and why.
 expect 1 'no such member' "$gsctl" expel crew 77/1
@@ -62,11 +62,13 @@ await_text '"why":"left","members":\[\]' watch.log
 await_text '"change":"ended"' watch.log
 
 # The daemon goes and comes back: who watches stays, who is a member or waits ends.
-"$gsctl" wait crew --members 9 2>/dev/null &
-waiting=$!
 "$gsctl" join other </dev/null >other.log 2>&1 &
 other=$!
 await_text joined other.log
+"$gsctl" wait other --members 9 2>/dev/null &
+waiting=$!
+subscribed() { "$gsctl" groups --json | grep -q '"group":"other".*"subscribers":1'; }
+await subscribed
 kill -KILL $gsd
 wait $other
 [ $? -eq 5 ] || die "join without a daemon"
@@ -77,7 +79,7 @@ start_gsd
 await_text '"change":"found"' watch.log
 : >watch.log
 "$gsctl" join crew --vote reject --name bob </dev/null >bob.log &
-await_text '"change":"now".*"members":\[\{' watch.log
+await_text '"change":"joined".*"members":\[\{' watch.log
 expect 1 'rejected by bob' "$gsctl" set crew x
 
 # Nobody reads any more: quiet, and at once; and nothing of others reaches a terminal as it is.

@@ -283,7 +283,7 @@ void Candidate::report(const char* change, const Json& more, const std::string& 
     return;
   }
   if (output_gone_) return;
-  Json object = {{"time", now_text()}};
+  Json object = {{"time", utc_text()}};
   set_bytes(object, "group", candidacy_.group);
   object["change"] = change;
   object.update(more);

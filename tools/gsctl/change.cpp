@@ -5,7 +5,7 @@
 namespace gsctl {
 
 Json to_json(const Change& change) {
-  Json object = {{"time", now_text()}};
+  Json object = {{"time", utc_text(change.time)}};
   set_bytes(object, "group", change.group);
   object["change"] = change.what;
   if (change.event) object["event"] = *change.event;
@@ -17,7 +17,7 @@ Json to_json(const Change& change) {
 }
 
 std::string to_line(const Change& change) {
-  std::string text = clock_text() + " " + change.group + " ";
+  std::string text = clock_text(change.time) + " " + change.group + " ";
   text += change.event ? "#" + std::to_string(*change.event) : "-";
   text += " " + change.what;
   if (!change.who.empty()) text += " " + to_text(change.who);

@@ -18,6 +18,7 @@ struct Change {
   std::string why;
   std::optional<Members> members;    // after it
   std::optional<std::string> bytes;  // a state value, or a message
+  WallTime time = std::chrono::system_clock::now();
 };
 
 Json to_json(const Change& change);

@@ -3,6 +3,7 @@
 #include <cstdlib>
 #include <string_view>
 
+#include "tools/gsctl/session.h"
 #include "wire/endpoint.h"
 
 namespace gsctl {
@@ -20,6 +21,13 @@ gs::inspect::Inspector connected(const Settings& settings) {
   if (!settings.timeout) return gs::inspect::Inspector(daemon_path());
   const std::chrono::duration<double> limit(*settings.timeout);
   return gs::inspect::Inspector(daemon_path(), std::chrono::ceil<std::chrono::milliseconds>(limit));
+}
+
+void check_groups(const std::vector<std::string>& groups, const std::string& instead) {
+  for (const std::string& group : groups) check_group(group);
+  if (groups.size() > gs::inspect::kMaxGroupsAsked) {
+    throw Error(kWrongUse, "at most " + std::to_string(gs::inspect::kMaxGroupsAsked) + " groups, " + instead);
+  }
 }
 
 Error explained(const gs::inspect::InspectError& error) {

@@ -28,7 +28,7 @@ void print(const Listing& listing, const Settings& settings) {
 /// A round of --watch. Tables follow one another where they cannot be repainted.
 void print_again(Listing listing, const Settings& settings, bool first) {
   if (settings.json) {
-    for (Json& object : listing.objects) object["time"] = now_text();
+    for (Json& object : listing.objects) object["time"] = utc_text();
   } else if (isatty(STDOUT_FILENO) != 0) {
     print_raw(kClearScreen);
   } else if (!first) {

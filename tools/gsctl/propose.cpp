@@ -127,7 +127,7 @@ class Proposer : public Member {
   }
 
   Json record(const char* what, std::uint64_t event) {
-    Json object = {{"time", now_text()}};
+    Json object = {{"time", utc_text()}};
     set_bytes(object, "group", proposal_.group);
     object["outcome"] = what;
     object["event"] = event;

@@ -1,6 +1,5 @@
 // gsctl record: what happens in groups, into a file.
 #include <fcntl.h>
-#include <poll.h>
 
 #include <cerrno>
 #include <chrono>
@@ -83,26 +82,15 @@ std::string lines_of(gs::inspect::Inspector& tap, std::uint64_t* count) {
   return lines;
 }
 
-/// The first report says that from then on nothing is left out.
-void await_begin(gs::inspect::Inspector& tap) {
-  constexpr int kPatience = 10'000;  // milliseconds
-  pollfd told{tap.fd(), POLLIN, 0};
-  if (poll(&told, 1, kPatience) <= 0) throw Error(kTimeOver, "the daemon does not answer in time: see its log");
-}
-
 void check(const Options& options) {
   if (options.all == !options.groups.empty()) throw Error(kWrongUse, "give the GROUPs to record, or --all");
-  for (const std::string& group : options.groups) check_group(group);
-  if (options.groups.size() > inspect::kMaxGroupsAsked) {
-    throw Error(kWrongUse, "at most " + std::to_string(inspect::kMaxGroupsAsked) + " groups, or --all");
-  }
+  check_groups(options.groups, "or --all");
 }
 
 int record(const Options& options, const Settings& settings) {
   check(options);
   gs::inspect::Inspector tap = connected(Settings{});
   tap.tap(options.groups, options.contents);
-  await_begin(tap);
   const Recording start = beginning(options, Settings{});
   Output output(options.file);
   output.write(line_of(header_json(start)));

@@ -33,10 +33,9 @@ bool parse(std::string_view text, short* number) {
   return error == std::errc() && end == text.data() + text.size();
 }
 
-/// The time now in this form and, after it, milliseconds.
-std::string time_text(const char* form, tm* (*convert)(const time_t*, tm*)) {
-  const auto now = std::chrono::system_clock::now().time_since_epoch();
-  const auto milliseconds = std::chrono::duration_cast<std::chrono::milliseconds>(now).count();
+/// A time in this form and, after it, milliseconds.
+std::string time_text(WallTime time, const char* form, tm* (*convert)(const time_t*, tm*)) {
+  const auto milliseconds = std::chrono::duration_cast<std::chrono::milliseconds>(time.time_since_epoch()).count();
   const time_t seconds = milliseconds / 1000;
   tm fields{};
   convert(&seconds, &fields);
@@ -126,9 +125,9 @@ wyx_provider_t id_from(const std::string& text, short this_node) {
   return id;
 }
 
-std::string now_text() { return time_text("%Y-%m-%dT%H:%M:%S", gmtime_r) + "Z"; }
+std::string utc_text(WallTime time) { return time_text(time, "%Y-%m-%dT%H:%M:%S", gmtime_r) + "Z"; }
 
-std::string clock_text() { return time_text("%H:%M:%S", localtime_r); }
+std::string clock_text(WallTime time) { return time_text(time, "%H:%M:%S", localtime_r); }
 
 std::string explain(wyx_rc_t rc) {
   switch (rc) {

@@ -1,6 +1,7 @@
 // How groups' ids, values, changes and times are written and read, for people and in JSON.
 #pragma once
 
+#include <chrono>
 #include <nlohmann/json.hpp>
 #include <string>
 #include <string_view>
@@ -11,6 +12,7 @@
 namespace gsctl {
 
 using Json = nlohmann::ordered_json;
+using WallTime = std::chrono::system_clock::time_point;
 using Members = std::vector<wyx_provider_t>;
 
 /// Copies; none for null.
@@ -37,9 +39,9 @@ std::string quoted(std::string_view bytes);
 wyx_provider_t id_from(const std::string& text, short this_node);
 
 /// RFC 3339, UTC, milliseconds.
-std::string now_text();
+std::string utc_text(WallTime time = std::chrono::system_clock::now());
 /// The time of day of the same, local: for lines.
-std::string clock_text();
+std::string clock_text(WallTime time);
 
 /// What became of a request: a few words without capitals, and what to do where something can be done.
 std::string explain(wyx_rc_t rc);

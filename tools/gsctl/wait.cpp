@@ -55,7 +55,7 @@ class Wait {
 
   void done() {
     if (settings_.json) {
-      Json object = {{"time", now_text()}};
+      Json object = {{"time", utc_text()}};
       set_bytes(object, "group", options_.group);
       if (event_) object["event"] = *event_;
       object["members"] = to_json(options_.gone ? Members() : members_);

@@ -466,6 +466,8 @@ void SessionLayer::forget_sessions() {
   }
   for (auto& [group, of_group] : phase_timers_) timers_.cancel(of_group.timer);
   phase_timers_.clear();
+  feed_taps();
+  for (const ConnectionId id : taps_.ids()) drop(id);  // what they saw does not go on
   answer_hellos();
 }
 

@@ -29,6 +29,8 @@ std::vector<std::string> codes_of(const Happening& happening) {
   return codes;
 }
 
+std::uint32_t bit_of(inspect::Kind kind) { return std::uint32_t{1} << static_cast<unsigned>(kind); }
+
 void add_value(const SharedBytes& value, bool contents, std::uint64_t& size, std::string& bytes) {
   if (!value) return;
   size = value->size();
@@ -40,7 +42,14 @@ void add_value(const SharedBytes& value, bool contents, std::uint64_t& size, std
 void Taps::add(ConnectionId id, const inspect::AskT& wanted) {
   Tap& tap = taps_[id];
   tap.groups.insert(wanted.groups.begin(), wanted.groups.end());
+  for (const inspect::Kind kind : wanted.kinds)
+    if (kind <= inspect::Kind::MAX) tap.kinds |= bit_of(kind);
   tap.contents = wanted.contents;
+}
+
+bool Taps::Tap::wants(const Happening& happening) const {
+  if (kinds != 0 && (kinds & bit_of(static_cast<inspect::Kind>(happening.kind))) == 0) return false;
+  return groups.empty() || groups.contains(happening.group);
 }
 
 std::unique_ptr<inspect::HappeningT> Taps::note(const Happening& from, bool contents) {
@@ -60,6 +69,8 @@ std::unique_ptr<inspect::HappeningT> Taps::note(const Happening& from, bool cont
   to->what = what_of(from);
   to->codes = codes_of(from);
   to->changing = ids_of(from.changing);
+  if (from.leave_codes)
+    for (const LeaveCode& code : *from.leave_codes) to->leave_codes.push_back(code.voluntary_or_failure);
   if (from.members) to->members = static_cast<std::uint32_t>(from.members->size());
   to->voters = static_cast<std::uint32_t>(from.voters);
   add_value(from.state, contents, to->state_size, to->state);
@@ -72,7 +83,7 @@ std::unique_ptr<inspect::HappeningT> Taps::note(const Happening& from, bool cont
 
 void Taps::happened(const Happening& happening) {
   for (auto& [id, tap] : taps_) {
-    if (!tap.groups.empty() && !tap.groups.contains(happening.group)) continue;
+    if (!tap.wants(happening)) continue;
     try {
       if (tap.missing == 0 && tap.noted.size() < kMostNoted) {
         tap.noted.push_back(note(happening, tap.contents));

@@ -16,7 +16,7 @@ namespace gs::daemon {
 /// A tap that does not read misses what happens meanwhile, and is told how much that was.
 class Taps : public Observer {
  public:
-  static constexpr std::size_t kMost = 64;
+  static constexpr std::size_t kMost = 256;
 
   bool empty() const { return taps_.empty(); }
   bool full() const { return taps_.size() >= kMost; }
@@ -39,7 +39,9 @@ class Taps : public Observer {
 
   struct Tap {
     std::set<std::string, std::less<>> groups;  // none: all
+    std::uint32_t kinds = 0;                    // a bit for each; none: all
     bool contents = false;
+    bool wants(const Happening& happening) const;
     std::vector<std::unique_ptr<inspect::HappeningT>> noted;
     std::uint64_t missed = 0;   // before the first of those
     std::uint64_t missing = 0;  // after the last

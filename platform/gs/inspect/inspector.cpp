@@ -159,12 +159,13 @@ Inspector::List<NodeT> Inspector::nodes() {
   return all(std::move(ask), &ReportT::nodes);
 }
 
-void Inspector::tap(const std::vector<std::string>& groups, bool contents) {
-  AskT ask;
-  ask.what = What::Tap;
-  ask.groups = groups;
-  ask.contents = contents;
-  send(ask);
+void Inspector::tap(const std::vector<std::string>& groups, bool contents, std::vector<Kind> kinds) {
+  AskT request;
+  request.what = What::Tap;
+  request.groups = groups;
+  request.contents = contents;
+  request.kinds = std::move(kinds);
+  ask(request);  // the first report is empty
 }
 
 std::optional<ReportT> Inspector::next() { return receive(); }

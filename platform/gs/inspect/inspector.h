@@ -52,8 +52,9 @@ class Inspector {
   List<SessionT> sessions();
   List<NodeT> nodes();
 
-  /// From now on this connection brings what happens, in `groups` or in all, and nothing is asked on it any more.
-  void tap(const std::vector<std::string>& groups = {}, bool contents = false);
+  /// From now on this connection brings what happens, in `groups` or in all, of `kinds` or of all, and nothing is
+  /// asked on it any more. When this returns nothing is left out. A daemon that stops serving ends the connection.
+  void tap(const std::vector<std::string>& groups = {}, bool contents = false, std::vector<Kind> kinds = {});
   /// Asks without waiting for the answer: `next` has it once it is there.
   void send(const AskT& ask);
   /// Readable when `next` has something to say.
