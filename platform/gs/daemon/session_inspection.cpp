@@ -70,11 +70,12 @@ void SessionLayer::remove_tap(ConnectionId id) {
 
 void SessionLayer::feed_taps_soon() {
   if (feed_taps_.number != 0 || !taps_.waiting()) return;
-  feed_taps_ = timers_.arm(env_.now() + kTapPause, [this] { feed_taps(); });
+  feed_taps_ = timers_.arm(std::max(env_.now(), fed_taps_ + kTapPause), [this] { feed_taps(); });
 }
 
 void SessionLayer::feed_taps() {
   feed_taps_ = {};
+  fed_taps_ = env_.now();
   for (const ConnectionId id : taps_.ids()) feed_tap(id);
 }
 

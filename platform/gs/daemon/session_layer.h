@@ -180,7 +180,7 @@ class SessionLayer : private PingSink, private Replica {
   static constexpr Duration kBetweenReturns{100};                   // of memory to the system
   static constexpr Duration kStalled{1'000};                        // without progress
   static constexpr Duration kBetweenLooks{100};                     // for those who are stalled
-  static constexpr Duration kTapPause{10};                          // in which what happens is gathered
+  static constexpr Duration kTapPause{10};                          // in which more is gathered
   static constexpr std::size_t kTapBound = 1024 * 1024;             // bytes that may wait for a tap
 
   // One message of a client; each may close the connection it came on.
@@ -314,6 +314,7 @@ class SessionLayer : private PingSink, private Replica {
   Counters counters_;
   Taps taps_;
   Timers::Id feed_taps_;
+  Time fed_taps_{};
 };
 
 }  // namespace gs::daemon

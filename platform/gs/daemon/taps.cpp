@@ -52,20 +52,23 @@ bool Taps::Tap::wants(const Happening& happening) const {
   return groups.empty() || groups.contains(happening.group);
 }
 
-std::unique_ptr<inspect::HappeningT> Taps::note(const Happening& from, bool contents) {
+Taps::Noted::Noted(const Happening& from) : happening(from), group(from.group), name(from.name) {
+  happening.group = happening.name = {};  // the caller's
+}
+
+std::unique_ptr<inspect::HappeningT> Taps::told(const Noted& noted, bool contents) {
+  const Happening& from = noted.happening;
   auto to = std::make_unique<inspect::HappeningT>();
   to->kind = static_cast<inspect::Kind>(from.kind);
-  to->time_us =
-      std::chrono::duration_cast<std::chrono::microseconds>(std::chrono::system_clock::now().time_since_epoch())
-          .count();
-  to->group = from.group;
+  to->time_us = std::chrono::duration_cast<std::chrono::microseconds>(noted.time.time_since_epoch()).count();
+  to->group = noted.group;
   to->protocol = from.protocol;
   to->number = from.number;
   to->phase = from.phase;
   to->n_phase = from.n_phase;
   to->event_number = from.event_number;
   if (from.who) to->who = std::make_unique<inspect::Id>(id_of(*from.who));
-  to->name = from.name;
+  to->name = noted.name;
   to->what = what_of(from);
   to->codes = codes_of(from);
   to->changing = ids_of(from.changing);
@@ -86,7 +89,7 @@ void Taps::happened(const Happening& happening) {
     if (!tap.wants(happening)) continue;
     try {
       if (tap.missing == 0 && tap.noted.size() < kMostNoted) {
-        tap.noted.push_back(note(happening, tap.contents));
+        tap.noted.emplace_back(happening);
         continue;
       }
     } catch (const std::bad_alloc&) {  // it is missed
@@ -115,9 +118,11 @@ inspect::ReportT Taps::take(ConnectionId id) {
   report.missed = std::exchange(tap.missed, 0);
   std::size_t bytes = 0;
   auto last = tap.noted.begin();
-  for (; last != tap.noted.end() && bytes < kAtOnce; ++last)
-    bytes += sizeof **last + (*last)->state.size() + (*last)->message.size();
-  std::move(tap.noted.begin(), last, std::back_inserter(report.happenings));
+  for (; last != tap.noted.end() && bytes < kAtOnce; ++last) {
+    report.happenings.push_back(told(*last, tap.contents));
+    const inspect::HappeningT& happening = *report.happenings.back();
+    bytes += sizeof happening + happening.state.size() + happening.message.size();
+  }
   tap.noted.erase(tap.noted.begin(), last);
   if (tap.noted.empty()) tap.missed = std::exchange(tap.missing, 0);
   return report;

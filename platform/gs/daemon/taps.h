@@ -2,6 +2,7 @@
 // what it wants of it, in one message, so that it costs those whom the events are about next to nothing.
 #pragma once
 
+#include <chrono>
 #include <map>
 #include <set>
 #include <string>
@@ -37,16 +38,23 @@ class Taps : public Observer {
   static constexpr std::size_t kMostNoted = 8192;     // for one tap
   static constexpr std::size_t kAtOnce = 256 * 1024;  // bytes
 
+  /// As it is told, and what that only points to. Made into a report later: members wait while it is noted.
+  struct Noted {
+    explicit Noted(const Happening& from);
+    Happening happening;
+    std::string group, name;
+    std::chrono::system_clock::time_point time = std::chrono::system_clock::now();
+  };
   struct Tap {
     std::set<std::string, std::less<>> groups;  // none: all
     std::uint32_t kinds = 0;                    // a bit for each; none: all
     bool contents = false;
     bool wants(const Happening& happening) const;
-    std::vector<std::unique_ptr<inspect::HappeningT>> noted;
+    std::vector<Noted> noted;
     std::uint64_t missed = 0;   // before the first of those
     std::uint64_t missing = 0;  // after the last
   };
-  static std::unique_ptr<inspect::HappeningT> note(const Happening& happening, bool contents);
+  static std::unique_ptr<inspect::HappeningT> told(const Noted& noted, bool contents);
 
   std::map<ConnectionId, Tap> taps_;
 };
