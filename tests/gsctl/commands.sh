@@ -20,6 +20,7 @@ mkfifo orders
 ann=$!
 exec 9>orders
 await_text 'joined 1/1; members: 1/1$' ann.log
+expect 2 'at most 256 characters' "$gsctl" join crew --name "$(printf 'x%.0s' {1..257})"
 expect 1 'instance number is taken' "$gsctl" join crew --instance 1
 expect 2 'over the limit of 65536 bytes' "$gsctl" set crew "$(printf 'x%.0s' {1..65537})"
 "$gsctl" join crew --instance 2 --json --vote-with '[ "$(cat)" != no ] || { echo "not by $GS_WHO"; exit 1; }' \

@@ -95,6 +95,8 @@ line 1 "group 'nobody'" gsctl chart crew.record --group nobody
 line 1 'No such file' gsctl chart nowhere
 : >empty
 line 1 'is empty' gsctl chart empty
+line 1 'Is a directory' gsctl chart .
+line 1 'no recording of gsctl: line 1' gsctl chart /dev/zero
 line 1 'no recording of gsctl: line 1' gsctl chart ann.log
 sed 's/"version":1/"version":2/' crew.record >later
 line 1 'of version 2' gsctl chart later

@@ -10,6 +10,7 @@ namespace gsctl {
 namespace {
 
 constexpr int kTries = 100;
+constexpr std::size_t kMaxName = 256;  // characters, as the daemon counts them
 
 /// The small numbers are for people who choose one.
 short some_instance() {
@@ -18,6 +19,12 @@ short some_instance() {
 }
 
 }  // namespace
+
+Member::Member(Loop& loop, const std::string& group, const std::string& name)
+    : GSProvider(group.c_str(), 0, name.c_str()), loop_(loop) {
+  if (name.size() > kMaxName)
+    throw Error(kWrongUse, "--name: a name has at most " + std::to_string(kMaxName) + " characters");
+}
 
 wyx_rc_t Member::try_to_join(std::optional<short> instance) {
   wyx_rc_t rc = WYX_DUPLICATE_INSTANCE_NUMBER;

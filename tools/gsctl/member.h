@@ -14,8 +14,8 @@ namespace gsctl {
 /// the call.
 class Member : public zelt_gscl_V1::GSProvider {
  public:
-  Member(Loop& loop, const std::string& group, const std::string& name)
-      : GSProvider(group.c_str(), 0, name.c_str()), loop_(loop) {}
+  /// Throws Error: the name is over what the daemon takes.
+  Member(Loop& loop, const std::string& group, const std::string& name);
 
   /// Asks to join, as this instance or as one that is free, with the group's attributes. Throws Error: refused.
   void ask_to_join(std::optional<short> instance = std::nullopt);

@@ -1,5 +1,7 @@
 #include "tools/gsctl/recording.h"
 
+#include <cerrno>
+#include <cstring>
 #include <limits>
 
 #include "tools/gsctl/status.h"
@@ -185,8 +187,10 @@ Recording read_recording(std::istream& file, const std::string& name) {
   std::string line;
   std::size_t number = 0;
   try {
-    while (std::getline(file, line)) {
+    while (file.peek() != std::istream::traits_type::eof()) {
       ++number;
+      if (file.peek() != '{') throw Foreign{"no JSON object"};  // nor does it need to have an end
+      std::getline(file, line);
       if (file.eof() && number > 1) {
         recording.cut = true;
         break;
@@ -201,6 +205,7 @@ Recording read_recording(std::istream& file, const std::string& name) {
     throw Error(kRefused,
                 name + " is no recording of gsctl: line " + std::to_string(number) + ": " + foreign.what);
   }
+  if (file.bad()) throw Error(kRefused, "cannot read " + name + ": " + strerror(errno));
   if (number == 0) throw Error(kRefused, name + " is empty: make a recording with gsctl record");
   return recording;
 }
