@@ -48,6 +48,6 @@ restart() {
   start_gsd
 }
 again restart
-sort -c -n -k1,1 pages/.leader || die "a server was begun with an older fence: $(cat pages/.leader)"
+sort -c -s -n -k1,1 pages/.leader || die "a server was begun with an older fence: $(cat pages/.leader)"
 awk '$1 == fence && $2 != leader { exit 1 } { fence = $1; leader = $2 }' pages/.leader ||
   die "two leaders have one fence: $(cat pages/.leader)"
