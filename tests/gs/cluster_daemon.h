@@ -232,21 +232,22 @@ class Daemon : public Order, public Replica, public Host {
     if (std::holds_alternative<ContinueEvent>(event)) continued_ = false;
   }
   /// The engine's, behind the place that it is at.
-  std::vector<std::byte> snapshot() override {
-    std::vector<std::byte> bytes(sizeof place_);
-    std::memcpy(bytes.data(), &place_, sizeof place_);
+  SnapshotBytes snapshot() override {
     const auto state = engine_->snapshot();
-    bytes.insert(bytes.end(), state.begin(), state.end());
-    return bytes;
+    auto values = state.values();
+    values.push_back(std::make_shared<const Bytes>(reinterpret_cast<const char*>(&place_), sizeof place_));
+    return {state.head(), std::move(values)};
   }
-  bool restore(const std::vector<std::byte>& snapshot, std::string* error) override {
-    const std::vector<std::byte> state(snapshot.begin() + sizeof place_, snapshot.end());
-    if (!engine_->restore(state, error)) {
+  bool restore(const SnapshotBytes& snapshot, std::string* error) override {
+    auto values = snapshot.values();
+    const SharedBytes place = values.back();
+    values.pop_back();
+    if (!engine_->restore({snapshot.head(), std::move(values)}, error)) {
       world_.history.error("snapshot: " + *error);
       return false;
     }
     ++world_.seen["state taken"];
-    std::memcpy(&place_, snapshot.data(), sizeof place_);
+    std::memcpy(&place_, place->data(), sizeof place_);
     world_.tell(self_.node, "takes the state of " + std::to_string(place_));
     world_.history.hold(self_.node, place_);
     return true;

@@ -194,14 +194,23 @@ class Episode {
     error_ += "the votes do not come to an end\n";
   }
 
+  SnapshotBytes in_pieces(const SnapshotBytes& snapshot) {
+    const std::uint64_t length = 1 + random_.below(100);
+    SnapshotReceiver receiver;
+    for (std::uint64_t from = 0; from < snapshot.size(); from += length)
+      if (!receiver.add(snapshot.part(from, length))) error_ += "a piece of a snapshot is refused\n";
+    if (!receiver.complete()) error_ += "a snapshot is not complete\n";
+    return receiver.take();
+  }
+
   /// One of the others becomes what the first or another one is.
   void replace_a_replica() {
-    const auto state = replicas_[0].snapshot();
+    const auto state = replicas_[0].snapshot().all();
     Engine& replaced = replicas_[1 + random_.below(2)];
     std::string why;
-    if (!replaced.restore(replicas_[random_.below(3)].snapshot(), &why)) error_ += why + "\n";
+    if (!replaced.restore(in_pieces(replicas_[random_.below(3)].snapshot()), &why)) error_ += why + "\n";
     for (const Engine& replica : replicas_)
-      if (replica.snapshot() != state) error_ += "replicas have different snapshots\n";
+      if (replica.snapshot().all() != state) error_ += "replicas have different snapshots\n";
   }
 
   void apply(const Event& event) {

@@ -3,9 +3,11 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <span>
 #include <string>
 #include <vector>
 
+#include "engine/snapshot_bytes.h"
 #include "engine/types.h"
 
 namespace gs::cluster {
@@ -26,9 +28,9 @@ class Replica {
   /// The next event in order.
   virtual void apply(const Event& event) = 0;
   /// Of the state now. Empty: it is more than a snapshot can hold.
-  virtual std::vector<std::byte> snapshot() = 0;
+  virtual SnapshotBytes snapshot() = 0;
   /// Becomes what the snapshot is of. False: `error` says why it does not fit, and nothing has changed.
-  virtual bool restore(const std::vector<std::byte>& snapshot, std::string* error) = 0;
+  virtual bool restore(const SnapshotBytes& snapshot, std::string* error) = 0;
   /// Clients may come, or the domain has changed.
   virtual void serve(const Domain& domain) = 0;
   /// Who waits to be a client waits in vain.

@@ -374,35 +374,33 @@ void Replication::donate(const Decision& decision) {
   const bool lowest = decision.holders.begin()->first == settings_.self.node;
   if (!lowest || decision.holders.size() == decision.asked.size()) return;
   donation_ = Donation{replica_.snapshot()};
-  if (donation_->bytes.empty()) {
+  if (donation_->state.empty()) {
     host_.log("the state is over 1.5 GiB and cannot be sent: set a lower state-bound on all hosts");
     order_.send(Piece{0, 1, {}});
     return donation_.reset();
   }
-  donation_->count = static_cast<std::uint32_t>((donation_->bytes.size() + settings_.piece - 1) / settings_.piece);
+  donation_->count = static_cast<std::uint32_t>((donation_->state.size() + settings_.piece - 1) / settings_.piece);
   for (std::size_t i = 0; i < kPiecesUnderWay; ++i) send_piece();
 }
 
 void Replication::send_piece() {
   if (donation_->sent == donation_->count) return;
-  const std::size_t from = donation_->sent * settings_.piece;
-  const std::size_t length = std::min(settings_.piece, donation_->bytes.size() - from);
-  const auto first = donation_->bytes.begin() + static_cast<std::ptrdiff_t>(from);
-  order_.send(Piece{donation_->sent++, donation_->count, {first, first + static_cast<std::ptrdiff_t>(length)}});
+  const std::uint64_t from = std::uint64_t{donation_->sent} * settings_.piece;
+  order_.send(Piece{donation_->sent++, donation_->count, donation_->state.part(from, settings_.piece)});
 }
 
 void Replication::on(const Process& from, const Piece& piece) {
   if (donation_ && from == settings_.self) return send_piece();
   if (!catching_up_ || from.node != decision_->holders.begin()->first || piece.index != catching_up_->next) return;
   ++catching_up_->next;
-  catching_up_->bytes.insert(catching_up_->bytes.end(), piece.bytes.begin(), piece.bytes.end());
+  if (!catching_up_->state.add(piece.bytes)) return lose("the state that " + name_of(from) + " sends is none");
   progress();
   if (catching_up_->next == piece.count) take_state(from);
 }
 
 void Replication::take_state(const Process& from) {
-  std::string error;
-  if (!replica_.restore(catching_up_->bytes, &error))
+  std::string error = "it is cut off";
+  if (!catching_up_->state.complete() || !replica_.restore(catching_up_->state.take(), &error))
     return lose("the state that " + name_of(from) + " sent does not fit: " + error);
   own_ = std::move(catching_up_->track);
   own_.hosts = decision_->holders;

@@ -102,12 +102,12 @@ enum class Rule {
 struct CatchingUp {
   Track track;
   std::uint32_t next = 0;  // piece
-  std::vector<std::byte> bytes;
+  SnapshotReceiver state;
 };
 
 /// A state that is being sent.
 struct Donation {
-  std::vector<std::byte> bytes;
+  SnapshotBytes state;
   std::uint32_t sent = 0;   // pieces
   std::uint32_t count = 0;  // likewise
 };

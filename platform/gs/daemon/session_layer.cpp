@@ -436,7 +436,7 @@ void SessionLayer::publish_adapters() {
   published_ = std::move(now);
 }
 
-bool SessionLayer::restore(const std::vector<std::byte>& snapshot, std::string* error) {
+bool SessionLayer::restore(const SnapshotBytes& snapshot, std::string* error) {
   return engine_->restore(snapshot, error);
 }
 

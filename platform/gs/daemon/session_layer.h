@@ -214,8 +214,8 @@ class SessionLayer : private PingSink, private Replica {
 
   // The ordered side.
   void apply(const Event& event) override;
-  std::vector<std::byte> snapshot() override { return engine_->snapshot(); }
-  bool restore(const std::vector<std::byte>& snapshot, std::string* error) override;
+  SnapshotBytes snapshot() override { return engine_->snapshot(); }
+  bool restore(const SnapshotBytes& snapshot, std::string* error) override;
   void serve(const Domain& domain) override;
   void wait_no_more() override { answer_hellos(); }
   void drop_clients(const std::string& why) override;

@@ -502,9 +502,9 @@ std::pair<std::size_t, std::size_t> Engine::clients_of(SessionId session) const 
   return {static_cast<std::size_t>(providers), clients.size() - static_cast<std::size_t>(providers)};
 }
 
-std::vector<std::byte> Engine::snapshot() const { return write_snapshot(*state_); }
+SnapshotBytes Engine::snapshot() const { return write_snapshot(*state_); }
 
-bool Engine::restore(const std::vector<std::byte>& snapshot, std::string* error) {
+bool Engine::restore(const SnapshotBytes& snapshot, std::string* error) {
   auto restored = std::make_unique<State>(state_->limits);
   if (!read_snapshot(snapshot, *restored, error)) return false;
   restored->watch = state_->watch;

@@ -17,12 +17,14 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "engine/hosts.h"
 #include "engine/limits.h"
+#include "engine/snapshot_bytes.h"
 #include "engine/status.h"
 #include "engine/types.h"
 
@@ -82,12 +84,12 @@ class Engine {
 
   /// The whole state, equal for engines that have been given the same events. Nothing: it is more than a snapshot
   /// can hold, 1.5 GiB of values.
-  std::vector<std::byte> snapshot() const;
+  SnapshotBytes snapshot() const;
 
   /// Becomes what the engine was that the snapshot is of, and from the next event on says what that one says; who
   /// restores arms the timers of running_phases. False: the snapshot is damaged, of another version or made
   /// under other limits, as `error` says, and nothing has changed.
-  bool restore(const std::vector<std::byte>& snapshot, std::string* error);
+  bool restore(const SnapshotBytes& snapshot, std::string* error);
 
   /// A digest of the whole state; equal for engines that have been given the same events.
   std::uint64_t digest() const;

@@ -5,21 +5,22 @@
 // as its code relies on it.
 #pragma once
 
-#include <cstddef>
+#include <span>
 #include <string>
-#include <vector>
 
+#include "engine/snapshot_bytes.h"
 #include "engine/state.h"
 
 namespace gs {
 
 /// The FlatBuffer's identifier; the digits are the version.
-inline constexpr char kSnapshotId[] = "GE02";
+inline constexpr char kSnapshotId[] = "GE03";
 
-/// Nothing: there is more than a FlatBuffer can hold.
-std::vector<std::byte> write_snapshot(const EngineState& state);
+/// Nothing: there is more than a snapshot can hold.
+SnapshotBytes write_snapshot(const EngineState& state);
 
-/// Fills `into`, which is as new. False: `error` says why not, and `into` is not to be used.
-bool read_snapshot(const std::vector<std::byte>& snapshot, EngineState& into, std::string* error);
+/// Fills `into`, which is as new. False: `error` says why not, and
+/// `into` is not to be used.
+bool read_snapshot(const SnapshotBytes& snapshot, EngineState& into, std::string* error);
 
 }  // namespace gs

@@ -48,12 +48,11 @@ bool GroupReader::providers_at(const Indices& indices, List& into) {
 
 bool GroupReader::read_values() {
   for (const fb::Value* from : *from_.values()) {
-    Bytes bytes;
-    if (!in_.take_table() || !in_.bytes(from->bytes(), std::max(kMaxStateValue, kMaxProviderMessage), bytes))
-      return false;
+    SharedBytes bytes;
+    if (!in_.take_table() || !in_.value(bytes)) return false;
     const Payer payer{value_of(from->session()), from->user()};
-    auto charge = std::make_shared<const Ledger::Charge>(state_.ledger, payer, bytes.size());
-    values_.push_back({std::make_shared<const Bytes>(std::move(bytes)), std::move(charge)});
+    auto charge = std::make_shared<const Ledger::Charge>(state_.ledger, payer, bytes->size());
+    values_.push_back({std::move(bytes), std::move(charge)});
   }
   return true;
 }

@@ -2,11 +2,13 @@
 #pragma once
 
 #include <algorithm>
+#include <span>
 #include <string>
 #include <utility>
 
 #include "engine/checks.h"
 #include "engine/enumerations.h"
+#include "engine/snapshot_bytes.h"
 #include "engine/state.h"
 #include "snapshot_generated.h"
 
@@ -16,7 +18,8 @@ namespace gs {
 /// what; nothing is read after that.
 class SnapshotInput {
  public:
-  SnapshotInput(std::size_t size, std::string* error) : left_(size), error_(error) {}
+  SnapshotInput(const SnapshotBytes& from, std::string* error)
+      : left_(from.head().size()), values_(from.values()), error_(error) {}
 
   bool fail(const std::string& what) {
     *error_ = "snapshot: " + (where_.empty() ? what : "group " + where_ + ": " + what);
@@ -47,6 +50,14 @@ class SnapshotInput {
     into.assign(reinterpret_cast<const char*>(from->data()), from->size());
     return true;
   }
+  /// The next one of those behind the FlatBuffer.
+  bool value(SharedBytes& into) {
+    if (!require(!values_.empty(), "a value that is missing")) return false;
+    into = values_.front();
+    values_ = values_.subspan(1);
+    return true;
+  }
+  bool no_more_values() { return require(values_.empty(), "a value that is nobody's"); }
   bool name(const flatbuffers::String* from, std::size_t limit, std::string& into) {
     if (!take(from->size()) || !require(from->size() <= limit, "a name over the limit")) return false;
     into = from->str();
@@ -55,7 +66,8 @@ class SnapshotInput {
   bool attributes(const snapshot::fb::Attributes* from, const std::string& group, GroupAttributes& into);
 
  private:
-  std::size_t left_;  // bytes that no part has taken
+  std::size_t left_;                     // bytes that no part has taken
+  std::span<const SharedBytes> values_;  // that have not been read
   std::string where_;
   std::string* error_;
 };

@@ -148,7 +148,7 @@ bool read_subscriptions(SnapshotInput& in, const fb::Snapshot& from, EngineState
 }
 
 /// Null: it is none of this version.
-const fb::Snapshot* verified_root(SnapshotInput& in, const std::vector<std::byte>& snapshot) {
+const fb::Snapshot* verified_root(SnapshotInput& in, std::span<const std::byte> snapshot) {
   constexpr std::size_t kNameOfId = 2;  // characters before the version
   constexpr std::size_t kLeast = sizeof(flatbuffers::uoffset_t) + flatbuffers::kFileIdentifierLength;
   constexpr flatbuffers::uoffset_t kMaxDepth = 8;  // of tables in tables; the schema needs four
@@ -173,9 +173,9 @@ const fb::Snapshot* verified_root(SnapshotInput& in, const std::vector<std::byte
 
 }  // namespace
 
-bool read_snapshot(const std::vector<std::byte>& snapshot, EngineState& into, std::string* error) {
-  SnapshotInput in(snapshot.size(), error);
-  const fb::Snapshot* from = verified_root(in, snapshot);
+bool read_snapshot(const SnapshotBytes& snapshot, EngineState& into, std::string* error) {
+  SnapshotInput in(snapshot, error);
+  const fb::Snapshot* from = verified_root(in, snapshot.head());
   if (from == nullptr) return false;
   if (!same_limits(*from->limits(), into.limits))
     return in.fail("made under other limits: set the same on all hosts");
@@ -183,7 +183,7 @@ bool read_snapshot(const std::vector<std::byte>& snapshot, EngineState& into, st
   into.numbers_above = from->numbers_above();
   into.ended_number = from->ended_number();
   return read_hosts(in, *from, into) && read_groups(in, *from, into) && read_line(in, *from, into) &&
-         read_subscriptions(in, *from, into) &&
+         read_subscriptions(in, *from, into) && in.no_more_values() &&
          in.require(into.ledger.within_limits(), "more than its limits allow to be kept");
 }
 

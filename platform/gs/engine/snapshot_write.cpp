@@ -1,3 +1,4 @@
+#include <span>
 #include <unordered_map>
 
 #include "engine/snapshot.h"
@@ -15,6 +16,7 @@ using Offsets = std::vector<Offset<T>>;
 
 /// Leaves room for what is not charged, such as the table of every provider, below the 2 GiB of a FlatBuffer.
 constexpr std::size_t kMostKept = std::size_t{3} << 29;
+constexpr std::size_t kFirstSize = 64 * 1024;
 
 fb::ProviderId pack(ProviderId id) { return {id.instance, id.node}; }
 fb::Session pack(const SessionId& session) { return {session.number, session.node}; }
@@ -72,7 +74,9 @@ Offset<fb::Host> put(Builder& b, std::uint32_t node, const DomainHost& host) {
 /// One group. Indices are given out in an order that follows from the state alone.
 class GroupWriter {
  public:
-  GroupWriter(Builder& b, const Group& group) : b_(b), group_(group) {
+  /// Puts the values that it comes to behind `values`.
+  GroupWriter(Builder& b, std::vector<SharedBytes>& values, const Group& group)
+      : b_(b), all_values_(values), group_(group) {
     for (const MemberPtr& m : group.members_) add(m);
     if (group.run_)
       for (const MemberPtr& m : group.run_->changing) add(m);
@@ -121,9 +125,9 @@ class GroupWriter {
     const auto index = static_cast<std::uint32_t>(values_.size() + 1);
     const auto [found, is_new] = value_indices_.emplace(value.charge.get(), index);
     if (!is_new) return found->second;
-    const auto bytes = gs::put(b_, *value.bytes);
+    all_values_.push_back(value.bytes);
     const auto session = pack(value.charge->payer().session);
-    values_.push_back(fb::CreateValue(b_, bytes, &session, value.charge->payer().user));
+    values_.push_back(fb::CreateValue(b_, &session, value.charge->payer().user));
     return index;
   }
 
@@ -181,6 +185,7 @@ class GroupWriter {
   }
 
   Builder& b_;
+  std::vector<SharedBytes>& all_values_;
   const Group& group_;
   std::vector<const Member*> providers_;
   Offsets<fb::Value> values_;
@@ -189,14 +194,15 @@ class GroupWriter {
   std::unordered_map<const Ledger::Charge*, std::uint32_t> value_indices_;
 };
 
-std::vector<std::byte> write_snapshot(const EngineState& state) {
+SnapshotBytes write_snapshot(const EngineState& state) {
   if (state.ledger.total() > kMostKept) return {};
-  Builder b(state.ledger.total() + 4096);  // rather than grow, and copy what it has, again and again
+  Builder b(kFirstSize);
+  std::vector<SharedBytes> values;
   Offsets<fb::Group> groups;
   std::map<std::string_view, std::uint32_t> indices;
   for (const auto& [name, group] : state.groups) {
     indices.emplace(name, static_cast<std::uint32_t>(groups.size()));
-    groups.push_back(GroupWriter(b, group).write());
+    groups.push_back(GroupWriter(b, values, group).write());
   }
   std::vector<std::uint32_t> line;
   for (const std::string& name : state.line) line.push_back(indices.at(name));
@@ -217,8 +223,8 @@ std::vector<std::byte> write_snapshot(const EngineState& state) {
                               state.subscribers.last_subscription(), gone_hosts, host_offsets,
                               state.hosts.seqnum(), state.last_protocol, state.numbers_above, state.ended_number),
            kSnapshotId);
-  const auto* bytes = reinterpret_cast<const std::byte*>(b.GetBufferPointer());
-  return {bytes, bytes + b.GetSize()};
+  const auto head = std::as_bytes(std::span(b.GetBufferPointer(), b.GetSize()));
+  return {{head.begin(), head.end()}, std::move(values)};
 }
 
 }  // namespace gs
